@@ -1,0 +1,89 @@
+#include "host/raster/DynamicBuffer.h"
+
+#include <algorithm>
+#include <cstdlib>
+#include <limits>
+#include <new>
+
+namespace Raster {
+
+std::uint64_t DynamicBuffer::ComputeStorageBytes(std::int64_t width, std::int64_t height,
+                                                 PixelFormat format) noexcept {
+    if (!IsValidPixelFormat(format)) return 0;
+    if (width < 1 || height < 1 || width > MaxSide || height > MaxSide) return 0;
+    // Both sides are at most 2^16 and a pixel at most 16 bytes, so nothing here can overflow 64 bits.
+    const std::uint64_t rowBytes = std::uint64_t(width) * std::uint64_t(Raster::GetBytesPerPixel(format));
+    const std::uint64_t stride = (rowBytes + RowAlignment - 1) / RowAlignment * RowAlignment;
+    const std::uint64_t total = stride * std::uint64_t(height);
+    return total <= MaxStorageBytes ? total : 0;
+}
+
+DynamicBuffer::Storage DynamicBuffer::AllocateStorage(int width, int height, PixelFormat format) noexcept {
+    Storage storage;
+    const std::uint64_t total = ComputeStorageBytes(width, height, format);
+    if (total == 0) return storage;
+    // calloc rather than an aligned allocation and a memset: large blocks come as fresh zero pages, so a big
+    // buffer costs nothing until it is written. The extra bytes let the start be moved to a 64-byte boundary.
+    void* block = std::calloc(std::size_t(total) + RowAlignment, 1);
+    if (!block) return storage;
+    const auto address = reinterpret_cast<std::uintptr_t>(block);
+    const std::uintptr_t aligned = (address + RowAlignment - 1) & ~std::uintptr_t(RowAlignment - 1);
+    storage.block = block;
+    storage.data = static_cast<std::byte*>(block) + (aligned - address);
+    storage.stride = std::ptrdiff_t(total / std::uint64_t(height));
+    return storage;
+}
+
+void DynamicBuffer::FreeStorage(Storage& storage) noexcept {
+    std::free(storage.block);
+    storage = {};
+}
+
+Kernel::Counted<DynamicBuffer> DynamicBuffer::Create(int width, int height, PixelFormat format) {
+    Storage storage = AllocateStorage(width, height, format);
+    if (!storage.block) return nullptr;
+    auto* buffer = new (std::nothrow) DynamicBuffer(width, height, format, storage);
+    if (!buffer) {
+        FreeStorage(storage);
+        return nullptr;
+    }
+    return Kernel::Counted<DynamicBuffer>(buffer);
+}
+
+DynamicBuffer::DynamicBuffer(int width, int height, PixelFormat format, Storage storage) noexcept
+    : DynamicBase(width, height, format)
+    , m_Block(storage.block)
+    , m_Data(storage.data)
+    , m_Stride(storage.stride) {}
+
+DynamicBuffer::~DynamicBuffer() {
+    std::free(m_Block);
+}
+
+Kernel::Counted<DynamicBitmap> DynamicBitmap::Create(int width, int height, PixelFormat format,
+                                                     Kernel::PointT<int> origin) {
+    if (!IsValidPixelFormat(format) || !IsLayerFormat(format)) return nullptr;
+    Storage storage = AllocateStorage(width, height, format);
+    if (!storage.block) return nullptr;
+    auto* bitmap = new (std::nothrow) DynamicBitmap(width, height, format, storage, origin);
+    if (!bitmap) {
+        FreeStorage(storage);
+        return nullptr;
+    }
+    return Kernel::Counted<DynamicBitmap>(bitmap);
+}
+
+DynamicBitmap::DynamicBitmap(int width, int height, PixelFormat format, Storage storage,
+                             Kernel::PointT<int> origin) noexcept
+    : DynamicBuffer(width, height, format, storage)
+    , m_Origin(origin) {}
+
+Kernel::RectT<int> DynamicBitmap::GetDocumentBounds() const noexcept {
+    constexpr std::int64_t lowest = std::numeric_limits<int>::min();
+    constexpr std::int64_t highest = std::numeric_limits<int>::max();
+    auto clamp = [&](std::int64_t v) { return int(std::clamp(v, lowest, highest)); };
+    return {m_Origin.x, m_Origin.y, clamp(std::int64_t(m_Origin.x) + GetWidth()),
+            clamp(std::int64_t(m_Origin.y) + GetHeight())};
+}
+
+} // namespace Raster

@@ -1,0 +1,376 @@
+// Inputs and situations that must be refused with a message: damaged and truncated files, files that claim
+// enormous images, unknown names, and writes that fail half-way.
+
+#include "tests/host/io/TestImages.h"
+
+#include <gtest/gtest.h>
+
+#include <csignal>
+#include <fstream>
+#include <sys/resource.h>
+
+using namespace IOTest;
+using Raster::PixelFormat;
+
+namespace {
+
+bool StartsWith(const std::string& text, const std::string& prefix) {
+    return text.rfind(prefix, 0) == 0;
+}
+bool Contains(const std::string& text, const std::string& part) {
+    return text.find(part) != std::string::npos;
+}
+
+std::uint32_t Crc32(const std::uint8_t* data, std::size_t size) {
+    std::uint32_t crc = 0xFFFFFFFFu;
+    for (std::size_t i = 0; i < size; ++i) {
+        crc ^= data[i];
+        for (int k = 0; k < 8; ++k)
+            crc = (crc >> 1) ^ (0xEDB88320u & (0u - (crc & 1u)));
+    }
+    return ~crc;
+}
+
+void PutBig32(std::vector<std::uint8_t>& out, std::uint32_t v) {
+    for (int shift = 24; shift >= 0; shift -= 8)
+        out.push_back(std::uint8_t(v >> shift));
+}
+
+void PngChunk(std::vector<std::uint8_t>& out, const char* type, const std::vector<std::uint8_t>& body) {
+    PutBig32(out, std::uint32_t(body.size()));
+    const std::size_t start = out.size();
+    out.insert(out.end(), type, type + 4);
+    out.insert(out.end(), body.begin(), body.end());
+    PutBig32(out, Crc32(out.data() + start, out.size() - start));
+}
+
+// A well-formed PNG header for any claimed size, followed by a token of image data.
+std::vector<std::byte> PngClaiming(std::uint32_t width, std::uint32_t height) {
+    std::vector<std::uint8_t> out = {0x89, 'P', 'N', 'G', 0x0D, 0x0A, 0x1A, 0x0A};
+    std::vector<std::uint8_t> header;
+    PutBig32(header, width);
+    PutBig32(header, height);
+    header.insert(header.end(), {8, 6, 0, 0, 0}); // 8-bit RGBA, deflate, adaptive filters, not interlaced
+    PngChunk(out, "IHDR", header);
+    PngChunk(out, "IDAT", {0x78, 0x9C, 0x03, 0x00});
+    PngChunk(out, "IEND", {});
+    std::vector<std::byte> bytes(out.size());
+    std::memcpy(bytes.data(), out.data(), out.size());
+    return bytes;
+}
+
+// An uncompressed little-endian TIFF with its directory before the pixel data, so that cutting the file cuts
+// the pixels and not the directory: samples of bits each a pixel (1: grey, 3: RGB), rowsPerStrip rows a strip
+// (0: one strip), then data.
+std::vector<std::byte> TiffClaiming(std::uint32_t width, std::uint32_t height, std::uint16_t samples,
+                                    const std::vector<std::uint8_t>& data, std::uint16_t bits = 8,
+                                    std::uint32_t rowsPerStrip = 0) {
+    if (rowsPerStrip == 0) rowsPerStrip = height;
+    const std::uint32_t strips = (height + rowsPerStrip - 1) / rowsPerStrip;
+    const auto rowBytes = std::uint32_t((std::uint64_t(width) * samples * bits + 7) / 8);
+    const std::uint32_t entries = 9;
+    // After the directory: the bits array (several samples), offsets and counts (several strips), the data.
+    const std::uint32_t bitsAt = 8 + 2 + entries * 12 + 4;
+    const std::uint32_t offsetsAt = bitsAt + (samples > 1 ? 2u * samples : 0u);
+    const std::uint32_t countsAt = offsetsAt + (strips > 1 ? 4u * strips : 0u);
+    const std::uint32_t dataAt = countsAt + (strips > 1 ? 4u * strips : 0u);
+    struct Entry {
+        std::uint16_t tag, type;
+        std::uint32_t count, value; // value: the value itself when it fits in four bytes, else where it lies
+    };
+    const Entry list[entries] = {
+        {256, 4, 1, width},
+        {257, 4, 1, height},
+        {258, 3, samples, samples == 1 ? bits : bitsAt},
+        {259, 3, 1, 1},
+        {262, 3, 1, samples == 1 ? 1u : 2u},
+        {273, 4, strips, strips == 1 ? dataAt : offsetsAt},
+        {277, 3, 1, samples},
+        {278, 4, 1, rowsPerStrip},
+        {279, 4, strips, strips == 1 ? rowBytes * height : countsAt},
+    };
+    std::vector<std::uint8_t> out = {'I', 'I', 42, 0, 8, 0, 0, 0};
+    auto put16 = [&](std::uint32_t v) { out.insert(out.end(), {std::uint8_t(v), std::uint8_t(v >> 8)}); };
+    auto put32 = [&](std::uint32_t v) {
+        put16(v & 0xFFFF);
+        put16(v >> 16);
+    };
+    put16(entries);
+    for (const Entry& e : list) {
+        put16(e.tag);
+        put16(e.type);
+        put32(e.count);
+        if (e.type == 3 && e.count == 1) {
+            put16(e.value);
+            put16(0);
+        } else {
+            put32(e.value);
+        }
+    }
+    put32(0);
+    for (int s = 0; s < samples && samples > 1; ++s)
+        put16(bits);
+    for (std::uint32_t i = 0; i < strips && strips > 1; ++i)
+        put32(dataAt + i * rowsPerStrip * rowBytes);
+    for (std::uint32_t i = 0; i < strips && strips > 1; ++i)
+        put32(std::min(rowsPerStrip, height - i * rowsPerStrip) * rowBytes);
+    out.insert(out.end(), data.begin(), data.end());
+    std::vector<std::byte> bytes(out.size());
+    std::memcpy(bytes.data(), out.data(), out.size());
+    return bytes;
+}
+
+std::vector<std::byte> Cut(const std::vector<std::byte>& bytes, std::size_t length) {
+    return {bytes.begin(), bytes.begin() + std::ptrdiff_t(std::min(length, bytes.size()))};
+}
+
+TEST(HostileInput, HandMadeTiffReadsWhole) {
+    // The hand-made layout itself must be valid, or the truncation test below would prove nothing.
+    std::vector<std::uint8_t> data(4 * 3 * 3);
+    for (std::size_t i = 0; i < data.size(); ++i)
+        data[i] = std::uint8_t(i * 7);
+    const IO::ReadResult result = IO::DecodeImage(TiffClaiming(4, 3, 3, data), "made.tif");
+    ASSERT_TRUE(result) << result.error;
+    EXPECT_EQ(result.image->GetFormat(), PixelFormat::RGBA8);
+    EXPECT_EQ(Component<std::uint8_t>(*result.image, 3, 2, 1), std::uint8_t((11 * 3 + 1) * 7));
+    EXPECT_EQ(Component<std::uint8_t>(*result.image, 3, 2, 3), 255);
+}
+
+TEST(HostileInput, CompressionThisBuildCannotDecodeIsNamedNotCalledDamage) {
+    auto bytes = TiffClaiming(4, 3, 1, std::vector<std::uint8_t>(12, 7));
+    // The value of the Compression entry, the fourth of the directory: 34712 (JPEG 2000) = 0x8798.
+    const std::size_t at = 8 + 2 + 3 * 12 + 8;
+    ASSERT_EQ(bytes[at - 8], std::byte{0x03}); // tag 259 starts the entry, little-endian
+    ASSERT_EQ(bytes[at - 7], std::byte{0x01});
+    bytes[at] = std::byte{0x98};
+    bytes[at + 1] = std::byte{0x87};
+    const IO::ReadResult result = IO::DecodeImage(bytes, "j2k.tif");
+    EXPECT_FALSE(result);
+    EXPECT_EQ(result.error, "j2k.tif: unsupported TIFF layout (compression scheme 34712 is not available)");
+}
+
+TEST(HostileInput, TruncatedFilesAreRefusedAtEveryLength) {
+    std::vector<std::uint8_t> raw(40 * 30 * 3);
+    for (std::size_t i = 0; i < raw.size(); ++i)
+        raw[i] = std::uint8_t(i * 31 + i / 7);
+    struct Case {
+        const char* name;
+        std::vector<std::byte> bytes;
+        const char* damage;
+    };
+    const Case cases[] = {
+        {"cut.png", IO::EncodeImage(*Noise(PixelFormat::RGBA16, 40, 30, 1), IO::FileType::PNG, "").bytes,
+         "truncated or damaged PNG data"},
+        {"cut.jpg", IO::EncodeImage(*Ramps(PixelFormat::RGBA8, 40, 30), IO::FileType::JPEG, "").bytes,
+         "truncated or damaged JPEG data"},
+        {"cut.tif", IO::EncodeImage(*Noise(PixelFormat::CMYKA8, 40, 30, 2), IO::FileType::TIFF, "").bytes,
+         "truncated or damaged TIFF data"},
+        {"plain.tif", TiffClaiming(40, 30, 3, raw, 8, 7), "truncated or damaged TIFF data"},
+        // Bilevel goes through libtiff's renderer; a missing strip must end the read there as well.
+        {"bilevel.tif", TiffClaiming(160, 30, 1, {raw.begin(), raw.begin() + 160 / 8 * 30}, 1, 4),
+         "truncated or damaged TIFF data"},
+    };
+    for (const Case& c : cases) {
+        ASSERT_GT(c.bytes.size(), 200u) << c.name;
+        const IO::ReadResult whole = IO::DecodeImage(c.bytes, c.name);
+        ASSERT_TRUE(whole) << whole.error;
+        const std::size_t n = c.bytes.size();
+        for (std::size_t length : {std::size_t(0), std::size_t(1), std::size_t(2), std::size_t(3),
+                                   std::size_t(7), std::size_t(8), std::size_t(12), std::size_t(33),
+                                   std::size_t(100), n / 4, n / 2, n - 100, n - 13, n - 2, n - 1}) {
+            SCOPED_TRACE(std::string(c.name) + " cut to " + std::to_string(length) + " of " +
+                         std::to_string(n));
+            const IO::ReadResult result = IO::DecodeImage(Cut(c.bytes, length), c.name);
+            EXPECT_FALSE(result.image);
+            ASSERT_TRUE(StartsWith(result.error, std::string(c.name) + ": ")) << result.error;
+            // Too short to carry a whole signature, a file is simply not recognised.
+            const bool recognised = IO::DetectFileType(Cut(c.bytes, length)).has_value();
+            EXPECT_TRUE(Contains(result.error, recognised ? c.damage : "not a PNG, JPEG or TIFF file"))
+                << result.error;
+        }
+    }
+}
+
+TEST(HostileInput, EveryDamagedPngByteIsCaught) {
+    // Every chunk carries a CRC over its type and data, so any single changed byte after the signature
+    // must be refused.
+    const auto bytes = IO::EncodeImage(*Noise(PixelFormat::IA8, 9, 7, 4), IO::FileType::PNG, "").bytes;
+    for (std::size_t i = 8; i < bytes.size(); ++i) {
+        auto damaged = bytes;
+        damaged[i] ^= std::byte{0x5A};
+        const IO::ReadResult result = IO::DecodeImage(damaged, "bad.png");
+        EXPECT_FALSE(result) << "byte " << i;
+        EXPECT_TRUE(StartsWith(result.error, "bad.png: ")) << result.error;
+    }
+}
+
+TEST(HostileInput, DamagedJpegAndTiffBytesNeverBreakTheReader) {
+    // Not every change is detectable in these formats; each must still end in an image or a message.
+    for (IO::FileType type : {IO::FileType::JPEG, IO::FileType::TIFF}) {
+        auto source = type == IO::FileType::JPEG ? Ramps(PixelFormat::RGBA8, 24, 16)
+                                                 : Noise(PixelFormat::LabA16, 24, 16, 6);
+        const auto bytes = IO::EncodeImage(*source, type, "").bytes;
+        for (std::size_t i = 0; i < bytes.size(); i += 3) {
+            auto damaged = bytes;
+            damaged[i] ^= std::byte(0xFF);
+            const IO::ReadResult result = IO::DecodeImage(damaged, "bad");
+            EXPECT_NE(bool(result.image), !result.error.empty()) << "byte " << i;
+        }
+    }
+}
+
+TEST(HostileInput, EnormousClaimsAreRefusedBeforeAllocating) {
+    const long before = Kernel::Countable::GetLiveObjectCount();
+    IO::ReadResult result = IO::DecodeImage(PngClaiming(1000000, 1000000), "huge.png");
+    EXPECT_FALSE(result);
+    EXPECT_EQ(result.error,
+              "huge.png: image 1000000 x 1000000 (rgba8) exceeds the limit of 65536 pixels a side "
+              "and 2 GiB of pixel data");
+
+    result = IO::DecodeImage(TiffClaiming(1000000, 1000000, 1, {1, 2, 3, 4}), "huge.tif");
+    EXPECT_FALSE(result);
+    EXPECT_TRUE(StartsWith(result.error, "huge.tif: image 1000000 x 1000000 (ia8) exceeds the limit"))
+        << result.error;
+
+    // Within the side limit, beyond the bytes: 60000 × 60000 RGBA8 is 14.4 GB.
+    result = IO::DecodeImage(TiffClaiming(60000, 60000, 3, {1, 2, 3}), "wide.tif");
+    EXPECT_FALSE(result);
+    EXPECT_TRUE(Contains(result.error, "image 60000 x 60000 (rgba8) exceeds the limit")) << result.error;
+
+    // JPEG sides stop at 65535, still far too much: patch a real file's frame header to 65000 × 65000.
+    auto jpeg = IO::EncodeImage(*Ramps(PixelFormat::RGBA8, 16, 16), IO::FileType::JPEG, "").bytes;
+    bool patched = false;
+    for (std::size_t i = 2; i + 9 < jpeg.size() && !patched; ++i)
+        if (jpeg[i] == std::byte{0xFF} &&
+            (jpeg[i + 1] == std::byte{0xC0} || jpeg[i + 1] == std::byte{0xC2})) {
+            for (std::size_t k : {i + 5, i + 7}) {
+                jpeg[k] = std::byte{0xFD}; // 65000 = 0xFDE8
+                jpeg[k + 1] = std::byte{0xE8};
+            }
+            patched = true;
+        }
+    ASSERT_TRUE(patched);
+    result = IO::DecodeImage(jpeg, "huge.jpg");
+    EXPECT_FALSE(result);
+    EXPECT_TRUE(Contains(result.error, "image 65000 x 65000 (rgba8) exceeds the limit")) << result.error;
+
+    EXPECT_EQ(Kernel::Countable::GetLiveObjectCount(), before);
+}
+
+TEST(HostileInput, FilesAreRecognisedByContentNotName) {
+    ScratchFolder folder;
+    const auto png = IO::EncodeImage(*Noise(PixelFormat::RGBA8, 3, 3, 7), IO::FileType::PNG, "").bytes;
+    WriteBytes(folder / "photo.jpg", png);
+    IO::ReadResult result = IO::ReadImage(folder / "photo.jpg");
+    ASSERT_TRUE(result) << result.error;
+    EXPECT_EQ(result.type, IO::FileType::PNG);
+
+    std::ofstream(folder / "coffee.png") << "this is text, not pixels\n";
+    result = IO::ReadImage(folder / "coffee.png");
+    EXPECT_FALSE(result);
+    EXPECT_EQ(result.error, (folder / "coffee.png").string() + ": not a PNG, JPEG or TIFF file");
+
+    std::ofstream(folder / "empty.tif").flush();
+    result = IO::ReadImage(folder / "empty.tif");
+    EXPECT_FALSE(result);
+    EXPECT_TRUE(StartsWith(result.error, (folder / "empty.tif").string() + ": empty file")) << result.error;
+
+    result = IO::ReadImage(folder / "missing.png");
+    EXPECT_FALSE(result);
+    EXPECT_TRUE(StartsWith(result.error, (folder / "missing.png").string() + ": cannot open"))
+        << result.error;
+}
+
+TEST(HostileInput, OutputTypeComesFromTheExtensionAndUnknownOnesAreRefused) {
+    ScratchFolder folder;
+    auto image = Noise(PixelFormat::RGBA8, 4, 4, 8);
+    for (const char* name : {"a.PNG", "b.Jpg", "c.jpeg", "d.TIF", "e.tiff"}) {
+        ASSERT_TRUE(IO::WriteImage(folder / name, *image)) << name;
+        const IO::ReadResult read = IO::ReadImage(folder / name);
+        ASSERT_TRUE(read) << read.error;
+        EXPECT_EQ(read.type, *IO::GetFileTypeForExtension(name)) << name;
+    }
+    const auto before = folder.Names();
+    IO::WriteResult result = IO::WriteImage(folder / "out.bmp", *image);
+    EXPECT_FALSE(result);
+    EXPECT_EQ(result.error,
+              (folder / "out.bmp").string() +
+                  ": unknown image file extension \".bmp\"; use .png, .jpg, .jpeg, .tif or .tiff");
+    result = IO::WriteImage(folder / "out", *image);
+    EXPECT_FALSE(result);
+    EXPECT_TRUE(Contains(result.error, "no file extension")) << result.error;
+    EXPECT_EQ(folder.Names(), before);
+}
+
+TEST(HostileInput, FormatsATypeCannotHoldAreRefusedWithTheConversionToMake) {
+    auto mask = Noise(PixelFormat::MaskA16, 4, 4, 9);
+    IO::EncodeResult result = IO::EncodeImage(*mask, IO::FileType::TIFF, "mask.tif");
+    EXPECT_FALSE(result);
+    EXPECT_EQ(result.error, "mask.tif: TIFF cannot hold maska16 pixels; convert them to ia16 first");
+    auto cmyk = Noise(PixelFormat::CMYKA8, 4, 4, 9);
+    result = IO::EncodeImage(*cmyk, IO::FileType::PNG, "c.png");
+    EXPECT_EQ(result.error, "c.png: PNG cannot hold cmyka8 pixels; convert them to rgba8 first");
+    result = IO::EncodeImage(*Noise(PixelFormat::IA16, 4, 4, 9), IO::FileType::JPEG, "g.jpg");
+    EXPECT_EQ(result.error, "g.jpg: JPEG cannot hold ia16 pixels; convert them to ia8 first");
+    result =
+        IO::EncodeImage(*Noise(PixelFormat::RGBA8, 4, 4, 9), IO::FileType::JPEG, "q.jpg", {.jpegQuality = 0});
+    EXPECT_EQ(result.error, "q.jpg: JPEG quality 0 is outside 1..100");
+
+    for (PixelFormat format :
+         {PixelFormat::RGBAUF, PixelFormat::LabA16, PixelFormat::CMYKA8, PixelFormat::MaskAF}) {
+        for (IO::FileType type : {IO::FileType::PNG, IO::FileType::JPEG, IO::FileType::TIFF}) {
+            const PixelFormat target = IO::GetWritableFormat(type, format);
+            EXPECT_TRUE(IO::CanWrite(type, target));
+            EXPECT_EQ(IO::GetWritableFormat(type, target), target);
+        }
+    }
+    EXPECT_EQ(IO::GetWritableFormat(IO::FileType::PNG, PixelFormat::RGBAUF), PixelFormat::RGBA16);
+    EXPECT_EQ(IO::GetWritableFormat(IO::FileType::TIFF, PixelFormat::MaskAF), PixelFormat::RGBAUF);
+}
+
+TEST(HostileInput, FailedWritesLeaveTheOldFileAndNoTemporary) {
+    ScratchFolder folder;
+    const auto target = folder / "out.tif";
+    std::ofstream(target) << "old contents";
+    auto image = Noise(PixelFormat::RGBAUF, 256, 256, 10); // about 1 MB that deflate cannot shrink much
+
+    // The disk "fills" half-way through: file size limited to 64 KiB for this process.
+    std::signal(SIGXFSZ, SIG_IGN);
+    rlimit saved{};
+    ASSERT_EQ(getrlimit(RLIMIT_FSIZE, &saved), 0);
+    rlimit tight = saved;
+    tight.rlim_cur = 64 << 10;
+    ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &tight), 0);
+    const IO::WriteResult result = IO::WriteImage(target, *image);
+    setrlimit(RLIMIT_FSIZE, &saved);
+    std::signal(SIGXFSZ, SIG_DFL);
+    EXPECT_FALSE(result);
+    EXPECT_TRUE(StartsWith(result.error, target.string() + ": ")) << result.error;
+    std::string contents;
+    std::getline(std::ifstream(target), contents);
+    EXPECT_EQ(contents, "old contents");
+    EXPECT_EQ(folder.Names(), std::vector<std::string>{"out.tif"});
+
+    // The name is taken by a folder: the rename fails and the folder stays as it was.
+    std::filesystem::create_directory(folder / "taken.png");
+    std::ofstream(folder / "taken.png" / "inside.txt") << "keep";
+    const IO::WriteResult blocked =
+        IO::WriteImage(folder / "taken.png", *Noise(PixelFormat::RGBA8, 8, 8, 11));
+    EXPECT_FALSE(blocked);
+    EXPECT_TRUE(StartsWith(blocked.error, (folder / "taken.png").string() + ": ")) << blocked.error;
+    EXPECT_EQ(folder.Names(), (std::vector<std::string>{"out.tif", "taken.png"}));
+    EXPECT_TRUE(std::filesystem::exists(folder / "taken.png" / "inside.txt"));
+
+    // A refused format never gets as far as the file.
+    EXPECT_FALSE(IO::WriteImage(target, *Noise(PixelFormat::MaskA8, 8, 8, 12)));
+    std::getline(std::ifstream(target), contents);
+    EXPECT_EQ(contents, "old contents");
+
+    const IO::WriteResult nowhere =
+        IO::WriteImage(folder / "no" / "such" / "folder.png", *Noise(PixelFormat::RGBA8, 8, 8, 13));
+    EXPECT_FALSE(nowhere);
+    EXPECT_TRUE(StartsWith(nowhere.error, (folder / "no" / "such" / "folder.png").string() + ": "))
+        << nowhere.error;
+}
+
+} // namespace
