@@ -1,0 +1,99 @@
+#include "host/document/Document.h"
+
+#include <algorithm>
+#include <atomic>
+
+namespace {
+std::uint64_t NextNodeId() {
+    static std::atomic<std::uint64_t> next{1};
+    return next.fetch_add(1, std::memory_order_relaxed);
+}
+} // namespace
+
+Node::Node(std::string name)
+    : m_Id(NextNodeId())
+    , m_Name(std::move(name)) {}
+
+RasterNode::RasterNode(std::string name, int width, int height)
+    : Node(std::move(name))
+    , m_Width(width)
+    , m_Height(height) {}
+
+FilterRasterNode::FilterRasterNode(std::string name,
+                                   Kernel::Counted<RasterDevicePreviewableFilterLayerCommand> filter)
+    : Node(std::move(name))
+    , m_Filter(std::move(filter)) {}
+
+void Document::InsertLayer(std::size_t index, Kernel::Counted<Node> node) {
+    index = std::min(index, m_Layers.size());
+    m_Layers.insert(m_Layers.begin() + std::ptrdiff_t(index), std::move(node));
+}
+
+void Document::RemoveLayer(const Kernel::Counted<Node>& node) {
+    std::erase(m_Layers, node);
+    std::erase(m_Selection, node);
+}
+
+int Document::IndexOf(const Node& node) const {
+    for (std::size_t i = 0; i < m_Layers.size(); ++i)
+        if (m_Layers[i].Get() == &node) return int(i);
+    return -1;
+}
+
+Kernel::Counted<FilterRasterNode> Document::GetSingleSelectedFilterNode() const {
+    Kernel::Counted<FilterRasterNode> found;
+    for (const auto& node : m_Selection) {
+        if (auto filter = Kernel::CountedCast<FilterRasterNode>(node)) {
+            if (found) return {};
+            found = std::move(filter);
+        }
+    }
+    return found;
+}
+
+namespace {
+void Apply(Document& document, const HistoryEntry& entry, bool forward) {
+    switch (entry.kind) {
+    case HistoryEntry::Kind::PixelChange:
+        break; // pixels are restored by the raster side of the host
+    case HistoryEntry::Kind::LiveLayerAdded:
+        if (forward)
+            document.InsertLayer(entry.index, entry.layer);
+        else
+            document.RemoveLayer(entry.layer);
+        break;
+    case HistoryEntry::Kind::LiveFilterChanged:
+        if (auto node = Kernel::CountedCast<FilterRasterNode>(entry.layer))
+            node->SetFilter(
+                forward ? Kernel::CountedCast<RasterDevicePreviewableFilterLayerCommand>(entry.command)
+                        : entry.previousFilter);
+        break;
+    }
+}
+} // namespace
+
+void Document::PushHistory(HistoryEntry entry) {
+    m_History.resize(m_Cursor);
+    Apply(*this, entry, true);
+    m_History.push_back(std::move(entry));
+    m_Cursor = m_History.size();
+}
+
+void Document::RestoreHistory(std::vector<HistoryEntry> entries, std::size_t cursor) {
+    m_History = std::move(entries);
+    m_Cursor = std::min(cursor, m_History.size());
+}
+
+bool Document::Undo() {
+    if (m_Cursor == 0) return false;
+    --m_Cursor;
+    Apply(*this, m_History[m_Cursor], false);
+    return true;
+}
+
+bool Document::Redo() {
+    if (m_Cursor == m_History.size()) return false;
+    Apply(*this, m_History[m_Cursor], true);
+    ++m_Cursor;
+    return true;
+}

@@ -1,0 +1,112 @@
+#pragma once
+// A layered document: a stack of raster layers and live filter layers, a layer selection, and its history.
+
+#include "host/document/Command.h"
+#include "host/kernel/Countable.h"
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+// One layer of a document. Nodes keep their identity for their whole life; history entries refer to them.
+class Node : public virtual Kernel::Countable {
+public:
+    explicit Node(std::string name);
+    std::uint64_t GetId() const noexcept { return m_Id; }
+    const std::string& GetName() const noexcept { return m_Name; }
+    void SetName(std::string name) { m_Name = std::move(name); }
+    virtual std::string GetKindName() const = 0;
+
+private:
+    std::uint64_t m_Id;
+    std::string m_Name;
+};
+
+// A layer of pixels. Its pixel storage is attached by the raster side of the host.
+class RasterNode : public Node {
+public:
+    RasterNode(std::string name, int width, int height);
+    int GetWidth() const noexcept { return m_Width; }
+    int GetHeight() const noexcept { return m_Height; }
+    std::string GetKindName() const override { return "raster"; }
+
+private:
+    int m_Width;
+    int m_Height;
+};
+
+// Gives access to the filter command of a live filter layer.
+class FilterParamsInterface {
+public:
+    virtual ~FilterParamsInterface() = default;
+    virtual Kernel::Counted<RasterDevicePreviewableFilterLayerCommand> GetFilter() const = 0;
+};
+
+// A live filter layer: its command renders over the layers beneath whenever the document is drawn.
+class FilterRasterNode : public Node, public FilterParamsInterface {
+public:
+    FilterRasterNode(std::string name, Kernel::Counted<RasterDevicePreviewableFilterLayerCommand> filter);
+    Kernel::Counted<RasterDevicePreviewableFilterLayerCommand> GetFilter() const override { return m_Filter; }
+    void SetFilter(Kernel::Counted<RasterDevicePreviewableFilterLayerCommand> filter) {
+        m_Filter = std::move(filter);
+    }
+    std::string GetKindName() const override { return "live filter"; }
+
+private:
+    Kernel::Counted<RasterDevicePreviewableFilterLayerCommand> m_Filter;
+};
+
+// One undoable step: the command as applied and what it changed, so that it can be undone, redone and saved.
+struct HistoryEntry {
+    enum class Kind {
+        PixelChange,       // the command changed the pixels of the selected raster layers
+        LiveLayerAdded,    // the command became the filter of a new live filter layer at index
+        LiveFilterChanged, // the command replaced previousFilter as the filter of layer
+    };
+    Kind kind = Kind::PixelChange;
+    Kernel::Counted<Command> command;
+    Kernel::Counted<Node> layer;
+    std::size_t index = 0;
+    Kernel::Counted<RasterDevicePreviewableFilterLayerCommand> previousFilter;
+};
+
+// The layers, selection and history of one document. Not thread-safe: the user-interface thread owns it.
+class Document : public virtual Kernel::Countable {
+public:
+    using NodeList = std::vector<Kernel::Counted<Node>>;
+
+    // Layers from bottom to top.
+    const NodeList& GetLayers() const noexcept { return m_Layers; }
+    void InsertLayer(std::size_t index, Kernel::Counted<Node> node);
+    void RemoveLayer(const Kernel::Counted<Node>& node);
+    // The index of node in the layer stack, or -1.
+    int IndexOf(const Node& node) const;
+    const Kernel::Counted<Node>& GetLayer(std::size_t index) const { return m_Layers.at(index); }
+
+    const NodeList& GetSelection() const noexcept { return m_Selection; }
+    void SetSelection(NodeList selection) { m_Selection = std::move(selection); }
+    // The only selected live filter layer, or null when none or several are selected.
+    Kernel::Counted<FilterRasterNode> GetSingleSelectedFilterNode() const;
+
+    // History: entries before the cursor are done, those after it were undone and can be redone.
+    const std::vector<HistoryEntry>& GetHistory() const noexcept { return m_History; }
+    std::size_t GetHistoryCursor() const noexcept { return m_Cursor; }
+    // Drops the undone entries, applies entry and appends it.
+    void PushHistory(HistoryEntry entry);
+    // Replaces the whole history, entries before cursor counted as done (used when loading; nothing is
+    // applied).
+    void RestoreHistory(std::vector<HistoryEntry> entries, std::size_t cursor);
+    bool Undo();
+    bool Redo();
+
+    // The transient command shown over the document, not kept in history.
+    const Kernel::Counted<Command>& GetPreview() const noexcept { return m_Preview; }
+    void SetPreview(Kernel::Counted<Command> preview) { m_Preview = std::move(preview); }
+
+private:
+    NodeList m_Layers;
+    NodeList m_Selection;
+    std::vector<HistoryEntry> m_History;
+    std::size_t m_Cursor = 0;
+    Kernel::Counted<Command> m_Preview;
+};

@@ -1,0 +1,109 @@
+#pragma once
+// The document controller: one document, its tools, its selection and how commands reach its history.
+
+#include "host/document/Command.h"
+#include "host/document/Document.h"
+#include "host/document/Tool.h"
+#include "host/kernel/Countable.h"
+#include "host/kernel/Notification.h"
+
+#include <functional>
+#include <string>
+#include <vector>
+
+// What a new document gets unless the user says otherwise.
+struct DocumentDefaults {
+    int width = 1024;
+    int height = 768;
+    double resolution = 72.0; // pixels per inch
+};
+
+// The layer stack and selection at one moment; layers are shared, so a snapshot is cheap.
+class DocumentSnapshot : public virtual Kernel::Countable {
+public:
+    DocumentSnapshot(Document::NodeList layers, Document::NodeList selection)
+        : m_Layers(std::move(layers))
+        , m_Selection(std::move(selection)) {}
+    const Document::NodeList& GetLayers() const noexcept { return m_Layers; }
+    const Document::NodeList& GetSelection() const noexcept { return m_Selection; }
+
+private:
+    Document::NodeList m_Layers;
+    Document::NodeList m_Selection;
+};
+
+// Always held by Kernel::Counted: tools keep it alive through GetSafeDocumentController.
+class DocumentController : public virtual Kernel::Countable {
+public:
+    using ToolFactory = std::function<void(Kernel::NonCounted<DocumentController>)>;
+    using Observer = std::function<void(const std::string& event)>;
+
+    // Called by libraries at load; the factories run when a controller creates its tools.
+    static void RegisterTool(ToolFactory factory);
+    static std::size_t GetRegisteredToolCount();
+
+    explicit DocumentController(Kernel::Counted<Document> document);
+
+    // Runs every registered tool factory once for this controller.
+    void CreateTools();
+    void AddTool(Kernel::Counted<Tool> tool);
+    const std::vector<Kernel::Counted<Tool>>& GetTools() const noexcept { return m_Tools; }
+    Kernel::Counted<Tool> FindTool(ToolID id) const;
+
+    // Makes tool the current one without starting it; Start is the caller's (the host's) next step.
+    Kernel::Counted<Tool> SetActiveTool(Kernel::Counted<Tool> tool);
+    const Kernel::Counted<Tool>& GetActiveTool() const noexcept { return m_ActiveTool; }
+
+    const Kernel::Counted<Document>& GetDocument() const noexcept { return m_Document; }
+    // Puts another document in place of the current one (after loading), leaving any live edit.
+    void SetDocument(Kernel::Counted<Document> document);
+
+    const DocumentDefaults& GetDocumentDefaults() const noexcept { return m_Defaults; }
+    void SetDocumentDefaults(const DocumentDefaults& defaults) { m_Defaults = defaults; }
+
+    // The current layer stack and selection, to compare with or go back to later.
+    Kernel::Counted<DocumentSnapshot> TakeSnapshot() const;
+    // Puts the snapshot's layers and selection back; history is left as it is.
+    void RestoreSnapshot(const DocumentSnapshot& snapshot);
+
+    // Replaces the layer selection and tells the active tool.
+    void SetSelection(Document::NodeList selection);
+    // Selects one live filter layer and edits its filter in place of pixels until the tool cancels.
+    void BeginLiveEffectEdit(Kernel::Counted<FilterRasterNode> node);
+    void EndLiveEffectEdit();
+    bool IsEditingLiveEffect() const noexcept { return m_EditingLiveEffect; }
+
+    // Transient commands replace the preview; the others are merged into or added to history.
+    void EnqueueCommand(Kernel::Counted<Command> command, bool transient);
+    void CancelPreview();
+    bool Undo();
+    bool Redo();
+
+    // Delivers a notification to the observer and the active tool.
+    void Post(Kernel::Counted<Kernel::Notification> notification);
+
+    void SetHintline(std::string hint);
+    const std::string& GetHintline() const noexcept { return m_Hintline; }
+    void SetCursor(int cursor);
+    int GetCursor() const noexcept { return m_Cursor; }
+
+    // Receives one line for every notification, enqueued command, merge and history change.
+    void SetObserver(Observer observer) { m_Observer = std::move(observer); }
+
+private:
+    void Report(const std::string& event) const;
+    void ApplyToDocument(const Kernel::Counted<Command>& command);
+
+    Kernel::Counted<Document> m_Document;
+    DocumentDefaults m_Defaults;
+    std::vector<Kernel::Counted<Tool>> m_Tools;
+    Kernel::Counted<Tool> m_ActiveTool;
+    bool m_EditingLiveEffect = false;
+    std::string m_Hintline;
+    int m_Cursor = 0;
+    Observer m_Observer;
+    int m_NotifyDepth = 0;
+};
+
+// One line that names a command and its reflected parameters: "Add Noise inte=0.5 mono=false".
+std::string DescribeCommand(const Command& command);
