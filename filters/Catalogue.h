@@ -1,0 +1,39 @@
+#pragma once
+// The library's filters by name, for front ends: parameters, codes and a way to build each command.
+
+#include "frame/Parameters.h"
+#include "host/document/Command.h"
+#include "host/document/ToolID.h"
+
+#include <functional>
+#include <span>
+#include <string_view>
+#include <vector>
+
+namespace RasterTools {
+
+struct FilterInfo {
+    std::string_view name;         // settings name and command-line name, e.g. "addnoise"
+    std::string_view toolClass;    // "NoiseTool"; empty for commands without a tool
+    std::string_view commandClass; // "RasterAddNoiseCommand"
+    std::string_view description;  // the command's description
+    ToolID toolID;
+    Kernel::FourCC classCode;
+    std::vector<ParameterSpec> parameters;
+    // A command with the given values, in parameter order.
+    std::function<Kernel::Counted<RasterCommand>(bool liveEffect, const std::vector<ParameterValue>& values)>
+        makeCommand;
+    // Whether command is one of this filter's.
+    std::function<bool(const Command& command)> isCommand;
+    // The values of a command of this filter, in parameter order (the caller checks isCommand first).
+    std::function<std::vector<ParameterValue>(const Command& command)> readCommand;
+};
+
+// Every filter of the library, in a fixed order. Built on first use, not at load.
+const std::vector<FilterInfo>& GetFilterCatalogue();
+const FilterInfo* FindFilter(std::string_view name);
+const FilterInfo* FindFilter(ToolID tool);
+// The catalogue entry of a command object, or null when the library does not know it.
+const FilterInfo* FindFilterOf(const Command& command);
+
+} // namespace RasterTools

@@ -1,0 +1,61 @@
+#pragma once
+// The add-noise filter's parameters, declared once for its tool and command.
+
+#include "frame/Parameters.h"
+#include "host/document/ToolID.h"
+
+namespace RasterTools {
+
+class NoiseTool;
+class RasterAddNoiseCommand;
+
+struct AddNoiseParameters {
+    double intensity = 0.0; // noise amount; 0 adds none
+    bool mono = false;      // one noise value for all colour channels of a pixel
+    bool gaussian = true;   // gaussian rather than uniform distribution
+};
+
+struct AddNoiseFilter {
+    using Params = AddNoiseParameters;
+    using Tool = NoiseTool;
+    using Command = RasterAddNoiseCommand;
+
+    static constexpr std::string_view kName = "addnoise";
+    static constexpr std::string_view kDescription = "Add Noise";
+    static constexpr std::string_view kHint = "|DRAG| to set intensity. |CLICK| to reset.";
+    static constexpr ToolID kToolID = ToolID::AddNoise;
+    static constexpr double kDragScale = 0.001953125; // 512 document units of drag give intensity 1
+
+    static constexpr std::array<Parameter<Params>, 3> kParameters{{
+        {{.name = "intensity",
+          .type = ParameterType::Double,
+          .code = Kernel::MakeFourCC("Inte"),
+          .reflected = Kernel::MakeFourCC("inte"),
+          .toolLabel = "Intensity",
+          .commandLabel = "Intensity",
+          .minimum = 0.0,
+          .maximum = 100.0,
+          .defaultValue = 0.0},
+         &Params::intensity},
+        {{.name = "mono",
+          .type = ParameterType::Bool,
+          .code = Kernel::MakeFourCC("Mono"),
+          .reflected = Kernel::MakeFourCC("mono"),
+          .toolLabel = "Monochrome",
+          .commandLabel = "Mono",
+          .defaultValue = false,
+          .image = "monochromatic"},
+         &Params::mono},
+        {{.name = "gaussian",
+          .type = ParameterType::Bool,
+          .code = Kernel::MakeFourCC("Gaus"),
+          .reflected = Kernel::MakeFourCC("gaus"),
+          .toolLabel = "Gaussian",
+          .commandLabel = "Gaussian",
+          .defaultValue = true,
+          .image = "gaussian"},
+         &Params::gaussian},
+    }};
+};
+
+} // namespace RasterTools

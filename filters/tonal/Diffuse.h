@@ -1,0 +1,41 @@
+#pragma once
+// The diffuse filter's parameters, declared once for its tool and command.
+
+#include "frame/Parameters.h"
+#include "host/document/ToolID.h"
+
+namespace RasterTools {
+
+class DiffuseTool;
+class RasterDiffuseCommand;
+
+struct DiffuseParameters {
+    double intensity = 0.0; // scatter distance: a pixel moves by at most 512 × intensity on each axis
+};
+
+struct DiffuseFilter {
+    using Params = DiffuseParameters;
+    using Tool = DiffuseTool;
+    using Command = RasterDiffuseCommand;
+
+    static constexpr std::string_view kName = "diffuse";
+    static constexpr std::string_view kDescription = "Diffuse";
+    static constexpr std::string_view kHint = "|DRAG| to set diffusion. |CLICK| to reset.";
+    static constexpr ToolID kToolID = ToolID::Diffuse;
+    static constexpr double kDragScale = 1.0 / 512.0;
+
+    static constexpr std::array<Parameter<Params>, 1> kParameters{{
+        {{.name = "intensity",
+          .type = ParameterType::Double,
+          .code = Kernel::MakeFourCC("Inte"),
+          .reflected = Kernel::MakeFourCC("inte"),
+          .toolLabel = "Intensity",
+          .commandLabel = "Intensity",
+          .minimum = 0.0,
+          .maximum = 1.0,
+          .defaultValue = 0.0},
+         &Params::intensity},
+    }};
+};
+
+} // namespace RasterTools

@@ -1,0 +1,34 @@
+#pragma once
+// The unsharp-mask command: adds back factor × (source − blur) where the difference passes the threshold.
+
+#include "filters/tonal/UnsharpMask.h"
+#include "frame/FilterCommand.h"
+
+namespace RasterTools {
+
+class RasterUnsharpMaskCommand final : public FilterCommand<UnsharpMaskFilter> {
+public:
+    RasterUnsharpMaskCommand(bool liveEffect, double radius, double factor, double threshold);
+    RasterUnsharpMaskCommand(bool liveEffect, const UnsharpMaskParameters& params);
+
+    double GetRadius() const noexcept { return m_Params.radius; }
+    double GetFactor() const noexcept { return m_Params.factor; }
+    double GetThreshold() const noexcept { return m_Params.threshold; }
+
+    bool CanAffectAlpha() const override { return false; }
+    // The blur reads ceil(radius / 3) whole pixels beyond every side of the output.
+    void PrepareInputRectangle(Kernel::RectT<double>& rect) const override;
+    bool PrepareOutputRectangle(Kernel::RectT<double>& rect) const override;
+    int GetMargin() const noexcept;
+
+    const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
+    static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }
+    static Kernel::Counted<Kernel::Serialisable> CreateObject();
+    static const Kernel::ClassPropertiesBase::DefaultItem* __GetDefaultSerialisation();
+
+private:
+    RasterUnsharpMaskCommand() = default;
+    static const Kernel::ClassProperties ms_ClassProperties;
+};
+
+} // namespace RasterTools

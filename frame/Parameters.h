@@ -1,0 +1,158 @@
+#pragma once
+// A filter's parameters declared once: the table that feeds settings, serialisation, reflection and the
+// command line.
+
+#include "host/kernel/FourCC.h"
+#include "host/kernel/Geometry.h"
+#include "host/kernel/Reflection.h"
+#include "host/kernel/Serialiser.h"
+
+#include <array>
+#include <bit>
+#include <optional>
+#include <span>
+#include <string>
+#include <string_view>
+#include <variant>
+#include <vector>
+
+namespace RasterTools {
+
+// Values are written as their in-memory bytes; the tagged format is little-endian.
+static_assert(std::endian::native == std::endian::little,
+              "serialised parameters assume a little-endian host");
+
+enum class ParameterType { Double, Bool, Int, Point };
+using ParameterValue = std::variant<double, bool, int, Kernel::PointT<double>>;
+
+std::string_view ParameterTypeName(ParameterType type);
+std::string FormatParameterValue(const ParameterValue& value);
+// Parses text as a value of the given type; nothing when it does not parse.
+std::optional<ParameterValue> ParseParameterValue(ParameterType type, std::string_view text);
+
+// Everything the host contract fixes about one parameter.
+struct ParameterSpec {
+    std::string_view name;         // settings-key leaf and command-line flag, e.g. "intensity"
+    ParameterType type;            // value type
+    Kernel::FourCC code;           // serialised property code, e.g. "Inte"
+    Kernel::FourCC reflected;      // reflected identifier, e.g. "inte"
+    std::string_view toolLabel;    // label on the tool's panel
+    std::string_view commandLabel; // label on the live filter layer's panel
+    double minimum = 0.0;          // display range of numbers
+    double maximum = 0.0;
+    ParameterValue defaultValue{}; // value when the settings store has none, and after Reset
+    std::string_view image{};      // tool panel icon, if any
+    Kernel::UnitKind unit = Kernel::UnitKind::None;
+    bool persisted = true; // kept under "tools.<filter>.<name>"
+};
+
+std::string SettingsKey(std::string_view filterName, const ParameterSpec& spec);
+
+// One parameter bound to its field in a filter's parameter record.
+template <class Params>
+struct Parameter {
+    using Field =
+        std::variant<double Params::*, bool Params::*, int Params::*, Kernel::PointT<double> Params::*>;
+    ParameterSpec spec;
+    Field field;
+};
+
+template <class Params>
+ParameterValue GetParameter(const Params& params, const Parameter<Params>& parameter) {
+    return std::visit([&](auto member) { return ParameterValue(params.*member); }, parameter.field);
+}
+
+// Stores value, converting between the numeric types; false when the kinds do not match.
+template <class Params>
+bool SetParameter(Params& params, const Parameter<Params>& parameter, const ParameterValue& value) {
+    return std::visit(
+        [&](auto member) {
+            using T = std::remove_reference_t<decltype(params.*member)>;
+            if (const T* exact = std::get_if<T>(&value)) {
+                params.*member = *exact;
+                return true;
+            }
+            if constexpr (std::is_same_v<T, double>) {
+                if (const int* whole = std::get_if<int>(&value)) {
+                    params.*member = double(*whole);
+                    return true;
+                }
+            }
+            return false;
+        },
+        parameter.field);
+}
+
+template <class Params, std::size_t N>
+Params DefaultParameters(const std::array<Parameter<Params>, N>& table) {
+    Params params{};
+    for (const auto& parameter : table)
+        SetParameter(params, parameter, parameter.spec.defaultValue);
+    return params;
+}
+
+// Writes each parameter in table order: doubles, ints and points as tagged values, booleans typed.
+template <class Params, std::size_t N>
+void SaveParameters(Kernel::OutSerialiser& out, const Params& params,
+                    const std::array<Parameter<Params>, N>& table) {
+    for (const auto& parameter : table) {
+        const auto code = parameter.spec.code;
+        std::visit(
+            [&](auto member) {
+                const auto& value = params.*member;
+                using T = std::remove_cvref_t<decltype(value)>;
+                if constexpr (std::is_same_v<T, bool>)
+                    out.SaveType(code, value);
+                else if constexpr (std::is_same_v<T, double>)
+                    out.SaveTypeI(code, Kernel::TypeTag::Double, &value, sizeof value);
+                else if constexpr (std::is_same_v<T, int>)
+                    out.SaveTypeI(code, Kernel::TypeTag::Int32, &value, sizeof value);
+                else
+                    out.SaveTypeI(code, Kernel::TypeTag::Point, &value, sizeof value);
+            },
+            parameter.field);
+    }
+}
+
+// Reads each parameter present in the stream; absent ones keep their value.
+template <class Params, std::size_t N>
+void LoadParameters(const Kernel::InSerialiser& in, Params& params,
+                    const std::array<Parameter<Params>, N>& table) {
+    for (const auto& parameter : table) {
+        const auto code = parameter.spec.code;
+        std::visit(
+            [&](auto member) {
+                auto& value = params.*member;
+                using T = std::remove_cvref_t<decltype(value)>;
+                if constexpr (std::is_same_v<T, bool>)
+                    in.LoadType(code, value);
+                else if constexpr (std::is_same_v<T, double>)
+                    in.LoadTypeI(code, Kernel::TypeTag::Double, &value, sizeof value);
+                else if constexpr (std::is_same_v<T, int>)
+                    in.LoadTypeI(code, Kernel::TypeTag::Int32, &value, sizeof value);
+                else
+                    in.LoadTypeI(code, Kernel::TypeTag::Point, &value, sizeof value);
+            },
+            parameter.field);
+    }
+}
+
+// Reads the persisted parameters, with the table's defaults for absent keys.
+template <class Params, std::size_t N>
+void ReadSettings(Params& params, std::string_view filterName, const std::array<Parameter<Params>, N>& table);
+// Writes the persisted parameters.
+template <class Params, std::size_t N>
+void WriteSettings(const Params& params, std::string_view filterName,
+                   const std::array<Parameter<Params>, N>& table);
+
+// Which panel a reflected property list is for: the tool's, or the live filter layer's.
+enum class Panel { Tool, Command };
+
+// Reflected properties bound to the fields of params, which owner keeps alive.
+template <class Params, std::size_t N>
+Kernel::ReflectedList ReflectParameters(Kernel::Counted<Kernel::Countable> owner, Params* params,
+                                        const std::array<Parameter<Params>, N>& table, Panel panel);
+
+} // namespace RasterTools
+
+#include "frame/Parameters.inl"
