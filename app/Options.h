@@ -1,0 +1,36 @@
+#pragma once
+// Small helpers shared by the rastertools subcommands: errors with exit codes, argument parsing.
+
+#include <stdexcept>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace App {
+
+// Exit codes: 0 success, 1 failure while working, 2 bad command line.
+constexpr int kExitFailure = 1;
+constexpr int kExitUsage = 2;
+
+// A problem to report to the user; the message is complete and names what is wrong.
+class Error : public std::runtime_error {
+public:
+    Error(std::string message, int exitCode = kExitFailure)
+        : std::runtime_error(std::move(message))
+        , m_ExitCode(exitCode) {}
+    int GetExitCode() const noexcept { return m_ExitCode; }
+
+private:
+    int m_ExitCode;
+};
+
+class UsageError : public Error {
+public:
+    explicit UsageError(std::string message)
+        : Error(std::move(message), kExitUsage) {}
+};
+
+int RunList(const std::vector<std::string>& args);
+int RunPlay(const std::vector<std::string>& args);
+
+} // namespace App

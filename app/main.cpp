@@ -1,0 +1,62 @@
+// rastertools: the command-line editor built on the RasterTools library and its reference host.
+
+#include "app/Options.h"
+#include "host/document/VeyraController.h"
+
+#include <cstdlib>
+#include <iostream>
+
+namespace {
+
+constexpr std::string_view kUsage = R"(usage: rastertools [--settings FILE] COMMAND [ARGS...]
+
+commands:
+  list            every tool and command: class codes, tool identifiers, descriptions, parameters
+  play SCRIPT     drive a tool as an editor would and print what the host sees
+
+options:
+  --settings FILE the settings file (default: $RASTERTOOLS_SETTINGS, else
+                  $XDG_CONFIG_HOME/rastertools/settings.json)
+  --help          this text
+)";
+
+int Run(std::vector<std::string> args) {
+    // Global options may stand anywhere; take them out before the subcommand sees its arguments.
+    for (std::size_t i = 0; i < args.size();) {
+        if (args[i] == "--settings") {
+            if (i + 1 >= args.size()) throw App::UsageError("--settings needs a file name");
+            VeyraController::GetInstance().SetFile(args[i + 1]);
+            args.erase(args.begin() + std::ptrdiff_t(i), args.begin() + std::ptrdiff_t(i) + 2);
+        } else if (args[i] == "--help" || args[i] == "-h") {
+            std::cout << kUsage;
+            return 0;
+        } else {
+            ++i;
+        }
+    }
+    if (args.empty()) throw App::UsageError("no command given");
+    const std::string command = args.front();
+    args.erase(args.begin());
+    if (command == "list") return App::RunList(args);
+    if (command == "play") return App::RunPlay(args);
+    if (command == "help") {
+        std::cout << kUsage;
+        return 0;
+    }
+    throw App::UsageError("unknown command \"" + command + "\" (commands: list, play)");
+}
+
+} // namespace
+
+int main(int argc, char** argv) {
+    try {
+        return Run(std::vector<std::string>(argv + 1, argv + argc));
+    } catch (const App::Error& error) {
+        std::cerr << "rastertools: " << error.what() << '\n';
+        if (error.GetExitCode() == App::kExitUsage) std::cerr << "Try 'rastertools --help'.\n";
+        return error.GetExitCode();
+    } catch (const std::exception& error) {
+        std::cerr << "rastertools: " << error.what() << '\n';
+        return App::kExitFailure;
+    }
+}
