@@ -67,6 +67,17 @@ public:
         return RasterDevicePreviewableFilterLayerCommand::Load(in, store, version);
     }
 
+    // The class registry's factory: a command with default fields, which Load then sets.
+    static Kernel::Counted<Kernel::Serialisable> CreateObject() {
+        return Kernel::Counted<Kernel::Serialisable>(new typename Filter::Command());
+    }
+
+    // No property of a filter command declares a default value: one empty item.
+    static const Kernel::ClassPropertiesBase::DefaultItem* __GetDefaultSerialisation() {
+        static const Kernel::ClassPropertiesBase::DefaultItem items[] = {{}};
+        return items;
+    }
+
 protected:
     // Only for loading: the fields are then set by Load.
     FilterCommand()

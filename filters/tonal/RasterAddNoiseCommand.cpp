@@ -19,13 +19,4 @@ RasterAddNoiseCommand::RasterAddNoiseCommand(bool liveEffect, double intensity, 
 RasterAddNoiseCommand::RasterAddNoiseCommand(bool liveEffect, const AddNoiseParameters& params)
     : FilterCommand(liveEffect, params) {}
 
-Kernel::Counted<Kernel::Serialisable> RasterAddNoiseCommand::CreateObject() {
-    return Kernel::Counted<Kernel::Serialisable>(new RasterAddNoiseCommand());
-}
-
-const Kernel::ClassPropertiesBase::DefaultItem* RasterAddNoiseCommand::__GetDefaultSerialisation() {
-    static const Kernel::ClassPropertiesBase::DefaultItem items[] = {{}};
-    return items;
-}
-
 } // namespace RasterTools

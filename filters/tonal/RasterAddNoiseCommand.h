@@ -24,10 +24,9 @@ public:
 
     const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
     static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }
-    static Kernel::Counted<Kernel::Serialisable> CreateObject();
-    static const Kernel::ClassPropertiesBase::DefaultItem* __GetDefaultSerialisation();
 
 private:
+    friend class FilterCommand<AddNoiseFilter>; // creates the default-constructed command for loading
     RasterAddNoiseCommand() = default;
     static const Kernel::ClassProperties ms_ClassProperties;
 };

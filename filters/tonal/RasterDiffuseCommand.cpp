@@ -30,13 +30,4 @@ bool RasterDiffuseCommand::PrepareOutputRectangle(Kernel::RectT<double>& rect) c
     return true;
 }
 
-Kernel::Counted<Kernel::Serialisable> RasterDiffuseCommand::CreateObject() {
-    return Kernel::Counted<Kernel::Serialisable>(new RasterDiffuseCommand());
-}
-
-const Kernel::ClassPropertiesBase::DefaultItem* RasterDiffuseCommand::__GetDefaultSerialisation() {
-    static const Kernel::ClassPropertiesBase::DefaultItem items[] = {{}};
-    return items;
-}
-
 } // namespace RasterTools

@@ -38,13 +38,4 @@ bool RasterUnsharpMaskCommand::PrepareOutputRectangle(Kernel::RectT<double>& rec
     return true;
 }
 
-Kernel::Counted<Kernel::Serialisable> RasterUnsharpMaskCommand::CreateObject() {
-    return Kernel::Counted<Kernel::Serialisable>(new RasterUnsharpMaskCommand());
-}
-
-const Kernel::ClassPropertiesBase::DefaultItem* RasterUnsharpMaskCommand::__GetDefaultSerialisation() {
-    static const Kernel::ClassPropertiesBase::DefaultItem items[] = {{}};
-    return items;
-}
-
 } // namespace RasterTools

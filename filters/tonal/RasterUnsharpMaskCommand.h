@@ -23,10 +23,9 @@ public:
 
     const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
     static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }
-    static Kernel::Counted<Kernel::Serialisable> CreateObject();
-    static const Kernel::ClassPropertiesBase::DefaultItem* __GetDefaultSerialisation();
 
 private:
+    friend class FilterCommand<UnsharpMaskFilter>; // creates the default-constructed command for loading
     RasterUnsharpMaskCommand() = default;
     static const Kernel::ClassProperties ms_ClassProperties;
 };

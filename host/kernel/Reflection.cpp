@@ -71,6 +71,14 @@ std::string SensitivityAttribute::Describe() const {
 
 // ---- Value traits ----
 
+std::string ReflectedValueTraits<double>::Format(double value) {
+    return FormatDouble(value);
+}
+
+bool ReflectedValueTraits<double>::Parse(std::string_view text, double& value) {
+    return ParseFiniteDouble(text, value);
+}
+
 std::string ReflectedValueTraits<bool>::Format(bool value) {
     return value ? "true" : "false";
 }

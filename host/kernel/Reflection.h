@@ -198,6 +198,14 @@ template <class T>
 struct ReflectedValueTraits;
 
 template <>
+struct ReflectedValueTraits<double> {
+    static constexpr std::string_view kName = "double";
+    // The shortest text that reads back as the same value.
+    static std::string Format(double value);
+    // The whole text as one finite number.
+    static bool Parse(std::string_view text, double& value);
+};
+template <>
 struct ReflectedValueTraits<bool> {
     static constexpr std::string_view kName = "bool";
     static std::string Format(bool value);
