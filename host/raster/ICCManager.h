@@ -1,0 +1,67 @@
+#pragma once
+// The host's colour manager: conversions between working float RGB and LabA16 pixels on the processor.
+
+namespace Raster {
+
+// The two colour spaces, shared with the kernel text (LabFragments.h) so that both paths use one definition.
+//
+// Working RGB (rgbauf, and what 8- and 16-bit RGB layers hold): sRGB-encoded values, sRGB primaries, D65
+// white. The transfer curve is the sRGB one, continued beyond 0..1 rather than clipped: below the break
+// point the linear segment goes on into negative values, above 1 the power segment goes on. Out-of-gamut
+// and over-bright colours therefore reach Lab and come back unchanged, as far as LabA16 can store them.
+//
+// Lab: CIE L*a*b* relative to D50, the illuminant of ICC profile connection, so that LabA16 pixels mean the
+// same as Lab TIFF files and ICC Lab data from other applications. D65 is adapted to D50 with the Bradford
+// transform, as ICC matrix/shaper profiles do; the conversion is relative colorimetric.
+namespace WorkingColourSpace {
+// CIE xy chromaticities.
+inline constexpr double RedX = 0.64, RedY = 0.33;
+inline constexpr double GreenX = 0.30, GreenY = 0.60;
+inline constexpr double BlueX = 0.15, BlueY = 0.06;
+inline constexpr double WhiteX = 0.3127, WhiteY = 0.3290;
+
+// Encoded v to linear light: ((v + Offset) / (1 + Offset))^Gamma from Break up, v / LinearSlope below.
+inline constexpr double Gamma = 2.4;
+inline constexpr double Offset = 0.055;
+inline constexpr double LinearSlope = 12.92;
+inline constexpr double Break = 0.04045;
+
+// The Lab reference white (the ICC D50, XYZ with Y = 1).
+inline constexpr double LabWhiteX = 0.9642, LabWhiteY = 1.0, LabWhiteZ = 0.8249;
+
+// Bradford cone response matrix (rows: rho, gamma, beta from X, Y, Z).
+inline constexpr double Bradford[3][3] = {
+    {0.8951, 0.2664, -0.1614},
+    {-0.7502, 1.7135, 0.0367},
+    {0.0389, -0.0685, 1.0296},
+};
+} // namespace WorkingColourSpace
+
+// Lab conversions for the processor path. Pixels are packed: rgbauf as four 32-bit floats (red, green,
+// blue, alpha), LabA16 as four unsigned 16-bit values (L, a, b, alpha) encoded as LabA16Encoding says
+// (PixelFormat.h). Both calls may run on any number of threads at once; they allocate nothing. in and out
+// must not overlap; neither needs any alignment.
+class ICCManager {
+public:
+    static ICCManager& GetInstance();
+
+    // Working RGB to LabA16. Lab values beyond what LabA16 stores (L above 100 or below 0, a or b outside
+    // -128 .. 127.996) are clamped to its range; alpha is clamped to 0..1, scaled by 65535, and 0.5 is
+    // added before truncation. A NaN component stores as 0.
+    void DoRGBAFToLABA16Transform(unsigned char* in, unsigned char* out, int count);
+    // LabA16 to working RGB, unbounded: colours outside sRGB come back with components below 0 or above 1.
+    // Alpha is the stored value divided by 65535.
+    void DoLABA16ToRGBAFTransform(unsigned char* in, unsigned char* out, int count);
+
+    ICCManager(const ICCManager&) = delete;
+    ICCManager& operator=(const ICCManager&) = delete;
+
+private:
+    ICCManager();
+    ~ICCManager() = default; // the instance lives until the process ends; rendering threads may outlast main
+
+    void* m_ToLab = nullptr; // lcms2 transforms, created once; null only when memory ran out
+    void* m_FromLab = nullptr;
+};
+
+} // namespace Raster

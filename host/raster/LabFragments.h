@@ -1,0 +1,15 @@
+#pragma once
+// Kernel text of the Lab conversions labaf_to_rgbauf and rgbauf_to_labaf, pasted in by the LabA16 traits.
+
+namespace Raster {
+
+// The text defining, for kernel language 1 (OpenCL C) or 0 (C++ for NVRTC, over CUDA's float4):
+//   float4 labaf_to_rgbauf(float4 lab)  L, a, b, alpha as stored / 65535  ->  working r, g, b, alpha
+//   float4 rgbauf_to_labaf(float4 rgb)  the reverse, every component clamped to 0..1 (NaN to 0)
+// in the colour spaces of ICCManager (ICCManager.h), whose processor conversions it matches to within one
+// stored step. Helper names start with rt_lab_. It needs nothing from other fragments and no headers, uses
+// no fused multiply-add, and also compiles as host C++ next to a struct float4 { float x, y, z, w; }.
+// Null for any other language; the text lives until the process ends.
+const char* GetLabConversionFragment(int language);
+
+} // namespace Raster
