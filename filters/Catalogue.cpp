@@ -1,5 +1,6 @@
 #include "filters/Catalogue.h"
 
+#include "filters/copy/RasterCopyCommand.h"
 #include "filters/tonal/DiffuseTool.h"
 #include "filters/tonal/NoiseTool.h"
 #include "filters/tonal/RasterAddNoiseCommand.h"
@@ -55,6 +56,7 @@ const std::vector<FilterInfo>& GetFilterCatalogue() {
         Describe<AddNoiseFilter>("NoiseTool", "RasterAddNoiseCommand"),
         Describe<DiffuseFilter>("DiffuseTool", "RasterDiffuseCommand"),
         Describe<UnsharpMaskFilter>("UnsharpMaskTool", "RasterUnsharpMaskCommand"),
+        Describe<CopyFilter>("", "RasterCopyCommand"),
     };
     return catalogue;
 }

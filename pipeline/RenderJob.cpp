@@ -1,0 +1,91 @@
+// Whole-image renders over the tile renderer, and the host's buffer form of a render.
+#include "pipeline/RenderJob.h"
+
+#include "host/document/TileRenderer.h"
+
+#include <atomic>
+
+namespace RasterTools {
+
+RenderJobResult RenderImage(const PipelineCommand& command, Kernel::Counted<Raster::DynamicBuffer> source,
+                            Kernel::Counted<Raster::DynamicBuffer> destination,
+                            Kernel::Counted<Raster::DynamicBuffer> mask, const RenderJobOptions& options) {
+    RenderJobResult result;
+    if (!source || !destination) {
+        result.error = "no image to render";
+        return result;
+    }
+    RenderTarget target;
+    target.source.pixels = source;
+    target.destination.pixels = destination;
+    target.mask.pixels = mask;
+    target.device = options.device;
+    target.channelMask = options.channelMask;
+    target.abort = options.abort;
+    if (options.device) {
+        // One mirror per image for all tiles: the source goes to the device once.
+        target.source.cache = Raster::HardwareCache::Create(source);
+        target.destination.cache =
+            source == destination ? target.source.cache : Raster::HardwareCache::Create(destination);
+        if (mask) target.mask.cache = Raster::HardwareCache::Create(mask);
+        if (options.waitForKernel) command.PrepareDevice(target);
+    }
+
+    std::atomic<long> deviceTiles{0}, processorTiles{0};
+    std::atomic<int> failure{-1};
+    TileRenderOptions tiles;
+    tiles.tileSize = options.tileSize;
+    tiles.threads = options.threads;
+    tiles.abort = options.abort;
+    tiles.progress = options.progress;
+    const bool rendered = RenderTiles(destination->GetBounds(), tiles, [&](const Kernel::RectT<int>& tile) {
+        RenderTarget own = target;
+        own.rect = tile;
+        const RenderPath path = command.Render(own);
+        switch (path) {
+        case RenderPath::Device:
+            ++deviceTiles;
+            return true;
+        case RenderPath::Processor:
+            ++processorTiles;
+            return true;
+        case RenderPath::Nothing:
+            return true;
+        case RenderPath::Aborted:
+        case RenderPath::Failed:
+            break;
+        }
+        failure = static_cast<int>(path);
+        return false;
+    });
+    result.deviceTiles = deviceTiles;
+    result.processorTiles = processorTiles;
+    if (target.destination.cache && !target.destination.cache->SyncHostCache(destination->GetBounds())) {
+        result.error = "the result could not be copied back from the device";
+        return result;
+    }
+    if (!rendered) {
+        result.error = failure == static_cast<int>(RenderPath::Failed)
+                           ? "the command cannot render these formats"
+                           : "the render was aborted";
+        return result;
+    }
+    result.complete = true;
+    return result;
+}
+
+void PipelineCommand::PrepareSpanPopulator(Kernel::Counted<Raster::DynamicBuffer> source, int,
+                                           Kernel::RectT<double>, Raster::AffineTransform::Params,
+                                           Kernel::RectT<int> rect,
+                                           Kernel::Counted<Raster::DynamicBuffer> destination,
+                                           bool* abort) const {
+    RenderTarget target;
+    target.source.pixels = std::move(source);
+    target.destination.pixels = std::move(destination);
+    target.rect = rect;
+    target.device = Raster::Hardware::GetDevice();
+    target.abort = abort;
+    Render(target);
+}
+
+} // namespace RasterTools
