@@ -32,5 +32,6 @@ public:
 
 int RunList(const std::vector<std::string>& args);
 int RunPlay(const std::vector<std::string>& args);
+int RunApply(const std::vector<std::string>& args);
 
 } // namespace App

@@ -13,6 +13,10 @@ constexpr std::string_view kUsage = R"(usage: rastertools [--settings FILE] COMM
 commands:
   list            every tool and command: class codes, tool identifiers, descriptions, parameters
   play SCRIPT     drive a tool as an editor would and print what the host sees
+  apply FILTER [--PARAM VALUE]... INPUT OUTPUT
+                  one filter on one image (apply copy [--format F] [--scale SX,SY] IN OUT), with
+                  --device auto|cpu|opencl|cuda, --tile N, --threads N, --mask GREY.png (white selects)
+                  and --channels (the channels written, e.g. rgb)
 
 options:
   --settings FILE the settings file (default: $RASTERTOOLS_SETTINGS, else
@@ -39,11 +43,12 @@ int Run(std::vector<std::string> args) {
     args.erase(args.begin());
     if (command == "list") return App::RunList(args);
     if (command == "play") return App::RunPlay(args);
+    if (command == "apply") return App::RunApply(args);
     if (command == "help") {
         std::cout << kUsage;
         return 0;
     }
-    throw App::UsageError("unknown command \"" + command + "\" (commands: list, play)");
+    throw App::UsageError("unknown command \"" + command + "\" (commands: list, play, apply)");
 }
 
 } // namespace

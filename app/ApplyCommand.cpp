@@ -1,0 +1,233 @@
+// rastertools apply FILTER [--PARAM VALUE]... INPUT OUTPUT: one filter on one image, through the pixel
+// pipeline on the chosen device or the processor.
+
+#include "app/Options.h"
+#include "filters/Catalogue.h"
+#include "host/document/TileRenderer.h"
+#include "host/io/ImageIO.h"
+#include "pipeline/Formats.h"
+#include "pipeline/RenderJob.h"
+
+#include <charconv>
+#include <cstring>
+#include <iostream>
+#include <optional>
+
+namespace App {
+
+namespace {
+
+struct ApplyOptions {
+    std::string filter;
+    std::vector<std::pair<std::string, std::string>> parameters; // --name value, in order
+    std::string device;                                          // --device, empty: the environment or auto
+    int tileSize = 256;
+    int threads = 0;
+    std::string mask;
+    std::string channels;
+    std::vector<std::string> files;
+};
+
+int ParseCount(const std::string& option, const std::string& text, int minimum) {
+    int value = 0;
+    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), value);
+    if (error != std::errc() || end != text.data() + text.size() || value < minimum)
+        throw UsageError(option + " needs a whole number of at least " + std::to_string(minimum) +
+                         ", not \"" + text + "\"");
+    return value;
+}
+
+ApplyOptions ParseArguments(const std::vector<std::string>& args) {
+    ApplyOptions options;
+    for (std::size_t i = 0; i < args.size(); ++i) {
+        const std::string& arg = args[i];
+        if (!arg.starts_with("--")) {
+            if (options.filter.empty())
+                options.filter = arg;
+            else
+                options.files.push_back(arg);
+            continue;
+        }
+        if (i + 1 >= args.size()) throw UsageError(arg + " needs a value");
+        const std::string& value = args[++i];
+        if (arg == "--device")
+            options.device = value;
+        else if (arg == "--tile")
+            options.tileSize = ParseCount(arg, value, 1);
+        else if (arg == "--threads")
+            options.threads = ParseCount(arg, value, 0);
+        else if (arg == "--mask")
+            options.mask = value;
+        else if (arg == "--channels")
+            options.channels = value;
+        else
+            options.parameters.emplace_back(arg.substr(2), value);
+    }
+    if (options.filter.empty())
+        throw UsageError("apply needs a filter name (for example: apply copy IN OUT)");
+    if (options.files.size() != 2)
+        throw UsageError("apply needs an input and an output file, after the filter name");
+    return options;
+}
+
+// A format parameter takes a format's name as well as its number.
+std::optional<RasterTools::ParameterValue> ParseValue(const RasterTools::ParameterSpec& spec,
+                                                      const std::string& text) {
+    if (spec.name == "format")
+        if (const auto format = Raster::ParsePixelFormat(text)) return static_cast<int>(*format);
+    if (spec.type == RasterTools::ParameterType::Point && text.find(',') == std::string::npos) {
+        // One number for both axes.
+        if (const auto one = RasterTools::ParseParameterValue(RasterTools::ParameterType::Double, text)) {
+            const double v = std::get<double>(*one);
+            return Kernel::PointT<double>{v, v};
+        }
+    }
+    return RasterTools::ParseParameterValue(spec.type, text);
+}
+
+std::string LayerFormatNames() {
+    std::string names;
+    for (const auto format : RasterTools::LayerFormats)
+        names += (names.empty() ? "" : ", ") + std::string(Raster::GetPixelFormatName(format));
+    return names;
+}
+
+// The selection: an 8-bit grey image whose intensity is the weight (white selects).
+Kernel::Counted<Raster::DynamicBuffer> ReadMask(const std::string& path, int width, int height) {
+    IO::ReadResult read = IO::ReadImage(path, Raster::PixelFormat::IA8);
+    if (!read) throw Error(read.error);
+    const auto& image = *read.image;
+    if (image.GetFormat() != Raster::PixelFormat::IA8)
+        throw Error(path + ": a mask must be an 8-bit grey image, not " +
+                    std::string(Raster::GetPixelFormatName(image.GetFormat())));
+    if (image.GetWidth() != width || image.GetHeight() != height)
+        throw Error(path + ": the mask is " + std::to_string(image.GetWidth()) + "x" +
+                    std::to_string(image.GetHeight()) + ", the output " + std::to_string(width) + "x" +
+                    std::to_string(height) + "; they must be the same size");
+    auto mask = Raster::DynamicBuffer::Create(width, height, Raster::PixelFormat::MaskA8);
+    if (!mask) throw Error(path + ": not enough memory for the mask");
+    for (int y = 0; y < height; ++y) {
+        const std::uint8_t* grey = image.Row<std::uint8_t>(y);
+        std::uint8_t* weights = mask->Row<std::uint8_t>(y);
+        for (int x = 0; x < width; ++x)
+            weights[x] = grey[2 * x];
+    }
+    return mask;
+}
+
+} // namespace
+
+int RunApply(const std::vector<std::string>& args) {
+    const ApplyOptions options = ParseArguments(args);
+    const RasterTools::FilterInfo* filter = RasterTools::FindFilter(options.filter);
+    if (!filter) throw UsageError("unknown filter \"" + options.filter + "\"");
+
+    std::vector<RasterTools::ParameterValue> values;
+    for (const auto& spec : filter->parameters)
+        values.push_back(spec.defaultValue);
+    for (const auto& [name, text] : options.parameters) {
+        std::size_t index = 0;
+        while (index < filter->parameters.size() && filter->parameters[index].name != name)
+            ++index;
+        if (index == filter->parameters.size()) {
+            std::string known;
+            for (const auto& spec : filter->parameters)
+                known += (known.empty() ? "--" : ", --") + std::string(spec.name);
+            throw UsageError(options.filter + " has no parameter --" + name + " (it takes " +
+                             (known.empty() ? std::string("none") : known) + ")");
+        }
+        const auto& spec = filter->parameters[index];
+        const auto value = ParseValue(spec, text);
+        if (!value)
+            throw UsageError("--" + name + ": \"" + text + "\" is not a " +
+                             std::string(RasterTools::ParameterTypeName(spec.type)) +
+                             (spec.name == "format" ? " or a format name (" + LayerFormatNames() + ")" : ""));
+        if (spec.type == RasterTools::ParameterType::Point) {
+            const auto point = std::get<Kernel::PointT<double>>(*value);
+            if (point.x < spec.minimum || point.x > spec.maximum || point.y < spec.minimum ||
+                point.y > spec.maximum)
+                throw UsageError("--" + name + " must lie within " +
+                                 RasterTools::FormatParameterValue(spec.minimum) + " .. " +
+                                 RasterTools::FormatParameterValue(spec.maximum) + " on both axes");
+        } else if (spec.type != RasterTools::ParameterType::Bool) {
+            const double number = spec.type == RasterTools::ParameterType::Int ? double(std::get<int>(*value))
+                                                                               : std::get<double>(*value);
+            if (number < spec.minimum || number > spec.maximum)
+                throw UsageError("--" + name + " must lie within " +
+                                 RasterTools::FormatParameterValue(spec.minimum) + " .. " +
+                                 RasterTools::FormatParameterValue(spec.maximum));
+        }
+        values[index] = *value;
+    }
+
+    const auto command = filter->makeCommand(false, values);
+    const auto* pipeline = dynamic_cast<const RasterTools::PipelineCommand*>(command.Get());
+    if (!pipeline) throw Error(options.filter + " cannot be applied from the command line yet");
+
+    const std::string& input = options.files[0];
+    const std::string& output = options.files[1];
+    const auto outputType = IO::GetFileTypeForExtension(output);
+    if (!outputType) throw UsageError(output + ": unknown file type (use .png, .jpg, .jpeg, .tif or .tiff)");
+
+    IO::ReadResult read = IO::ReadImage(input);
+    if (!read) throw Error(read.error);
+    const auto source = read.image;
+    const auto shape = pipeline->GetOutputShape(source->GetWidth(), source->GetHeight(), source->GetFormat());
+    if (!IO::CanWrite(*outputType, shape.format))
+        throw Error(
+            output + ": " + std::string(IO::GetFileTypeName(*outputType)) + " cannot hold " +
+            std::string(Raster::GetPixelFormatName(shape.format)) + " pixels (choose another --format or " +
+            std::string(Raster::GetPixelFormatName(IO::GetWritableFormat(*outputType, shape.format))) + ")");
+
+    int channelMask = -1;
+    if (!options.channels.empty()) {
+        const auto mask = RasterTools::ParseChannelMask(shape.format, options.channels);
+        if (!mask)
+            throw UsageError("--channels " + options.channels + ": not a channel mask of " +
+                             std::string(Raster::GetPixelFormatName(shape.format)) +
+                             " (a number, or channels named " +
+                             RasterTools::DescribeChannelNames(shape.format) + ")");
+        channelMask = *mask;
+    }
+
+    // Channels the write mask keeps come from the input where the output has its size and format.
+    Kernel::Counted<Raster::DynamicBuffer> destination;
+    if (shape.width == source->GetWidth() && shape.height == source->GetHeight() &&
+        shape.format == source->GetFormat() && channelMask >= 0) {
+        destination = Raster::DynamicBuffer::Create(shape.width, shape.height, shape.format);
+        if (destination)
+            for (int y = 0; y < shape.height; ++y)
+                std::memcpy(destination->RowBytes(y), source->RowBytes(y), source->GetRowBytes());
+    } else {
+        destination = Raster::DynamicBuffer::Create(shape.width, shape.height, shape.format);
+    }
+    if (!destination)
+        throw Error(output + ": a " + std::to_string(shape.width) + "x" + std::to_string(shape.height) + " " +
+                    std::string(Raster::GetPixelFormatName(shape.format)) + " image is too large");
+
+    Kernel::Counted<Raster::DynamicBuffer> mask;
+    if (!options.mask.empty()) mask = ReadMask(options.mask, shape.width, shape.height);
+
+    const RenderDevice device = FindRenderDevice(ResolveDeviceSelector(options.device));
+    if (!device.IsValid()) throw UsageError(device.error);
+
+    RasterTools::RenderJobOptions job;
+    job.tileSize = options.tileSize;
+    job.threads = options.threads;
+    job.device = device.device;
+    job.channelMask = channelMask;
+    const auto result = RasterTools::RenderImage(*pipeline, source, destination, mask, job);
+    if (!result.complete) throw Error(options.filter + ": " + result.error);
+
+    const IO::WriteResult written = IO::WriteImage(output, *destination);
+    if (!written) throw Error(written.error);
+
+    std::cout << options.filter << ": " << source->GetWidth() << "x" << source->GetHeight() << " "
+              << Raster::GetPixelFormatName(source->GetFormat()) << " -> " << shape.width << "x"
+              << shape.height << " " << Raster::GetPixelFormatName(shape.format) << "; " << result.deviceTiles
+              << " tiles on " << (device.device ? device.device->GetIdentifier() : std::string("the device"))
+              << ", " << result.processorTiles << " on the processor\n";
+    return 0;
+}
+
+} // namespace App
