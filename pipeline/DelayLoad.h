@@ -11,7 +11,8 @@ inline constexpr std::string_view BlockingWriteDelayLoadText =
     "Bitmap<> is performing a blocking, non-abortable delay-load in response to a non-pipeline PixelAccessor "
     "session - you should try to avoid this.";
 inline constexpr std::string_view BlockingReadDelayLoadText =
-    "Bitmap<> is performing a blocking, abortable delay-load in response to a non-pipeline ConstPixelAccessor "
+    "Bitmap<> is performing a blocking, abortable delay-load in response to a non-pipeline "
+    "ConstPixelAccessor "
     "session - you should try to avoid this.";
 
 } // namespace RasterTools
