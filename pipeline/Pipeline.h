@@ -3,6 +3,7 @@
 // processor, with the same stage parameters feeding both.
 
 #include "host/kernel/Abort.h"
+#include "host/raster/AffineTransform.h"
 #include "host/raster/Bitmap.h"
 #include "host/raster/HardwareCache.h"
 #include "host/raster/PipelineKernel.h"
@@ -82,6 +83,10 @@ struct RenderTarget {
     PipelineImage destination;
     PipelineImage mask;      // for a mask stage that reads an image
     Kernel::RectT<int> rect; // in destination pixels; clipped to the destination
+    // The raster's bounds in document units and the transform from source pixels to the view (identity:
+    // the layer at its own resolution). Filters whose pixels depend on position or view scale read them.
+    Kernel::RectT<double> bounds;
+    Raster::AffineTransform::Params transform;
     // Tried first when set; null renders on the processor.
     Kernel::Counted<Raster::HardwareDevice> device;
     int channelMask = -1;        // negative: every channel (see Raster::WriteChannels)

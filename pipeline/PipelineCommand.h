@@ -2,7 +2,9 @@
 // The rendering face of a command that renders through the pixel pipeline. Commands derive from it beside
 // their host command base; front ends and the conformance tests reach it with dynamic_cast.
 
+#include "host/document/RasterInterface.h"
 #include "host/raster/AffineTransform.h"
+#include "host/renderer/SpanPopulator.h"
 #include "pipeline/Pipeline.h"
 
 namespace RasterTools {
@@ -15,7 +17,7 @@ struct OutputShape {
     friend bool operator==(const OutputShape&, const OutputShape&) = default;
 };
 
-class PipelineCommand {
+class PipelineCommand : public Renderer::SpanPopulatorBitmapFillMutationHost {
 public:
     virtual ~PipelineCommand() = default;
 
@@ -29,18 +31,26 @@ public:
     // Blocks until the kernel for target has compiled; true when the device can take it.
     virtual bool PrepareDevice(const RenderTarget& target) const = 0;
 
-    // The host's buffer form: renders rect of destination from source, on the device that
-    // Raster::Hardware::GetDevice() picks (RASTERTOOLS_DEVICE) or else on the processor. bounds and transform
-    // are the raster's bounds and view transform, which a copy does not need.
+    // The host's two forms: render rect of the destination from the source, on the device that
+    // Raster::Hardware::GetDevice() picks (RASTERTOOLS_DEVICE) or else on the processor.
+    void PrepareSpanPopulator(const Renderer::SpanPopulatorBitmapFillMutationTarget* target,
+                              Kernel::RectT<int> rect, Kernel::Counted<Raster::DynamicBuffer> buffer,
+                              Raster::AffineTransform::Params transform, bool, bool* abort,
+                              int) const override;
     void PrepareSpanPopulator(Kernel::Counted<Raster::DynamicBuffer> source, int,
                               Kernel::RectT<double> bounds, Raster::AffineTransform::Params transform,
                               Kernel::RectT<int> rect, Kernel::Counted<Raster::DynamicBuffer> destination,
-                              bool* abort) const;
+                              bool* abort) const override;
 
 protected:
     PipelineCommand() = default;
     PipelineCommand(const PipelineCommand&) = default;
     PipelineCommand& operator=(const PipelineCommand&) = default;
+
+    // DoEffect's body for pipeline commands: renders the raster's effect area (see GetEffectArea) in place on
+    // the processor, in tiles, with the raster's abort flag and progress; returns the area, or the empty
+    // rectangle when nothing was changed.
+    Kernel::RectT<int> RenderDirectly(const MutableRasterInterface& raster) const;
 };
 
 } // namespace RasterTools

@@ -7,6 +7,12 @@
 
 namespace RasterTools {
 
+namespace {
+Kernel::RectT<double> BoundsOf(const Raster::DynamicBuffer& image) {
+    return {0.0, 0.0, double(image.GetWidth()), double(image.GetHeight())};
+}
+} // namespace
+
 RenderJobResult RenderImage(const PipelineCommand& command, Kernel::Counted<Raster::DynamicBuffer> source,
                             Kernel::Counted<Raster::DynamicBuffer> destination,
                             Kernel::Counted<Raster::DynamicBuffer> mask, const RenderJobOptions& options) {
@@ -22,6 +28,8 @@ RenderJobResult RenderImage(const PipelineCommand& command, Kernel::Counted<Rast
     target.device = options.device;
     target.channelMask = options.channelMask;
     target.abort = options.abort;
+    target.bounds = options.bounds.IsEmpty() ? BoundsOf(*source) : options.bounds;
+    target.transform = options.transform;
     if (options.device) {
         // One mirror per image for all tiles: the source goes to the device once.
         target.source.cache = Raster::HardwareCache::Create(source);
@@ -38,7 +46,9 @@ RenderJobResult RenderImage(const PipelineCommand& command, Kernel::Counted<Rast
     tiles.threads = options.threads;
     tiles.abort = options.abort;
     tiles.progress = options.progress;
-    const bool rendered = RenderTiles(destination->GetBounds(), tiles, [&](const Kernel::RectT<int>& tile) {
+    const Kernel::RectT<int> area =
+        options.area.IsEmpty() ? destination->GetBounds() : options.area.Intersect(destination->GetBounds());
+    const bool rendered = RenderTiles(area, tiles, [&](const Kernel::RectT<int>& tile) {
         RenderTarget own = target;
         own.rect = tile;
         const RenderPath path = command.Render(own);
@@ -74,18 +84,47 @@ RenderJobResult RenderImage(const PipelineCommand& command, Kernel::Counted<Rast
     return result;
 }
 
-void PipelineCommand::PrepareSpanPopulator(Kernel::Counted<Raster::DynamicBuffer> source, int,
-                                           Kernel::RectT<double>, Raster::AffineTransform::Params,
+void PipelineCommand::PrepareSpanPopulator(const Renderer::SpanPopulatorBitmapFillMutationTarget* target,
                                            Kernel::RectT<int> rect,
+                                           Kernel::Counted<Raster::DynamicBuffer> buffer,
+                                           Raster::AffineTransform::Params transform, bool, bool* abort,
+                                           int) const {
+    if (!target) return;
+    PrepareSpanPopulator(target->GetSource(), 0, target->GetBounds(), transform, rect, std::move(buffer),
+                         abort);
+}
+
+void PipelineCommand::PrepareSpanPopulator(Kernel::Counted<Raster::DynamicBuffer> source, int,
+                                           Kernel::RectT<double> bounds,
+                                           Raster::AffineTransform::Params transform, Kernel::RectT<int> rect,
                                            Kernel::Counted<Raster::DynamicBuffer> destination,
                                            bool* abort) const {
+    if (!source) return;
     RenderTarget target;
+    target.bounds = bounds.IsEmpty() ? BoundsOf(*source) : bounds;
+    target.transform = transform;
     target.source.pixels = std::move(source);
     target.destination.pixels = std::move(destination);
     target.rect = rect;
     target.device = Raster::Hardware::GetDevice();
     target.abort = abort;
     Render(target);
+}
+
+Kernel::RectT<int> PipelineCommand::RenderDirectly(const MutableRasterInterface& raster) const {
+    const Kernel::Counted<Raster::DynamicBuffer> pixels = raster.GetPixels();
+    if (!pixels) return {};
+    const Kernel::RectT<int> area = GetEffectArea(raster).Intersect(pixels->GetBounds());
+    if (area.IsEmpty()) return {};
+    // Stages may read around the pixel they write, so they read an untouched copy.
+    const Kernel::Counted<Raster::DynamicBuffer> source = pixels->Clone();
+    if (!source) return {};
+    RenderJobOptions options;
+    options.area = area;
+    options.abort = raster.GetAbort();
+    options.progress = [&raster](double fraction) { raster.Progress(fraction); };
+    const RenderJobResult result = RenderImage(*this, source, pixels, nullptr, options);
+    return result.complete ? area : Kernel::RectT<int>{};
 }
 
 } // namespace RasterTools

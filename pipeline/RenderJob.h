@@ -16,6 +16,11 @@ struct RenderJobOptions {
     // Compile the kernel before the first tile, so that no tile falls back while it compiles.
     bool waitForKernel = true;
     int channelMask = -1;
+    // The part of the destination to render; empty renders all of it.
+    Kernel::RectT<int> area;
+    // Handed to the command's stages (see RenderTarget); empty bounds stand for the source's own.
+    Kernel::RectT<double> bounds;
+    Raster::AffineTransform::Params transform;
     const bool* abort = nullptr;
     std::function<void(double fraction)> progress;
 };

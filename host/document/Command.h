@@ -16,6 +16,7 @@
 #include <vector>
 
 class Node;
+class MutableRasterInterface;
 
 // Anything the history can hold.
 class Command : public virtual Kernel::Countable {
@@ -80,6 +81,11 @@ public:
     virtual bool PrefersToProtectAlpha() const { return true; }
     virtual bool CanAffectAlpha() const { return true; }
     virtual bool CanRequireInflation() const { return true; }
+    // Changes the raster's pixels directly, on the processor, and returns the rectangle it changed. The
+    // host's default changes nothing.
+    virtual Kernel::RectT<int> DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const {
+        return (void)raster, Kernel::RectT<int>{};
+    }
 
 private:
     static const Kernel::ClassProperties ms_ClassProperties;

@@ -1,5 +1,7 @@
 #include "host/raster/DynamicBuffer.h"
 
+#include <cstring>
+
 #include <algorithm>
 #include <cstdlib>
 #include <limits>
@@ -48,6 +50,12 @@ Kernel::Counted<DynamicBuffer> DynamicBuffer::Create(int width, int height, Pixe
         return nullptr;
     }
     return Kernel::Counted<DynamicBuffer>(buffer);
+}
+
+Kernel::Counted<DynamicBuffer> DynamicBuffer::Clone() const {
+    Kernel::Counted<DynamicBuffer> copy = Create(GetWidth(), GetHeight(), GetFormat());
+    if (copy) std::memcpy(copy->m_Data, m_Data, GetStorageBytes());
+    return copy;
 }
 
 DynamicBuffer::DynamicBuffer(int width, int height, PixelFormat format, Storage storage) noexcept

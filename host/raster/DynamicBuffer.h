@@ -51,6 +51,8 @@ public:
     // Null when a side is below 1 or above MaxSide, when the storage would exceed MaxStorageBytes, when the
     // format is not a valid PixelFormat, or when memory cannot be had.
     static Kernel::Counted<DynamicBuffer> Create(int width, int height, PixelFormat format);
+    // A new buffer with the same size, format and pixels; null when memory cannot be had.
+    Kernel::Counted<DynamicBuffer> Clone() const;
 
     // Storage in bytes that Create would allocate for this size, or 0 when Create refuses the size. Takes
     // 64-bit sides so that readers can check a file's claimed size before narrowing it.
