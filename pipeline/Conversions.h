@@ -5,6 +5,7 @@
 #include "host/raster/ICCManager.h"
 #include "host/raster/Stages.h"
 #include "pipeline/ConvertBodies.h"
+#include "pipeline/PlanarConversions.h"
 
 namespace RasterTools {
 
@@ -158,6 +159,10 @@ requires(Source != Dest) struct Raster::PixelConversion<Source, Dest> {
     static constexpr bool IsIdentity = false;
     static StoredPixel<Dest> Convert(StoredPixel<Source> p) noexcept {
         return RasterTools::FromWorking<Dest>(RasterTools::ToWorking<Source>(p));
+    }
+    static void ConvertSpan(const StoredPixel<Source>* in, StoredPixel<Dest>* out,
+                            int n) noexcept requires RasterTools::PlanarConvert::HasPlanarPair<Source, Dest> {
+        RasterTools::PlanarConvert::ConvertSpan<Source, Dest>(in, out, n);
     }
 };
 

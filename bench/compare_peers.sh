@@ -1,0 +1,127 @@
+#!/usr/bin/env bash
+# Side-by-side speed against peer tools (ImageMagick, libvips, GEGL) on one deterministic 4096 × 4096 RGBA8
+# image. Every tool runs each operation in the same run with 1 and 2 threads; its own load-and-save time
+# (the same image through unchanged) is subtracted, so the table compares the operations alone.
+#
+#   bench/compare_peers.sh [OPERATION...]      (default: every operation below)
+#
+# RASTERTOOLS (default build/release/app/rastertools), RUNS (best of, default 3) and WORK (scratch folder)
+# may be set. Later filters add a line to OPERATIONS and a case to each tool's function.
+set -euo pipefail
+
+root=$(cd "$(dirname "$0")/.." && pwd)
+rastertools=${RASTERTOOLS:-$root/build/release/app/rastertools}
+runs=${RUNS:-3}
+work=${WORK:-${TMPDIR:-/tmp}/rastertools-peers}
+size=4096
+OPERATIONS=(noise-gaussian noise-uniform)
+[ $# -gt 0 ] && OPERATIONS=("$@")
+
+# ---- Peers from Debian
+packages=(imagemagick libvips-tools gegl bc)
+missing=()
+for p in "${packages[@]}"; do
+  dpkg-query -W -f='${Status}' "$p" 2>/dev/null | grep -q 'ok installed' || missing+=("$p")
+done
+if [ ${#missing[@]} -gt 0 ]; then
+  echo "compare_peers: installing ${missing[*]}" >&2
+  SUDO=""
+  [ "$(id -u)" -ne 0 ] && SUDO="sudo"
+  export DEBIAN_FRONTEND=noninteractive
+  $SUDO apt-get update -qq
+  $SUDO apt-get install -y -qq --no-install-recommends "${missing[@]}" >/dev/null
+fi
+[ -x "$rastertools" ] || { echo "compare_peers: build first: $rastertools is missing" >&2; exit 1; }
+
+# ---- The test image: seeded plasma with alpha, uncompressed, so that decoding costs little.
+mkdir -p "$work"
+input=$work/input.tif
+if [ ! -s "$input" ]; then
+  /usr/bin/convert -seed 7 -size ${size}x${size} plasma:fractal -alpha set -channel A -fx '0.5+0.5*sin(i/97)' \
+    +channel -depth 8 -compress none "$input"
+fi
+
+# ---- One command per tool and operation; "copy" is the tool's load-and-save baseline. Prints nothing when
+# the tool lacks the operation. $1 operation, $2 output, $3 threads.
+rastertools_command() {
+  local common="--threads $3 --device cpu --quiet"
+  case $1 in
+  copy) echo "$rastertools apply copy $common $input $2" ;;
+  noise-gaussian) echo "$rastertools apply addnoise --intensity 0.3 --gaussian true $common $input $2" ;;
+  noise-uniform) echo "$rastertools apply addnoise --intensity 0.3 --gaussian false $common $input $2" ;;
+  esac
+}
+imagemagick_command() {
+  local common="-limit thread $3"
+  case $1 in
+  copy) echo "/usr/bin/convert $common $input -compress none $2" ;;
+  noise-gaussian) echo "/usr/bin/convert $common $input -attenuate 1 +noise Gaussian -compress none $2" ;;
+  noise-uniform) echo "/usr/bin/convert $common $input -attenuate 1 +noise Uniform -compress none $2" ;;
+  esac
+}
+vips_command() {
+  local env="env VIPS_CONCURRENCY=$3"
+  case $1 in
+  copy) echo "$env vips copy $input $2" ;;
+  # No single noise operation: a gaussian image added to the input and cast back to 8 bits, in one pipeline.
+  noise-gaussian) echo "$env sh -c 'vips gaussnoise $work/noise.v $size $size --sigma 25 && vips add $input $work/noise.v $work/sum.v && vips cast $work/sum.v $2 uchar'" ;;
+  esac
+}
+gegl_command() {
+  local env="env GEGL_THREADS=$3"
+  case $1 in
+  copy) echo "$env gegl -i $input -o $2" ;;
+  noise-gaussian) echo "$env gegl -i $input -o $2 -- gegl:noise-rgb gaussian=true" ;;
+  noise-uniform) echo "$env gegl -i $input -o $2 -- gegl:noise-rgb gaussian=false" ;;
+  esac
+}
+tools=(rastertools imagemagick vips gegl)
+
+# Best wall time of $runs runs, in seconds; empty when the command fails.
+best_time() {
+  local best="" start end t
+  for _ in $(seq "$runs"); do
+    start=$(date +%s.%N)
+    if ! eval "$1" >/dev/null 2>&1; then echo ""; return; fi
+    end=$(date +%s.%N)
+    t=$(echo "$end - $start" | bc -l)
+    if [ -z "$best" ] || [ "$(echo "$t < $best" | bc -l)" = 1 ]; then best=$t; fi
+  done
+  echo "$best"
+}
+
+megapixels=$(echo "$size * $size / 1000000" | bc -l)
+printf '%-16s %-12s %7s %12s %10s\n' operation tool threads "Mpix/s" "ours/best"
+for threads in 1 2; do
+  declare -A baseline=()
+  for tool in "${tools[@]}"; do
+    baseline[$tool]=$(best_time "$("${tool}_command" copy "$work/out-$tool.tif" "$threads")")
+  done
+  for op in "${OPERATIONS[@]}"; do
+    declare -A rate=()
+    for tool in "${tools[@]}"; do
+      command=$("${tool}_command" "$op" "$work/out-$tool.tif" "$threads")
+      [ -n "$command" ] && [ -n "${baseline[$tool]}" ] || continue
+      t=$(best_time "$command")
+      [ -n "$t" ] || { echo "compare_peers: $tool failed on $op" >&2; continue; }
+      # At least a millisecond of work, so that a result within the baseline's noise stays finite.
+      net=$(echo "t = $t - ${baseline[$tool]}; if (t < 0.001) t = 0.001; t" | bc -l)
+      rate[$tool]=$(echo "$megapixels / $net" | bc -l)
+    done
+    fastest_peer=0
+    for tool in "${tools[@]}"; do
+      [ "$tool" = rastertools ] || [ -z "${rate[$tool]:-}" ] && continue
+      [ "$(echo "${rate[$tool]} > $fastest_peer" | bc -l)" = 1 ] && fastest_peer=${rate[$tool]}
+    done
+    for tool in "${tools[@]}"; do
+      [ -n "${rate[$tool]:-}" ] || continue
+      ratio="-"
+      if [ "$tool" = rastertools ] && [ "$(echo "$fastest_peer > 0" | bc -l)" = 1 ]; then
+        ratio=$(printf '%.2fx' "$(echo "${rate[$tool]} / $fastest_peer" | bc -l)")
+      fi
+      printf '%-16s %-12s %7s %12.1f %10s\n' "$op" "$tool" "$threads" "${rate[$tool]}" "$ratio"
+    done
+    unset rate
+  done
+  unset baseline
+done

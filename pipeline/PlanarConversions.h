@@ -1,0 +1,176 @@
+#pragma once
+// Span conversions through planes of working floats: the arithmetic of the Convert bodies, one channel
+// plane at a time so that the compiler runs it across lanes of pixels. Results equal the per-pixel bodies
+// bit for bit (the conformance tests compare both with the device).
+
+#include "host/raster/Bitmap.h"
+#include "host/raster/KernelMath.h"
+#include "host/raster/PixelTraits.h"
+
+namespace RasterTools::PlanarConvert {
+
+using namespace Raster::KernelMath;
+using Raster::PixelFormat;
+using Raster::SpanLength;
+
+// Red, green, blue and alpha planes of up to one span.
+struct WorkingPlanes {
+    alignas(64) float r[SpanLength];
+    alignas(64) float g[SpanLength];
+    alignas(64) float b[SpanLength];
+    alignas(64) float a[SpanLength];
+};
+
+// The scalar steps of the bodies, written without branches so that they run across lanes; each equals the
+// kernel helpers it stands for on every input, NaN and infinities included.
+
+// clamp(v, 0, 1): NaN goes to 0, as rt_fmax(NaN, 0) does.
+inline float Clamp01(float v) noexcept {
+    const float low = v > 0.0f ? v : 0.0f;
+    return low < 1.0f ? low : 1.0f;
+}
+// rt_sat(rt_round(v)) for a maximum of 255 or 65535: clamping first gives the same value, since rounding is
+// monotonic and the bounds are whole; inside the bounds the fraction is exact and halves go up.
+inline int RoundSaturated(float v, float maximum) noexcept {
+    const float low = v > 0.0f ? v : 0.0f;
+    const float c = low < maximum ? low : maximum;
+    const int truncated = static_cast<int>(c);
+    return truncated + static_cast<int>(c - static_cast<float>(truncated) >= 0.5f);
+}
+inline uchar ToByte(float v) noexcept { // convert_uchar(round(clamp(v, 0, 1) * 255))
+    return static_cast<uchar>(RoundSaturated(Clamp01(v) * 255.0f, 255.0f));
+}
+// rt_fmin for operands that are never NaN (stored inks, clamped colour).
+inline float Min(float a, float b) noexcept {
+    return a < b ? a : b;
+}
+inline float Luminance(float r, float g, float b) noexcept {
+    return r * 0.299f + g * 0.587f + b * 0.114f;
+}
+
+// Formats without a planar form (LabA16, which goes through the colour manager) leave this undefined.
+template <PixelFormat F>
+struct Planar;
+
+// Four components of Component, stored as value × Maximum.
+template <class Pixel, class Component, int Maximum>
+struct PlanarRGBA {
+    static constexpr float Max = float(Maximum);
+    static void ToWorking(const Pixel* in, WorkingPlanes& w, int n) noexcept {
+#pragma omp simd
+        for (int i = 0; i < n; ++i) {
+            w.r[i] = in[i].x / Max;
+            w.g[i] = in[i].y / Max;
+            w.b[i] = in[i].z / Max;
+            w.a[i] = in[i].w / Max;
+        }
+    }
+    static void FromWorking(const WorkingPlanes& w, Pixel* out, int n) noexcept {
+#pragma omp simd
+        for (int i = 0; i < n; ++i)
+            out[i] = {Component(RoundSaturated(Clamp01(w.r[i]) * Max, Max)),
+                      Component(RoundSaturated(Clamp01(w.g[i]) * Max, Max)),
+                      Component(RoundSaturated(Clamp01(w.b[i]) * Max, Max)),
+                      Component(RoundSaturated(Clamp01(w.a[i]) * Max, Max))};
+    }
+};
+
+// Intensity and alpha. Intensity is written from the unclamped colour (the bodies drop saturate's result);
+// alpha is scaled and rounded on its own.
+template <class Pixel, class Component, int Maximum>
+struct PlanarIA {
+    static constexpr float Max = float(Maximum);
+    static void ToWorking(const Pixel* in, WorkingPlanes& w, int n) noexcept {
+#pragma omp simd
+        for (int i = 0; i < n; ++i) {
+            const float intensity = in[i].x / Max;
+            w.r[i] = w.g[i] = w.b[i] = intensity;
+            w.a[i] = in[i].y / Max;
+        }
+    }
+    static void FromWorking(const WorkingPlanes& w, Pixel* out, int n) noexcept {
+#pragma omp simd
+        for (int i = 0; i < n; ++i)
+            out[i] = {Component(RoundSaturated(Max * Luminance(w.r[i], w.g[i], w.b[i]), Max)),
+                      Component(RoundSaturated(w.a[i] * Max, Max))};
+    }
+};
+
+template <>
+struct Planar<PixelFormat::RGBA8> : PlanarRGBA<uchar4, uchar, 255> {};
+template <>
+struct Planar<PixelFormat::RGBA16> : PlanarRGBA<ushort4, ushort, 65535> {};
+template <>
+struct Planar<PixelFormat::IA8> : PlanarIA<uchar2, uchar, 255> {};
+template <>
+struct Planar<PixelFormat::IA16> : PlanarIA<ushort2, ushort, 65535> {};
+
+template <>
+struct Planar<PixelFormat::RGBAUF> {
+    static void ToWorking(const float4* in, WorkingPlanes& w, int n) noexcept {
+#pragma omp simd
+        for (int i = 0; i < n; ++i) {
+            w.r[i] = in[i].x;
+            w.g[i] = in[i].y;
+            w.b[i] = in[i].z;
+            w.a[i] = in[i].w;
+        }
+    }
+    static void FromWorking(const WorkingPlanes& w, float4* out, int n) noexcept {
+#pragma omp simd
+        for (int i = 0; i < n; ++i)
+            out[i] = make_float4(w.r[i], w.g[i], w.b[i], w.a[i]);
+    }
+};
+
+template <>
+struct Planar<PixelFormat::CMYKA8> {
+    static void ToWorking(const cmyka8* in, WorkingPlanes& w, int n) noexcept {
+#pragma omp simd
+        for (int i = 0; i < n; ++i) {
+            const float c = in[i].cmyk[0] * 0.003921569f;
+            const float m = in[i].cmyk[1] * 0.003921569f;
+            const float y = in[i].cmyk[2] * 0.003921569f;
+            const float k = in[i].cmyk[3] * 0.003921569f;
+            w.r[i] = 1.0f - Min(1.0f, c * (1.0f - k) + k);
+            w.g[i] = 1.0f - Min(1.0f, m * (1.0f - k) + k);
+            w.b[i] = 1.0f - Min(1.0f, y * (1.0f - k) + k);
+            w.a[i] = in[i].a / 255.0f;
+        }
+    }
+    // Pure black (k = 1) divides by 1 and then selects zero inks, instead of branching.
+    static void FromWorking(const WorkingPlanes& w, cmyka8* out, int n) noexcept {
+#pragma omp simd
+        for (int i = 0; i < n; ++i) {
+            const float r = Clamp01(w.r[i]), g = Clamp01(w.g[i]), b = Clamp01(w.b[i]);
+            const float k = Min(1.0f - r, Min(1.0f - g, 1.0f - b));
+            const bool inked = k < 1.0f;
+            const float divisor = inked ? 1.0f - k : 1.0f;
+            const float cInk = (1.0f - r - k) / divisor;
+            const float mInk = (1.0f - g - k) / divisor;
+            const float yInk = (1.0f - b - k) / divisor;
+            const float c = inked ? cInk : 0.0f;
+            const float m = inked ? mInk : 0.0f;
+            const float y = inked ? yInk : 0.0f;
+            out[i] = rt_make_cmyka8(ToByte(c), ToByte(m), ToByte(y), ToByte(k), ToByte(w.a[i]));
+        }
+    }
+};
+
+template <PixelFormat Source, PixelFormat Dest>
+inline constexpr bool HasPlanarPair = requires {
+    Planar<Source>::ToWorking;
+    Planar<Dest>::FromWorking;
+};
+
+// n (at most one span) pixels from Source to Dest through the working planes.
+template <PixelFormat Source, PixelFormat Dest>
+requires HasPlanarPair<Source, Dest>
+inline void ConvertSpan(const Raster::StoredPixel<Source>* in, Raster::StoredPixel<Dest>* out,
+                        int n) noexcept {
+    WorkingPlanes planes;
+    Planar<Source>::ToWorking(in, planes, n);
+    Planar<Dest>::FromWorking(planes, out, n);
+}
+
+} // namespace RasterTools::PlanarConvert
