@@ -1,14 +1,15 @@
 // rastertools apply FILTER [--PARAM VALUE]... INPUT OUTPUT: one filter on one image, through the pixel
 // pipeline on the chosen device or the processor.
 
+#include "app/FilterArguments.h"
 #include "app/Options.h"
+#include "app/Progress.h"
 #include "filters/Catalogue.h"
 #include "host/document/TileRenderer.h"
 #include "host/io/ImageIO.h"
 #include "pipeline/Formats.h"
 #include "pipeline/RenderJob.h"
 
-#include <charconv>
 #include <cstring>
 #include <iostream>
 #include <optional>
@@ -27,15 +28,6 @@ struct ApplyOptions {
     std::string channels;
     std::vector<std::string> files;
 };
-
-int ParseCount(const std::string& option, const std::string& text, int minimum) {
-    int value = 0;
-    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), value);
-    if (error != std::errc() || end != text.data() + text.size() || value < minimum)
-        throw UsageError(option + " needs a whole number of at least " + std::to_string(minimum) +
-                         ", not \"" + text + "\"");
-    return value;
-}
 
 ApplyOptions ParseArguments(const std::vector<std::string>& args) {
     ApplyOptions options;
@@ -70,28 +62,6 @@ ApplyOptions ParseArguments(const std::vector<std::string>& args) {
     return options;
 }
 
-// A format parameter takes a format's name as well as its number.
-std::optional<RasterTools::ParameterValue> ParseValue(const RasterTools::ParameterSpec& spec,
-                                                      const std::string& text) {
-    if (spec.name == "format")
-        if (const auto format = Raster::ParsePixelFormat(text)) return static_cast<int>(*format);
-    if (spec.type == RasterTools::ParameterType::Point && text.find(',') == std::string::npos) {
-        // One number for both axes.
-        if (const auto one = RasterTools::ParseParameterValue(RasterTools::ParameterType::Double, text)) {
-            const double v = std::get<double>(*one);
-            return Kernel::PointT<double>{v, v};
-        }
-    }
-    return RasterTools::ParseParameterValue(spec.type, text);
-}
-
-std::string LayerFormatNames() {
-    std::string names;
-    for (const auto format : RasterTools::LayerFormats)
-        names += (names.empty() ? "" : ", ") + std::string(Raster::GetPixelFormatName(format));
-    return names;
-}
-
 // The selection: an 8-bit grey image whose intensity is the weight (white selects).
 Kernel::Counted<Raster::DynamicBuffer> ReadMask(const std::string& path, int width, int height) {
     IO::ReadResult read = IO::ReadImage(path, Raster::PixelFormat::IA8);
@@ -119,46 +89,9 @@ Kernel::Counted<Raster::DynamicBuffer> ReadMask(const std::string& path, int wid
 
 int RunApply(const std::vector<std::string>& args) {
     const ApplyOptions options = ParseArguments(args);
-    const RasterTools::FilterInfo* filter = RasterTools::FindFilter(options.filter);
-    if (!filter) throw UsageError("unknown filter \"" + options.filter + "\"");
-
-    std::vector<RasterTools::ParameterValue> values;
-    for (const auto& spec : filter->parameters)
-        values.push_back(spec.defaultValue);
-    for (const auto& [name, text] : options.parameters) {
-        std::size_t index = 0;
-        while (index < filter->parameters.size() && filter->parameters[index].name != name)
-            ++index;
-        if (index == filter->parameters.size()) {
-            std::string known;
-            for (const auto& spec : filter->parameters)
-                known += (known.empty() ? "--" : ", --") + std::string(spec.name);
-            throw UsageError(options.filter + " has no parameter --" + name + " (it takes " +
-                             (known.empty() ? std::string("none") : known) + ")");
-        }
-        const auto& spec = filter->parameters[index];
-        const auto value = ParseValue(spec, text);
-        if (!value)
-            throw UsageError("--" + name + ": \"" + text + "\" is not a " +
-                             std::string(RasterTools::ParameterTypeName(spec.type)) +
-                             (spec.name == "format" ? " or a format name (" + LayerFormatNames() + ")" : ""));
-        if (spec.type == RasterTools::ParameterType::Point) {
-            const auto point = std::get<Kernel::PointT<double>>(*value);
-            if (point.x < spec.minimum || point.x > spec.maximum || point.y < spec.minimum ||
-                point.y > spec.maximum)
-                throw UsageError("--" + name + " must lie within " +
-                                 RasterTools::FormatParameterValue(spec.minimum) + " .. " +
-                                 RasterTools::FormatParameterValue(spec.maximum) + " on both axes");
-        } else if (spec.type != RasterTools::ParameterType::Bool) {
-            const double number = spec.type == RasterTools::ParameterType::Int ? double(std::get<int>(*value))
-                                                                               : std::get<double>(*value);
-            if (number < spec.minimum || number > spec.maximum)
-                throw UsageError("--" + name + " must lie within " +
-                                 RasterTools::FormatParameterValue(spec.minimum) + " .. " +
-                                 RasterTools::FormatParameterValue(spec.maximum));
-        }
-        values[index] = *value;
-    }
+    const RasterTools::FilterInfo* filter = &RequireFilter(options.filter);
+    const std::vector<RasterTools::ParameterValue> values =
+        ParseFilterParameters(*filter, options.parameters);
 
     const auto command = filter->makeCommand(false, values);
     const auto* pipeline = dynamic_cast<const RasterTools::PipelineCommand*>(command.Get());
@@ -216,7 +149,10 @@ int RunApply(const std::vector<std::string>& args) {
     job.threads = options.threads;
     job.device = device.device;
     job.channelMask = channelMask;
+    ProgressBar progress(options.filter);
+    job.progress = progress.Callback();
     const auto result = RasterTools::RenderImage(*pipeline, source, destination, mask, job);
+    progress.Finish();
     if (!result.complete) throw Error(options.filter + ": " + result.error);
 
     const IO::WriteResult written = IO::WriteImage(output, *destination);

@@ -33,5 +33,6 @@ public:
 int RunList(const std::vector<std::string>& args);
 int RunPlay(const std::vector<std::string>& args);
 int RunApply(const std::vector<std::string>& args);
+int RunDoc(const std::vector<std::string>& args);
 
 } // namespace App

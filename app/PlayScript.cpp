@@ -5,7 +5,9 @@
 #include "filters/Catalogue.h"
 #include "host/document/DocumentController.h"
 #include "host/document/DocumentFile.h"
+#include "host/document/DocumentRender.h"
 #include "host/document/VeyraController.h"
+#include "host/io/ImageIO.h"
 
 #include <charconv>
 #include <cmath>
@@ -24,7 +26,7 @@ public:
 };
 
 constexpr std::string_view kVerbs = "tool, start, drag, click, set, reset, commit, cancel, leave, select, "
-                                    "select-live, add-live, undo, redo, show, save, load";
+                                    "select-live, add-live, undo, redo, show, save, load, render";
 constexpr std::string_view kShows = "params, hint, reflected, settings, history, layers";
 
 Kernel::PointT<double> ParsePoint(const std::string& text) {
@@ -121,6 +123,9 @@ public:
             if (auto error = DocumentFile::Load(words[1], document)) throw ScriptError(*error);
             m_Controller->SetDocument(document);
             m_Out << "  loaded " << words[1] << '\n';
+        } else if (verb == "render") {
+            arguments(1, 1, "render OUTPUT");
+            Render(words[1]);
         } else {
             throw ScriptError("unknown verb \"" + verb + "\" (verbs: " + std::string(kVerbs) + ")");
         }
@@ -217,6 +222,28 @@ private:
             text += " " + std::string(info->parameters[i].name) + "=" +
                     RasterTools::FormatParameterValue(values[i]);
         return text;
+    }
+
+    void Render(const std::string& output) {
+        const auto type = IO::GetFileTypeForExtension(output);
+        if (!type) throw ScriptError(output + ": unknown file type (use .png, .jpg, .jpeg, .tif or .tiff)");
+        const auto& document = *m_Controller->GetDocument();
+        FlattenOptions options;
+        for (const auto& node : document.GetLayers())
+            if (const auto* raster = dynamic_cast<const RasterNode*>(node.Get());
+                raster && raster->GetPixels()) {
+                options.format = IO::GetWritableFormat(*type, raster->GetPixels()->GetFormat());
+                break;
+            }
+        const FlattenResult result = FlattenDocument(document, options);
+        for (const auto& warning : result.warnings)
+            m_Out << "  warning: " << warning << '\n';
+        if (!result.image) throw ScriptError("cannot render: " + result.error);
+        if (const IO::WriteResult written = IO::WriteImage(output, *result.image); !written)
+            throw ScriptError(written.error);
+        m_Out << "  rendered " << output << " (" << result.image->GetWidth() << "x"
+              << result.image->GetHeight() << " " << Raster::GetPixelFormatName(result.image->GetFormat())
+              << ")\n";
     }
 
     void Show(const std::string& what) {

@@ -1,6 +1,7 @@
 // rastertools: the command-line editor built on the RasterTools library and its reference host.
 
 #include "app/Options.h"
+#include "app/Progress.h"
 #include "host/document/VeyraController.h"
 
 #include <cstdlib>
@@ -17,10 +18,21 @@ commands:
                   one filter on one image (apply copy [--format F] [--scale SX,SY] IN OUT), with
                   --device auto|cpu|opencl|cuda, --tile N, --threads N, --mask GREY.png (white selects)
                   and --channels (the channels written, e.g. rgb)
+  doc new IMAGE -o DOC [--format F]
+                  a new document (.rtd) holding the image as its one raster layer
+  doc filter DOC FILTER [--PARAM VALUE]... [--live]
+                  changes the selected raster layers (else the top one) with a filter, or with --live adds
+                  a live filter layer on top that holds it
+  doc render DOC OUTPUT [--format F] [--device D] [--tile N] [--threads N]
+                  flattens the document into an image file
+  doc show DOC    layers, live filters, pixel selection and history
+  doc undo DOC, doc redo DOC
+                  undoes (redoes) one step and saves the document
 
 options:
   --settings FILE the settings file (default: $RASTERTOOLS_SETTINGS, else
                   $XDG_CONFIG_HOME/rastertools/settings.json)
+  --quiet         no progress bars (they appear on a terminal for work that takes a while)
   --help          this text
 )";
 
@@ -31,6 +43,9 @@ int Run(std::vector<std::string> args) {
             if (i + 1 >= args.size()) throw App::UsageError("--settings needs a file name");
             VeyraController::GetInstance().SetFile(args[i + 1]);
             args.erase(args.begin() + std::ptrdiff_t(i), args.begin() + std::ptrdiff_t(i) + 2);
+        } else if (args[i] == "--quiet" || args[i] == "-q") {
+            App::SetQuiet(true);
+            args.erase(args.begin() + std::ptrdiff_t(i));
         } else if (args[i] == "--help" || args[i] == "-h") {
             std::cout << kUsage;
             return 0;
@@ -44,11 +59,12 @@ int Run(std::vector<std::string> args) {
     if (command == "list") return App::RunList(args);
     if (command == "play") return App::RunPlay(args);
     if (command == "apply") return App::RunApply(args);
+    if (command == "doc") return App::RunDoc(args);
     if (command == "help") {
         std::cout << kUsage;
         return 0;
     }
-    throw App::UsageError("unknown command \"" + command + "\" (commands: list, play, apply)");
+    throw App::UsageError("unknown command \"" + command + "\" (commands: list, play, apply, doc)");
 }
 
 } // namespace

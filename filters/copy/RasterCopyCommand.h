@@ -29,6 +29,10 @@ public:
     // range, or a format that is not a layer format, are clamped to it.
     OutputShape GetOutputShape(int width, int height, Raster::PixelFormat format) const override;
     RenderPath Render(const RenderTarget& target) const override;
+    // Applied to a layer's pixels in place, on the processor.
+    Kernel::RectT<int> DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const override {
+        return raster ? RenderDirectly(*raster) : Kernel::RectT<int>{};
+    }
     bool PrepareDevice(const RenderTarget& target) const override;
 
     const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }

@@ -16,8 +16,41 @@ Node::Node(std::string name)
 
 RasterNode::RasterNode(std::string name, int width, int height)
     : Node(std::move(name))
-    , m_Width(width)
-    , m_Height(height) {}
+    , m_Pixels(Raster::DynamicBuffer::Create(width, height, Raster::PixelFormat::RGBA8)) {}
+
+RasterNode::RasterNode(std::string name, Kernel::Counted<Raster::DynamicBuffer> pixels,
+                       Kernel::PointT<int> offset)
+    : Node(std::move(name))
+    , m_Pixels(std::move(pixels))
+    , m_Offset(offset) {}
+
+Raster::AffineTransform::Params RasterNode::GetTransform() const noexcept {
+    Raster::AffineTransform::Params params;
+    params.m[2] = double(m_Offset.x);
+    params.m[5] = double(m_Offset.y);
+    return params;
+}
+
+Kernel::RectT<int> RasterNode::GetDocumentBounds() const noexcept {
+    return {m_Offset.x, m_Offset.y, m_Offset.x + GetWidth(), m_Offset.y + GetHeight()};
+}
+
+bool SwapPatchPixels(PixelPatch& patch) {
+    if (!patch.layer || !patch.pixels) return false;
+    const auto& pixels = patch.layer->GetPixels();
+    const Kernel::RectT<int> rect = patch.rect;
+    if (!pixels || rect.IsEmpty() || pixels->GetFormat() != patch.pixels->GetFormat() ||
+        rect.Intersect(pixels->GetBounds()) != rect || patch.pixels->GetWidth() != rect.Width() ||
+        patch.pixels->GetHeight() != rect.Height())
+        return false;
+    const std::size_t bpp = std::size_t(pixels->GetBytesPerPixel());
+    const std::size_t bytes = std::size_t(rect.Width()) * bpp;
+    for (int y = 0; y < rect.Height(); ++y)
+        std::swap_ranges(pixels->RowBytes(rect.top + y) + std::size_t(rect.left) * bpp,
+                         pixels->RowBytes(rect.top + y) + std::size_t(rect.left) * bpp + bytes,
+                         patch.pixels->RowBytes(y));
+    return true;
+}
 
 FilterRasterNode::FilterRasterNode(std::string name,
                                    Kernel::Counted<RasterDevicePreviewableFilterLayerCommand> filter)
@@ -52,10 +85,13 @@ Kernel::Counted<FilterRasterNode> Document::GetSingleSelectedFilterNode() const 
 }
 
 namespace {
-void Apply(Document& document, const HistoryEntry& entry, bool forward) {
+void Apply(Document& document, HistoryEntry& entry, bool forward) {
     switch (entry.kind) {
     case HistoryEntry::Kind::PixelChange:
-        break; // pixels are restored by the raster side of the host
+        // The patches hold the other state's pixels, so undo and redo are the same swap.
+        for (auto& patch : entry.patches)
+            SwapPatchPixels(patch);
+        break;
     case HistoryEntry::Kind::LiveLayerAdded:
         if (forward)
             document.InsertLayer(entry.index, entry.layer);

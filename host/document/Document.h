@@ -2,7 +2,10 @@
 // A layered document: a stack of raster layers and live filter layers, a layer selection, and its history.
 
 #include "host/document/Command.h"
+#include "host/document/RasterInterface.h"
 #include "host/kernel/Countable.h"
+#include "host/raster/AffineTransform.h"
+#include "host/raster/DynamicBuffer.h"
 
 #include <cstdint>
 #include <string>
@@ -22,17 +25,31 @@ private:
     std::string m_Name;
 };
 
-// A layer of pixels. Its pixel storage is attached by the raster side of the host.
+// A layer of pixels in any layer format, placed in the document by a whole-pixel translation.
 class RasterNode : public Node {
 public:
+    // A transparent RGBA8 layer; without pixels when the size is refused (GetPixels() is then null).
     RasterNode(std::string name, int width, int height);
-    int GetWidth() const noexcept { return m_Width; }
-    int GetHeight() const noexcept { return m_Height; }
+    RasterNode(std::string name, Kernel::Counted<Raster::DynamicBuffer> pixels,
+               Kernel::PointT<int> offset = {});
+
+    int GetWidth() const noexcept { return m_Pixels ? m_Pixels->GetWidth() : 0; }
+    int GetHeight() const noexcept { return m_Pixels ? m_Pixels->GetHeight() : 0; }
     std::string GetKindName() const override { return "raster"; }
 
+    const Kernel::Counted<Raster::DynamicBuffer>& GetPixels() const noexcept { return m_Pixels; }
+    void SetPixels(Kernel::Counted<Raster::DynamicBuffer> pixels) { m_Pixels = std::move(pixels); }
+    // Where the layer's top-left pixel sits in document pixels.
+    Kernel::PointT<int> GetOffset() const noexcept { return m_Offset; }
+    void SetOffset(Kernel::PointT<int> offset) noexcept { m_Offset = offset; }
+    // Layer pixels to document pixels: the translation by the offset.
+    Raster::AffineTransform::Params GetTransform() const noexcept;
+    // The layer's rectangle in document pixels.
+    Kernel::RectT<int> GetDocumentBounds() const noexcept;
+
 private:
-    int m_Width;
-    int m_Height;
+    Kernel::Counted<Raster::DynamicBuffer> m_Pixels;
+    Kernel::PointT<int> m_Offset;
 };
 
 // Gives access to the filter command of a live filter layer.
@@ -56,6 +73,14 @@ private:
     Kernel::Counted<RasterDevicePreviewableFilterLayerCommand> m_Filter;
 };
 
+// The pixels of one rectangle of a raster layer that a PixelChange swaps in and out. While the entry is done
+// they are the pixels from before the change; while it is undone, those from after it.
+struct PixelPatch {
+    Kernel::Counted<RasterNode> layer;
+    Kernel::RectT<int> rect;                       // in layer pixels
+    Kernel::Counted<Raster::DynamicBuffer> pixels; // rect's size, the layer's format
+};
+
 // One undoable step: the command as applied and what it changed, so that it can be undone, redone and saved.
 struct HistoryEntry {
     enum class Kind {
@@ -68,6 +93,7 @@ struct HistoryEntry {
     Kernel::Counted<Node> layer;
     std::size_t index = 0;
     Kernel::Counted<RasterDevicePreviewableFilterLayerCommand> previousFilter;
+    std::vector<PixelPatch> patches; // PixelChange: one per changed layer
 };
 
 // The layers, selection and history of one document. Not thread-safe: the user-interface thread owns it.
@@ -91,7 +117,8 @@ public:
     // History: entries before the cursor are done, those after it were undone and can be redone.
     const std::vector<HistoryEntry>& GetHistory() const noexcept { return m_History; }
     std::size_t GetHistoryCursor() const noexcept { return m_Cursor; }
-    // Drops the undone entries, applies entry and appends it.
+    // Drops the undone entries, applies entry and appends it. A PixelChange's patches must hold the new
+    // pixels: applying swaps them with the layer's.
     void PushHistory(HistoryEntry entry);
     // Replaces the whole history, entries before cursor counted as done (used when loading; nothing is
     // applied).
@@ -103,10 +130,23 @@ public:
     const Kernel::Counted<Command>& GetPreview() const noexcept { return m_Preview; }
     void SetPreview(Kernel::Counted<Command> preview) { m_Preview = std::move(preview); }
 
+    // The pixel selection that limits pixel changes; null when there is none.
+    const Kernel::Counted<SelectionRasterNode>& GetPixelSelection() const noexcept {
+        return m_PixelSelection;
+    }
+    void SetPixelSelection(Kernel::Counted<SelectionRasterNode> selection) {
+        m_PixelSelection = std::move(selection);
+    }
+
 private:
     NodeList m_Layers;
     NodeList m_Selection;
     std::vector<HistoryEntry> m_History;
     std::size_t m_Cursor = 0;
     Kernel::Counted<Command> m_Preview;
+    Kernel::Counted<SelectionRasterNode> m_PixelSelection;
 };
+
+// Swaps the pixels of patch with those of its layer's rectangle; false (and nothing changed) when they do not
+// fit each other.
+bool SwapPatchPixels(PixelPatch& patch);

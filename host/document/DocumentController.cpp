@@ -1,6 +1,7 @@
 #include "host/document/DocumentController.h"
 
 #include "host/document/Notifications.h"
+#include "host/document/PixelEffect.h"
 
 #include <mutex>
 
@@ -157,7 +158,15 @@ void DocumentController::ApplyToDocument(const Kernel::Counted<Command>& command
         Report("history: live filter layer \"" + node->GetName() + "\" added at " + std::to_string(index));
         return;
     }
-    m_Document->PushHistory({.kind = HistoryEntry::Kind::PixelChange, .command = command});
+    if (auto raster = Kernel::CountedCast<RasterCommand>(command)) {
+        // The command changes the selected layers' pixels now; the entry keeps what undo needs.
+        if (auto error = ApplyPixelCommand(*m_Document, raster)) {
+            Report("not applied: " + *error);
+            return;
+        }
+    } else {
+        m_Document->PushHistory({.kind = HistoryEntry::Kind::PixelChange, .command = command});
+    }
     Report("history: " + command->GetDescription().Localise() + " applied");
 }
 

@@ -3,6 +3,9 @@
 #include "host/kernel/AtomicFile.h"
 #include "host/kernel/Serialiser.h"
 
+#include <zstd.h>
+
+#include <algorithm>
 #include <array>
 #include <cstring>
 #include <limits>
@@ -12,7 +15,9 @@ namespace DocumentFile {
 namespace {
 
 constexpr std::array<char, 8> kMagic = {'R', 'T', 'D', 'O', 'C', '\r', '\n', '\x1a'};
-constexpr std::uint32_t kVersion = 1;
+// 2: raster layers with their pixels and placement, pixel patches in history, the pixel selection.
+constexpr std::uint32_t kVersion = 2;
+constexpr int kCompressionLevel = 3;
 constexpr std::uint32_t kNoLayer = std::numeric_limits<std::uint32_t>::max();
 
 enum class LayerKind : std::uint8_t { Raster = 0, LiveFilter = 1 };
@@ -41,6 +46,41 @@ public:
         Bytes(block.data(), block.size());
     }
     void Text(const std::string& text) { Block(std::as_bytes(std::span(text.data(), text.size()))); }
+    // Format, size, then the rows without padding as one zstd frame that records its content size.
+    bool Image(const Raster::DynamicBuffer& image) {
+        Value(std::uint8_t(image.GetFormat()));
+        Value(std::int32_t(image.GetWidth()));
+        Value(std::int32_t(image.GetHeight()));
+        const std::size_t sizeAt = m_Bytes.size();
+        Value(std::uint64_t(0));
+        const std::size_t start = m_Bytes.size();
+        ZSTD_CCtx* context = ZSTD_createCCtx();
+        if (!context) return false;
+        bool ok =
+            !ZSTD_isError(ZSTD_CCtx_setParameter(context, ZSTD_c_compressionLevel, kCompressionLevel)) &&
+            !ZSTD_isError(ZSTD_CCtx_setPledgedSrcSize(context, std::uint64_t(image.GetRowBytes()) *
+                                                                   std::uint64_t(image.GetHeight())));
+        for (int y = 0; ok && y < image.GetHeight(); ++y) {
+            ZSTD_inBuffer in{image.RowBytes(y), image.GetRowBytes(), 0};
+            const ZSTD_EndDirective mode = y + 1 == image.GetHeight() ? ZSTD_e_end : ZSTD_e_continue;
+            for (;;) {
+                const std::size_t at = m_Bytes.size();
+                m_Bytes.resize(at + ZSTD_CStreamOutSize());
+                ZSTD_outBuffer out{m_Bytes.data() + at, ZSTD_CStreamOutSize(), 0};
+                const std::size_t left = ZSTD_compressStream2(context, &out, &in, mode);
+                m_Bytes.resize(at + out.pos);
+                if (ZSTD_isError(left)) {
+                    ok = false;
+                    break;
+                }
+                if (mode == ZSTD_e_end ? left == 0 : in.pos == in.size) break;
+            }
+        }
+        ZSTD_freeCCtx(context);
+        const std::uint64_t compressed = m_Bytes.size() - start;
+        std::memcpy(m_Bytes.data() + sizeAt, &compressed, sizeof compressed);
+        return ok;
+    }
     std::vector<std::byte>& Result() { return m_Bytes; }
 
 private:
@@ -72,6 +112,59 @@ public:
         text.assign(reinterpret_cast<const char*>(block.data()), block.size());
         return true;
     }
+    // An image written by Writer::Image. Every claim is checked against the remaining bytes, the buffer
+    // limits and the frame's own content size before anything is allocated or decompressed. Sets why.
+    bool Image(Kernel::Counted<Raster::DynamicBuffer>& image, bool mask, std::string& why) {
+        std::uint8_t code = 0;
+        std::int32_t width = 0, height = 0;
+        std::uint64_t compressed = 0;
+        if (!Value(code) || !Value(width) || !Value(height) || !Value(compressed))
+            return Why(why, "truncated");
+        const auto format = Raster::PixelFormat(code);
+        if (!Raster::IsValidPixelFormat(format) ||
+            (mask ? format != Raster::PixelFormat::MaskA8 : !Raster::IsLayerFormat(format)))
+            return Why(why, "unknown pixel format " + std::to_string(code));
+        if (!Raster::DynamicBuffer::IsSizeAllowed(width, height, format))
+            return Why(why, "a " + std::to_string(width) + "x" + std::to_string(height) + " " +
+                                std::string(Raster::GetPixelFormatName(format)) +
+                                " image is beyond the limits");
+        if (!Need(compressed)) return Why(why, "pixels truncated");
+        const auto frame = m_Bytes.subspan(m_At, std::size_t(compressed));
+        m_At += std::size_t(compressed);
+        const std::uint64_t expected =
+            std::uint64_t(width) * std::uint64_t(height) * std::uint64_t(Raster::GetBytesPerPixel(format));
+        if (ZSTD_getFrameContentSize(frame.data(), frame.size()) != expected ||
+            ZSTD_findFrameCompressedSize(frame.data(), frame.size()) != frame.size())
+            return Why(why, "pixel data does not match the image's size");
+        auto buffer = Raster::DynamicBuffer::Create(width, height, format);
+        if (!buffer) return Why(why, "not enough memory for the pixels");
+        ZSTD_DCtx* context = ZSTD_createDCtx();
+        if (!context) return Why(why, "not enough memory to decompress");
+        ZSTD_inBuffer in{frame.data(), frame.size(), 0};
+        bool ok = true;
+        std::size_t last = 1;
+        for (int y = 0; ok && y < height; ++y) {
+            ZSTD_outBuffer out{buffer->RowBytes(y), buffer->GetRowBytes(), 0};
+            while (ok && out.pos < out.size) {
+                const std::size_t before = in.pos, produced = out.pos;
+                last = ZSTD_decompressStream(context, &out, &in);
+                ok = !ZSTD_isError(last) && (in.pos != before || out.pos != produced);
+            }
+        }
+        // The frame must end exactly where the pixels do.
+        if (ok && last != 0) {
+            std::byte spare;
+            ZSTD_outBuffer out{&spare, 1, 0};
+            last = ZSTD_decompressStream(context, &out, &in);
+            ok = !ZSTD_isError(last) && last == 0 && out.pos == 0;
+        }
+        ok = ok && in.pos == in.size;
+        ZSTD_freeDCtx(context);
+        if (!ok) return Why(why, "the pixels do not decompress");
+        image = std::move(buffer);
+        return true;
+    }
+
     // Whether count items of at least minItemBytes each can still follow.
     bool CanHold(std::uint64_t count, std::size_t minItemBytes) const {
         return m_Ok && count <= (m_Bytes.size() - m_At) / minItemBytes;
@@ -80,7 +173,12 @@ public:
     bool Ok() const { return m_Ok; }
 
 private:
-    bool Need(std::size_t size) {
+    bool Why(std::string& why, std::string reason) {
+        why = std::move(reason);
+        m_Ok = false;
+        return false;
+    }
+    bool Need(std::uint64_t size) {
         if (m_Ok && size <= m_Bytes.size() - m_At) return true;
         m_Ok = false;
         return false;
@@ -109,9 +207,14 @@ std::vector<std::byte> Encode(const Document& document, std::string* error) {
     // Layers that were undone are not in the stack but history still refers to them: keep them too,
     // after the stack, marked as detached.
     std::vector<Kernel::Counted<Node>> nodes(document.GetLayers().begin(), document.GetLayers().end());
-    for (const auto& entry : document.GetHistory())
-        if (entry.layer && std::find(nodes.begin(), nodes.end(), entry.layer) == nodes.end())
-            nodes.push_back(entry.layer);
+    const auto keep = [&](const Kernel::Counted<Node>& node) {
+        if (node && std::find(nodes.begin(), nodes.end(), node) == nodes.end()) nodes.push_back(node);
+    };
+    for (const auto& entry : document.GetHistory()) {
+        keep(entry.layer);
+        for (const auto& patch : entry.patches)
+            keep(patch.layer);
+    }
     auto nodeIndex = [&](const Kernel::Counted<Node>& node) {
         const auto it = std::find(nodes.begin(), nodes.end(), node);
         return it == nodes.end() ? kNoLayer : std::uint32_t(it - nodes.begin());
@@ -123,8 +226,11 @@ std::vector<std::byte> Encode(const Document& document, std::string* error) {
         out.Text(node->GetName());
         if (const auto* raster = dynamic_cast<const RasterNode*>(node.Get())) {
             out.Value(LayerKind::Raster);
-            out.Value(std::int32_t(raster->GetWidth()));
-            out.Value(std::int32_t(raster->GetHeight()));
+            if (!raster->GetPixels()) return fail("raster layer \"" + node->GetName() + "\" has no pixels");
+            out.Value(std::int32_t(raster->GetOffset().x));
+            out.Value(std::int32_t(raster->GetOffset().y));
+            if (!out.Image(*raster->GetPixels()))
+                return fail("the pixels of layer \"" + node->GetName() + "\" could not be compressed");
         } else if (const auto* live = dynamic_cast<const FilterRasterNode*>(node.Get())) {
             out.Value(LayerKind::LiveFilter);
             if (!live->GetFilter())
@@ -138,6 +244,10 @@ std::vector<std::byte> Encode(const Document& document, std::string* error) {
     out.Value(std::uint32_t(document.GetSelection().size()));
     for (const auto& node : document.GetSelection())
         out.Value(IndexOrNone(document, node));
+    const auto& pixelSelection = document.GetPixelSelection();
+    out.Value(std::uint8_t(pixelSelection && pixelSelection->GetMask() ? 1 : 0));
+    if (pixelSelection && pixelSelection->GetMask() && !out.Image(*pixelSelection->GetMask()))
+        return fail("the pixel selection could not be compressed");
 
     out.Value(std::uint32_t(document.GetHistory().size()));
     out.Value(std::uint32_t(document.GetHistoryCursor()));
@@ -152,6 +262,15 @@ std::vector<std::byte> Encode(const Document& document, std::string* error) {
             out.Block(Kernel::SerialiseObject(*entry.previousFilter));
         else
             out.Value(std::uint32_t(0));
+        out.Value(std::uint32_t(entry.patches.size()));
+        for (const auto& patch : entry.patches) {
+            if (!patch.pixels) return fail("a history entry lacks the pixels it changed");
+            out.Value(nodeIndex(patch.layer));
+            out.Value(std::int32_t(patch.rect.left));
+            out.Value(std::int32_t(patch.rect.top));
+            if (!out.Image(*patch.pixels))
+                return fail("the pixels of a history entry could not be compressed");
+        }
     }
     const std::uint64_t checksum = Checksum(out.Result());
     out.Value(checksum);
@@ -169,9 +288,14 @@ std::optional<std::string> Decode(std::span<const std::byte> bytes, Kernel::Coun
     Reader in(body.subspan(kMagic.size()));
     std::uint32_t version = 0;
     in.Value(version);
-    if (version != kVersion)
+    if (version < kVersion)
         return "document version " + std::to_string(version) +
-               " is not supported (this program reads version " + std::to_string(kVersion) + ")";
+               " is from an older rastertools and cannot be read (this program reads version " +
+               std::to_string(kVersion) + ")";
+    if (version > kVersion)
+        return "document version " + std::to_string(version) +
+               " is from a newer rastertools and cannot be read (this program reads version " +
+               std::to_string(kVersion) + ")";
     if (Checksum(body) != stored) return "the document is damaged (checksum mismatch)";
 
     const auto damaged = [](const std::string& what) { return "the document is damaged (" + what + ")"; };
@@ -191,10 +315,13 @@ std::optional<std::string> Decode(std::span<const std::byte> bytes, Kernel::Coun
         LayerKind kind{};
         if (!in.Text(name) || !in.Value(kind)) return damaged("layer " + std::to_string(i));
         if (kind == LayerKind::Raster) {
-            std::int32_t width = 0, height = 0;
-            if (!in.Value(width) || !in.Value(height) || width < 0 || height < 0)
-                return damaged("size of layer " + std::to_string(i));
-            nodes.emplace_back(new RasterNode(name, width, height));
+            std::int32_t x = 0, y = 0;
+            Kernel::Counted<Raster::DynamicBuffer> pixels;
+            std::string why;
+            if (!in.Value(x) || !in.Value(y)) return damaged("placement of layer " + std::to_string(i));
+            if (!in.Image(pixels, false, why))
+                return damaged("pixels of layer " + std::to_string(i) + ": " + why);
+            nodes.emplace_back(new RasterNode(name, std::move(pixels), {x, y}));
         } else if (kind == LayerKind::LiveFilter) {
             std::span<const std::byte> block;
             if (!in.Block(block)) return damaged("filter of layer " + std::to_string(i));
@@ -217,10 +344,18 @@ std::optional<std::string> Decode(std::span<const std::byte> bytes, Kernel::Coun
         selection.push_back(nodes[index]);
     }
     document->SetSelection(std::move(selection));
+    std::uint8_t hasPixelSelection = 0;
+    if (!in.Value(hasPixelSelection) || hasPixelSelection > 1) return damaged("pixel selection");
+    if (hasPixelSelection) {
+        Kernel::Counted<Raster::DynamicBuffer> mask;
+        std::string why;
+        if (!in.Image(mask, true, why)) return damaged("pixel selection: " + why);
+        document->SetPixelSelection(Kernel::MakeCounted<SelectionRasterNode>(std::move(mask)));
+    }
 
     std::uint32_t historyCount = 0, cursor = 0;
     if (!in.Value(historyCount) || !in.Value(cursor) || cursor > historyCount ||
-        !in.CanHold(historyCount, 13))
+        !in.CanHold(historyCount, 21))
         return damaged("history");
     std::vector<HistoryEntry> history;
     for (std::uint32_t i = 0; i < historyCount; ++i) {
@@ -254,6 +389,30 @@ std::optional<std::string> Decode(std::span<const std::byte> bytes, Kernel::Coun
             return damaged("history entry " + std::to_string(i + 1) + " refers to no live filter layer");
         if (entry.kind == HistoryEntry::Kind::LiveFilterChanged && !entry.previousFilter)
             return damaged("history entry " + std::to_string(i + 1) + " lacks the filter it replaced");
+        std::uint32_t patchCount = 0;
+        if (!in.Value(patchCount) || !in.CanHold(patchCount, 29) ||
+            (patchCount != 0 && entry.kind != HistoryEntry::Kind::PixelChange))
+            return damaged("pixels of history entry " + std::to_string(i + 1));
+        for (std::uint32_t p = 0; p < patchCount; ++p) {
+            const std::string what = "pixels of history entry " + std::to_string(i + 1);
+            std::uint32_t patchLayer = 0;
+            std::int32_t left = 0, top = 0;
+            PixelPatch patch;
+            std::string why;
+            if (!in.Value(patchLayer) || !in.Value(left) || !in.Value(top) || patchLayer >= nodeCount ||
+                !(patch.layer = Kernel::CountedCast<RasterNode>(nodes[patchLayer])))
+                return damaged(what);
+            if (!in.Image(patch.pixels, false, why)) return damaged(what + ": " + why);
+            const auto& layerPixels = *patch.layer->GetPixels();
+            // 64-bit sums: the claimed corner may be anywhere in the int range.
+            if (left < 0 || top < 0 ||
+                std::int64_t(left) + patch.pixels->GetWidth() > layerPixels.GetWidth() ||
+                std::int64_t(top) + patch.pixels->GetHeight() > layerPixels.GetHeight() ||
+                patch.pixels->GetFormat() != layerPixels.GetFormat())
+                return damaged(what + " do not fit their layer");
+            patch.rect = {left, top, left + patch.pixels->GetWidth(), top + patch.pixels->GetHeight()};
+            entry.patches.push_back(std::move(patch));
+        }
         history.push_back(std::move(entry));
     }
     if (!in.AtEnd()) return damaged("unexpected data at the end");

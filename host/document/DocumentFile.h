@@ -1,5 +1,6 @@
 #pragma once
-// Saving and loading documents (.rtd): layers, live filters, selection and history in one checked file.
+// Saving and loading documents (.rtd): layers with their pixels, live filters, selections and history in one
+// checked file.
 
 #include "host/document/Document.h"
 

@@ -127,7 +127,7 @@ TEST_F(DocumentFiles, HostileCountsWithAValidChecksumAreRefused) {
     Reseal(future);
     Kernel::Counted<Document> loaded;
     EXPECT_EQ(DocumentFile::Decode(future, loaded).value_or(""),
-              "document version 99 is not supported (this program reads version 1)");
+              "document version 99 is from a newer rastertools and cannot be read (this program reads version 2)");
 }
 
 TEST_F(DocumentFiles, AFailedLoadLeavesTheFileAndAFailedSaveLeavesTheOldFile) {

@@ -1,0 +1,182 @@
+// Flattening documents: compositing in the working colour over the tile renderer, live filters through their
+// span populators.
+#include "host/document/DocumentRender.h"
+
+#include "host/document/TileRenderer.h"
+#include "host/document/WorkingPixels.h"
+#include "host/kernel/Abort.h"
+#include "host/renderer/SpanPopulator.h"
+
+#include <vector>
+
+namespace {
+
+constexpr Raster::PixelFormat kWorking = Raster::PixelFormat::RGBAUF;
+
+// Runs render over area in tiles, reporting its share [first, first + share) of the whole.
+bool RenderStep(Kernel::RectT<int> area, const FlattenOptions& options, double first, double share,
+                const std::function<bool(const Kernel::RectT<int>&)>& render) {
+    TileRenderOptions tiles;
+    tiles.tileSize = options.tileSize;
+    tiles.threads = options.threads;
+    tiles.abort = options.abort;
+    if (options.progress)
+        tiles.progress = [&](double fraction) {
+            // The last step's 1.0 is the flatten's own, reported when it is done.
+            const double overall = first + share * fraction;
+            if (overall < 1.0) options.progress(overall);
+        };
+    return RenderTiles(area, tiles, render);
+}
+
+void CompositeLayer(const RasterNode& layer, Raster::DynamicBuffer& canvas, Kernel::RectT<int> canvasBounds,
+                    const Kernel::RectT<int>& tile) {
+    // tile is in canvas pixels; the layer's part of it in layer pixels.
+    const auto& pixels = *layer.GetPixels();
+    const Kernel::PointT<int> offset = layer.GetOffset();
+    const int dx = canvasBounds.left - offset.x, dy = canvasBounds.top - offset.y;
+    const int width = tile.Width();
+    std::vector<float> row(std::size_t(width) * 4);
+    const std::size_t bpp = std::size_t(pixels.GetBytesPerPixel());
+    for (int y = tile.top; y < tile.bottom; ++y) {
+        WorkingPixels::ToWorking(pixels.GetFormat(),
+                                 pixels.RowBytes(y + dy) + std::size_t(tile.left + dx) * bpp, row.data(),
+                                 width);
+        float* dest = canvas.Row<float>(y) + std::size_t(tile.left) * 4;
+        for (int x = 0; x < width; ++x)
+            CompositeOver(&row[std::size_t(x) * 4], dest + std::size_t(x) * 4);
+    }
+}
+
+} // namespace
+
+void CompositeOver(const float* source, float* dest) noexcept {
+    const float sa = source[3];
+    if (sa >= 1.0f) {
+        std::copy(source, source + 4, dest);
+        return;
+    }
+    if (!(sa > 0.0f)) return; // transparent (or NaN) pixels change nothing
+    const float below = dest[3] * (1.0f - sa);
+    const float alpha = sa + below;
+    for (int c = 0; c < 3; ++c)
+        dest[c] = (source[c] * sa + dest[c] * below) / alpha;
+    dest[3] = alpha;
+}
+
+Kernel::RectT<int> GetDocumentBounds(const Document& document) {
+    Kernel::RectT<int> bounds;
+    bool any = false;
+    for (const auto& node : document.GetLayers()) {
+        const auto* raster = dynamic_cast<const RasterNode*>(node.Get());
+        if (!raster || !raster->GetPixels()) continue;
+        const Kernel::RectT<int> own = raster->GetDocumentBounds();
+        bounds =
+            any ? Kernel::RectT<int>{std::min(bounds.left, own.left), std::min(bounds.top, own.top),
+                                     std::max(bounds.right, own.right), std::max(bounds.bottom, own.bottom)}
+                : own;
+        any = true;
+    }
+    return bounds;
+}
+
+FlattenResult FlattenDocument(const Document& document, const FlattenOptions& options) {
+    FlattenResult result;
+    const RasterNode* bottom = nullptr;
+    for (const auto& node : document.GetLayers())
+        if (const auto* raster = dynamic_cast<const RasterNode*>(node.Get()); raster && raster->GetPixels()) {
+            bottom = raster;
+            break;
+        }
+    if (!bottom) {
+        result.error = "the document has no raster layer to render";
+        return result;
+    }
+    const Raster::PixelFormat format = options.format.value_or(bottom->GetPixels()->GetFormat());
+    if (!Raster::IsValidPixelFormat(format) || !Raster::IsLayerFormat(format)) {
+        result.error = "the result's format must be a layer format";
+        return result;
+    }
+    result.bounds = GetDocumentBounds(document);
+    const int width = result.bounds.Width(), height = result.bounds.Height();
+    Kernel::Counted<Raster::DynamicBuffer> canvas = Raster::DynamicBuffer::Create(width, height, kWorking);
+    if (!canvas) {
+        result.error =
+            "a " + std::to_string(width) + "x" + std::to_string(height) + " image is too large to render";
+        return result;
+    }
+    const Kernel::RectT<int> area = canvas->GetBounds();
+    const auto& layers = document.GetLayers();
+    const double steps = double(layers.size() + 1);
+    bool* abort = const_cast<bool*>(options.abort); // the span populators take it mutable but only read it
+
+    for (std::size_t i = 0; i < layers.size(); ++i) {
+        const Node& node = *layers[i];
+        bool rendered = true;
+        if (const auto* raster = dynamic_cast<const RasterNode*>(&node)) {
+            if (!raster->GetPixels()) continue;
+            const Kernel::RectT<int> own = raster->GetDocumentBounds();
+            const Kernel::RectT<int> part{own.left - result.bounds.left, own.top - result.bounds.top,
+                                          own.right - result.bounds.left, own.bottom - result.bounds.top};
+            rendered = RenderStep(part, options, double(i) / steps, 1.0 / steps,
+                                  [&](const Kernel::RectT<int>& tile) {
+                                      CompositeLayer(*raster, *canvas, result.bounds, tile);
+                                      return true;
+                                  });
+        } else if (const auto* live = dynamic_cast<const FilterRasterNode*>(&node)) {
+            const auto filter = live->GetFilter();
+            const auto* populator =
+                dynamic_cast<const Renderer::SpanPopulatorBitmapFillMutationHost*>(filter.Get());
+            if (!populator) {
+                result.warnings.push_back(
+                    "live filter layer \"" + node.GetName() + "\" (" +
+                    (filter ? filter->GetDescription().Localise() : std::string("no filter")) +
+                    ") cannot render; skipped");
+                continue;
+            }
+            auto destination = Raster::DynamicBuffer::Create(width, height, kWorking);
+            if (!destination) {
+                result.error = "not enough memory to render live filter layer \"" + node.GetName() + "\"";
+                return result;
+            }
+            const Kernel::RectT<double> bounds{0.0, 0.0, double(width), double(height)};
+            rendered = RenderStep(
+                area, options, double(i) / steps, 1.0 / steps, [&](const Kernel::RectT<int>& tile) {
+                    populator->PrepareSpanPopulator(canvas, 0, bounds, Raster::AffineTransform::Params{},
+                                                    tile, destination, abort);
+                    return !Kernel::IsAborted(options.abort);
+                });
+            canvas = std::move(destination);
+        }
+        if (!rendered || Kernel::IsAborted(options.abort)) {
+            result.error = "the render was aborted";
+            return result;
+        }
+    }
+
+    if (format == kWorking) {
+        result.image = canvas;
+    } else {
+        auto image = Raster::DynamicBuffer::Create(width, height, format);
+        if (!image) {
+            result.error = "not enough memory for the rendered image";
+            return result;
+        }
+        const std::size_t bpp = std::size_t(Raster::GetBytesPerPixel(format));
+        const bool converted = RenderStep(
+            area, options, double(layers.size()) / steps, 1.0 / steps, [&](const Kernel::RectT<int>& tile) {
+                for (int y = tile.top; y < tile.bottom; ++y)
+                    WorkingPixels::FromWorking(format, canvas->Row<float>(y) + std::size_t(tile.left) * 4,
+                                               image->RowBytes(y) + std::size_t(tile.left) * bpp,
+                                               tile.Width());
+                return true;
+            });
+        if (!converted) {
+            result.error = "the render was aborted";
+            return result;
+        }
+        result.image = std::move(image);
+    }
+    if (options.progress) options.progress(1.0);
+    return result;
+}
