@@ -1,5 +1,6 @@
 // Device enumeration and selection, counters, and the device-buffer semaphore.
 #include "DeviceTestSupport.h"
+#include "SelectorVariable.h"
 
 #include <cstdlib>
 #include <latch>
@@ -9,6 +10,7 @@
 
 using namespace Raster;
 using DeviceTest::OpenCLDevice;
+using DeviceTest::SelectorVariable;
 
 namespace {
 
@@ -22,27 +24,6 @@ std::string Picked(const HardwareDeviceList& devices, std::string_view selector)
     const auto device = SelectHardwareDevice(devices, *parsed);
     return device ? device->GetIdentifier() : "none";
 }
-
-// Sets or clears RASTERTOOLS_DEVICE for one scope.
-class SelectorVariable {
-public:
-    explicit SelectorVariable(const char* value) {
-        if (const char* old = std::getenv(Hardware::SelectorVariable)) m_Old = old;
-        if (value)
-            ::setenv(Hardware::SelectorVariable, value, 1);
-        else
-            ::unsetenv(Hardware::SelectorVariable);
-    }
-    ~SelectorVariable() {
-        if (m_Old)
-            ::setenv(Hardware::SelectorVariable, m_Old->c_str(), 1);
-        else
-            ::unsetenv(Hardware::SelectorVariable);
-    }
-
-private:
-    std::optional<std::string> m_Old;
-};
 
 } // namespace
 

@@ -1,6 +1,7 @@
 // Choosing the render device: --device, then RASTERTOOLS_DEVICE, then auto; refusals name their origin.
 
 #include "host/document/TileRenderer.h"
+#include "tests/host/device/SelectorVariable.h"
 
 #include <gtest/gtest.h>
 
@@ -11,30 +12,8 @@
 
 namespace {
 
+using DeviceTest::SelectorVariable;
 using Raster::Hardware;
-
-// Sets or clears RASTERTOOLS_DEVICE for one scope.
-class SelectorVariable {
-public:
-    explicit SelectorVariable(const char* value) {
-        if (const char* old = std::getenv(Hardware::SelectorVariable)) m_Old = old;
-        if (value)
-            ::setenv(Hardware::SelectorVariable, value, 1);
-        else
-            ::unsetenv(Hardware::SelectorVariable);
-    }
-    ~SelectorVariable() {
-        if (m_Old)
-            ::setenv(Hardware::SelectorVariable, m_Old->c_str(), 1);
-        else
-            ::unsetenv(Hardware::SelectorVariable);
-    }
-    SelectorVariable(const SelectorVariable&) = delete;
-    SelectorVariable& operator=(const SelectorVariable&) = delete;
-
-private:
-    std::optional<std::string> m_Old;
-};
 
 std::size_t CountDevices(Raster::HardwareBackEnd backEnd) {
     const auto& devices = Hardware::GetDevices();
