@@ -10,6 +10,7 @@
 #include "pipeline/Formats.h"
 #include "pipeline/RenderJob.h"
 
+#include <algorithm>
 #include <cstring>
 #include <iostream>
 #include <optional>
@@ -85,13 +86,46 @@ Kernel::Counted<Raster::DynamicBuffer> ReadMask(const std::string& path, int wid
     return mask;
 }
 
+// The image in format, converted on the processor by the copy filter (the decoder only widens for free).
+Kernel::Counted<Raster::DynamicBuffer> ConvertOnLoad(Kernel::Counted<Raster::DynamicBuffer> image,
+                                                     Raster::PixelFormat format, const std::string& path) {
+    if (image->GetFormat() == format) return image;
+    const RasterTools::FilterInfo* copy = RasterTools::FindFilter("copy");
+    const auto command =
+        copy ? copy->makeCommand(false, {static_cast<int>(format), Kernel::PointT<double>{1.0, 1.0}})
+             : nullptr;
+    const auto* pipeline = dynamic_cast<const RasterTools::PipelineCommand*>(command.Get());
+    auto converted = Raster::DynamicBuffer::Create(image->GetWidth(), image->GetHeight(), format);
+    if (!pipeline || !converted)
+        throw Error(path + ": the image could not be converted to " +
+                    std::string(Raster::GetPixelFormatName(format)));
+    const auto result = RasterTools::RenderImage(*pipeline, image, converted, nullptr, {});
+    if (!result.complete) throw Error(path + ": " + result.error);
+    return converted;
+}
+
 } // namespace
 
 int RunApply(const std::vector<std::string>& args) {
     const ApplyOptions options = ParseArguments(args);
     const RasterTools::FilterInfo* filter = &RequireFilter(options.filter);
-    const std::vector<RasterTools::ParameterValue> values =
-        ParseFilterParameters(*filter, options.parameters);
+    // A filter without a format parameter of its own takes --format as the format to convert the input to
+    // when it is read.
+    std::optional<Raster::PixelFormat> loadFormat;
+    const bool hasFormatParameter =
+        std::any_of(filter->parameters.begin(), filter->parameters.end(),
+                    [](const RasterTools::ParameterSpec& spec) { return spec.name == "format"; });
+    std::vector<std::pair<std::string, std::string>> parameters;
+    for (const auto& [name, text] : options.parameters) {
+        if (name != "format" || hasFormatParameter) {
+            parameters.emplace_back(name, text);
+            continue;
+        }
+        loadFormat = Raster::ParsePixelFormat(text);
+        if (!loadFormat || !Raster::IsLayerFormat(*loadFormat))
+            throw UsageError("--format: \"" + text + "\" is not a layer format (" + LayerFormatNames() + ")");
+    }
+    const std::vector<RasterTools::ParameterValue> values = ParseFilterParameters(*filter, parameters);
 
     const auto command = filter->makeCommand(false, values);
     const auto* pipeline = dynamic_cast<const RasterTools::PipelineCommand*>(command.Get());
@@ -102,9 +136,9 @@ int RunApply(const std::vector<std::string>& args) {
     const auto outputType = IO::GetFileTypeForExtension(output);
     if (!outputType) throw UsageError(output + ": unknown file type (use .png, .jpg, .jpeg, .tif or .tiff)");
 
-    IO::ReadResult read = IO::ReadImage(input);
+    IO::ReadResult read = IO::ReadImage(input, loadFormat);
     if (!read) throw Error(read.error);
-    const auto source = read.image;
+    const auto source = loadFormat ? ConvertOnLoad(read.image, *loadFormat, input) : read.image;
     const auto shape = pipeline->GetOutputShape(source->GetWidth(), source->GetHeight(), source->GetFormat());
     if (!IO::CanWrite(*outputType, shape.format))
         throw Error(

@@ -30,6 +30,13 @@ FilterInfo Describe(std::string_view toolClass, std::string_view commandClass) {
                     .readCommand = {}};
     for (const auto& parameter : Filter::kParameters)
         info.parameters.push_back(parameter.spec);
+    if constexpr (requires { Filter::kSamples; })
+        for (const Params& sample : Filter::kSamples) {
+            std::vector<ParameterValue> values;
+            for (const auto& parameter : Filter::kParameters)
+                values.push_back(GetParameter(sample, parameter));
+            info.samples.push_back(std::move(values));
+        }
     info.makeCommand = [](bool liveEffect, const std::vector<ParameterValue>& values) {
         Params params = DefaultParameters(Filter::kParameters);
         for (std::size_t i = 0; i < values.size() && i < Filter::kParameters.size(); ++i)

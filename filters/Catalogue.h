@@ -27,6 +27,9 @@ struct FilterInfo {
     std::function<bool(const Command& command)> isCommand;
     // The values of a command of this filter, in parameter order (the caller checks isCommand first).
     std::function<std::vector<ParameterValue>(const Command& command)> readCommand;
+    // Values worth rendering besides the parameter table's corners and defaults (a filter's kSamples), in
+    // parameter order; used by the conformance tests.
+    std::vector<std::vector<ParameterValue>> samples;
 };
 
 // Every filter of the library, in a fixed order. Built on first use, not at load.

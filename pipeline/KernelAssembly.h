@@ -68,7 +68,7 @@ std::optional<Raster::HardwareKernelDescriptor> DescribeKernel(Raster::HardwareK
     d[HardwareKernelFragment::ReadMask] = StageText<typename Stages::Mask>::Get(language);
     d[HardwareKernelFragment::Process] = StageText<typename Stages::Process>::Get(language);
     d[HardwareKernelFragment::Transform] = GetTransformStageText<typename Stages::Transform>(language);
-    d[HardwareKernelFragment::Sample] = StageText<typename Stages::Sampler>::Get(language);
+    d[HardwareKernelFragment::Sample] = GetSampleStageText<typename Stages::Sampler>(language, shape.source);
     d[HardwareKernelFragment::Blend] = Raster::NormalBlend::GetHardwareFragment(language);
     d[HardwareKernelFragment::Extend] = Stages::Extend::GetHardwareFragment(language);
     d[HardwareKernelFragment::Filter] = GetFilterText(shape.dest, shape.channelMasked, language);

@@ -123,6 +123,16 @@ struct StageText<Raster::ChainedMask<Left, Right>> {
     static std::string Build(HardwareKernelLanguage language, const std::string& prefix, int level);
 };
 
+// Descriptor field 11: the Sample stage; a sampler whose text depends on the source format has
+// StageText<Sampler>::Get(language, format).
+template <class Sampler>
+const char* GetSampleStageText(HardwareKernelLanguage language, Raster::PixelFormat source) {
+    if constexpr (requires { StageText<Sampler>::Get(language, source); })
+        return StageText<Sampler>::Get(language, source);
+    else
+        return StageText<Sampler>::Get(language);
+}
+
 // Descriptor field 10: the Transform followed by the pixel-centre helpers that samplers call.
 template <class Transform>
 const char* GetTransformStageText(HardwareKernelLanguage language);

@@ -26,6 +26,15 @@ struct AddNoiseFilter {
     static constexpr ToolID kToolID = ToolID::AddNoise;
     static constexpr double kDragScale = 0.001953125; // 512 document units of drag give intensity 1
 
+    // Moderate noise of every kind, for the conformance tests (the table's corners are 0 and 100, which
+    // leave integer channels unchanged or saturated).
+    static constexpr std::array<Params, 4> kSamples{{
+        {0.3, false, true},
+        {0.3, true, true},
+        {0.3, false, false},
+        {0.3, true, false},
+    }};
+
     static constexpr std::array<Parameter<Params>, 3> kParameters{{
         {{.name = "intensity",
           .type = ParameterType::Double,

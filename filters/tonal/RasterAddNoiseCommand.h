@@ -2,11 +2,13 @@
 // The add-noise command: adds uniform or gaussian noise to colour channels, never to alpha.
 
 #include "filters/tonal/AddNoise.h"
+#include "filters/tonal/NoiseStages.h"
 #include "frame/FilterCommand.h"
+#include "pipeline/PipelineCommand.h"
 
 namespace RasterTools {
 
-class RasterAddNoiseCommand final : public FilterCommand<AddNoiseFilter> {
+class RasterAddNoiseCommand final : public FilterCommand<AddNoiseFilter>, public PipelineCommand {
 public:
     RasterAddNoiseCommand(bool liveEffect, double intensity, bool mono, bool gaussian);
     RasterAddNoiseCommand(bool liveEffect, const AddNoiseParameters& params);
@@ -21,6 +23,18 @@ public:
     // Noise reads and writes exactly the output pixel.
     void PrepareInputRectangle(Kernel::RectT<double>&) const override {}
     bool PrepareOutputRectangle(Kernel::RectT<double>&) const override { return true; }
+
+    // The sampler block for a raster of the given bounds (document units) seen through view (raster pixels
+    // to the view): the inverse of view as the sampler affine (a singular view gives the zero linear part
+    // and the negated translation), sigma, the bounds' width truncated, mono and gaussian.
+    NoiseSampler::Params GetSamplerParams(const Kernel::RectT<double>& bounds,
+                                          const Raster::AffineTransform::Params& view) const noexcept;
+
+    // Renders on the device or the processor, for every layer format (source and destination alike).
+    RenderPath Render(const RenderTarget& target) const override;
+    bool PrepareDevice(const RenderTarget& target) const override;
+    // The whole raster (cut to the selection) on the processor.
+    Kernel::RectT<int> DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const override;
 
     const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
     static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }

@@ -50,13 +50,20 @@ inline constexpr bool IsConstantSource = requires {
     m.value;
 };
 
-// Sampling of one span for every source model.
+// Sampling of one span for every source model. A sampler that has SampleSpan takes the whole span at once
+// (its own loop, e.g. vectorised across pixels); one whose Sample takes its Params gets them per pixel.
 template <class SourceModel, class Sampler, class Transform, class Extend, class Stored>
-inline void SampleSpan(const SourceModel& source, const PreparedTransform<Transform>& t, int x0, int y, int n,
+inline void SampleSpan(const SourceModel& source, const PreparedTransform<Transform>& t,
+                       const typename Sampler::Params& samplerParams, int x0, int y, int n,
                        Stored* out) noexcept {
     using namespace KernelMath;
     if constexpr (IsConstantSource<SourceModel>) {
         std::fill_n(out, n, source.value);
+    } else if constexpr (requires {
+                             Sampler::template SampleSpan<Transform, Extend>(source, t, samplerParams, x0, y,
+                                                                             n, out);
+                         }) {
+        Sampler::template SampleSpan<Transform, Extend>(source, t, samplerParams, x0, y, n, out);
     } else if constexpr (IsIdentityTransform<Transform> && requires { requires Sampler::IsNearest; }) {
         // The identity maps a pixel centre (x + 0.5, y + 0.5) back onto (x, y) exactly for any coordinate an
         // image can have, so the float round trip is skipped; a span inside the source is one row slice.
@@ -66,7 +73,15 @@ inline void SampleSpan(const SourceModel& source, const PreparedTransform<Transf
             for (int i = 0; i < n; ++i)
                 out[i] = Extend::Read(source, make_int2(x0 + i, y));
         }
+    } else if constexpr (requires {
+                             Sampler::template Sample<Transform, Extend>(source, make_int2(x0, y), t,
+                                                                         samplerParams);
+                         }) {
+        for (int i = 0; i < n; ++i)
+            out[i] =
+                Sampler::template Sample<Transform, Extend>(source, make_int2(x0 + i, y), t, samplerParams);
     } else {
+        (void)samplerParams;
         for (int i = 0; i < n; ++i)
             out[i] = Sampler::template Sample<Transform, Extend>(source, make_int2(x0 + i, y), t);
     }
@@ -107,7 +122,6 @@ bool ProcessBase<ProcessType>::ProcessTile(const SourceModel* source, DestModel*
     using DestStored = StoredPixel<DestFormat>;
     using Conversion = PixelConversion<SourceFormat, DestFormat>;
     constexpr bool SameFormat = SourceFormat == DestFormat;
-    (void)samplerParams; // the samplers so far read nothing beyond the source
 
     if (!dest || !*dest || !source) return false;
     if constexpr (!Detail::IsConstantSource<SourceModel>)
@@ -117,6 +131,9 @@ bool ProcessBase<ProcessType>::ProcessTile(const SourceModel* source, DestModel*
 
     const typename Transform::Params transformDefaults{};
     const auto transform = Transform::Prepare(transformParams ? *transformParams : transformDefaults);
+    // The sampler's block (the same floats as in a kernel's parameter array); defaults where none is given.
+    const typename Sampler::Params samplerDefaults{};
+    const typename Sampler::Params& samplerBlock = samplerParams ? samplerParams->block : samplerDefaults;
 
     using MaskImage = typename Detail::MaskImageOf<HasMaskImage, M1, M2, M3, M4, M5>::Type;
     [[maybe_unused]] MaskImage maskImage;
@@ -162,11 +179,11 @@ bool ProcessBase<ProcessType>::ProcessTile(const SourceModel* source, DestModel*
             sampled.count = converted.count = current.count = result.count = weights.count = n;
 
             if constexpr (SameFormat) {
-                Detail::SampleSpan<SourceModel, Sampler, Transform, Extend>(*source, transform, x0, y, n,
-                                                                            converted.pixels);
+                Detail::SampleSpan<SourceModel, Sampler, Transform, Extend>(*source, transform, samplerBlock,
+                                                                            x0, y, n, converted.pixels);
             } else {
-                Detail::SampleSpan<SourceModel, Sampler, Transform, Extend>(*source, transform, x0, y, n,
-                                                                            sampled.pixels);
+                Detail::SampleSpan<SourceModel, Sampler, Transform, Extend>(*source, transform, samplerBlock,
+                                                                            x0, y, n, sampled.pixels);
                 if constexpr (requires { Conversion::ConvertSpan(sampled.pixels, converted.pixels, n); }) {
                     Conversion::ConvertSpan(sampled.pixels, converted.pixels, n);
                 } else {

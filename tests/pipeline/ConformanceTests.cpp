@@ -25,7 +25,8 @@ struct Sample {
 };
 
 // Values that reach each parameter's corners: every value of a small integer range, the ends of other
-// ranges, the opposite of a boolean. One parameter moves at a time; the rest keep their defaults.
+// ranges, the opposite of a boolean. One parameter moves at a time; the rest keep their defaults. Then the
+// filter's own samples.
 std::vector<std::vector<ParameterValue>> SampleValues(const FilterInfo& filter) {
     std::vector<ParameterValue> defaults;
     for (const auto& spec : filter.parameters)
@@ -60,6 +61,8 @@ std::vector<std::vector<ParameterValue>> SampleValues(const FilterInfo& filter) 
             samples.push_back(sample);
         }
     }
+    for (const auto& sample : filter.samples)
+        samples.push_back(sample);
     return samples;
 }
 

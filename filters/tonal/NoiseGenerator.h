@@ -1,0 +1,134 @@
+#pragma once
+// The add-noise random generator and per-pixel seeding, written once: processor code expands it here and the
+// kernel text pastes the very same tokens (GetNoiseGeneratorText), so both paths draw identical noise.
+//
+// The source is in the dialect of host/raster/KernelMath.h (OpenCL C, CUDA C++ and host C++ at once).
+// RT_NOISE_FUNCTION starts every function: `inline` at file level, `static` inside language 0's local
+// structure. params_address_space is the kernels' address space of the parameter array.
+
+#include "host/raster/KernelMath.h"
+
+#include <cstdint>
+
+// Hash seeds the generator; RandomGet (host fragments) is a linear congruential step returning 16 bits.
+// Uniform noise is one draw in [-sigma, sigma]; gaussian noise sums twelve draws (standard deviation
+// sigma / 6, always within +-sigma). The seed is the hash of the pixel's place under the sampler affine,
+// row-major with the raster's width, so that it does not depend on tiling.
+#define RT_NOISE_GENERATOR_SOURCE                                                                            \
+    enum { NoiseGaussianDraws = 12 };                                                                        \
+    RT_NOISE_FUNCTION uint Hash(uint a) {                                                                    \
+        a = (a ^ 61u) ^ (a >> 16);                                                                           \
+        a = a + (a << 3);                                                                                    \
+        a = a ^ (a >> 4);                                                                                    \
+        a = a * 0x27D4EB2Du;                                                                                 \
+        a = a ^ (a >> 15);                                                                                   \
+        return a;                                                                                            \
+    }                                                                                                        \
+    RT_NOISE_FUNCTION float GetRandom(uint* state) {                                                         \
+        return (float)RandomGet(state) / (float)RandomMax;                                                   \
+    }                                                                                                        \
+    RT_NOISE_FUNCTION float UniformFromRandom(float random, float sigma) {                                   \
+        return (sigma * (random - 0.5f)) * 2.0f;                                                             \
+    }                                                                                                        \
+    RT_NOISE_FUNCTION float GaussianFromSum(float sum, float sigma) {                                        \
+        return (sum - 6.0f) * 1.0f / 6.0f * sigma;                                                           \
+    }                                                                                                        \
+    RT_NOISE_FUNCTION float GetUniformNoise(float sigma, uint* state) {                                      \
+        return UniformFromRandom(GetRandom(state), sigma);                                                   \
+    }                                                                                                        \
+    RT_NOISE_FUNCTION float GetGaussianNoise(float sigma, uint* state) {                                     \
+        float sum = 0.0f;                                                                                    \
+        for (int i = 0; i < NoiseGaussianDraws; ++i)                                                         \
+            sum += GetRandom(state);                                                                         \
+        return GaussianFromSum(sum, sigma);                                                                  \
+    }                                                                                                        \
+    RT_NOISE_FUNCTION float GetNoise(bool gaussian, float sigma, uint* state) {                              \
+        return gaussian ? GetGaussianNoise(sigma, state) : GetUniformNoise(sigma, state);                    \
+    }                                                                                                        \
+    RT_NOISE_FUNCTION float2 SamplerAffine(float2 location, params_address_space float* sampler_params) {    \
+        return float2_literal(                                                                               \
+            location.x * sampler_params[0] + location.y * sampler_params[1] + sampler_params[2],             \
+            location.x * sampler_params[3] + location.y * sampler_params[4] + sampler_params[5]);            \
+    }                                                                                                        \
+    RT_NOISE_FUNCTION uint NoiseSeed(int2 at, params_address_space float* sampler_params) {                  \
+        const int2 seedAt = convert_int2(floor(SamplerAffine(convert_float2(at) + 0.5f, sampler_params)));   \
+        return Hash((uint)seedAt.y * (uint)(int)sampler_params[7] + (uint)seedAt.x);                         \
+    }                                                                                                        \
+    RT_NOISE_FUNCTION int NoiseToInteger(float sum, int maximum) {                                           \
+        return rt_clampi(rt_sat_int(sum), 0, maximum);                                                       \
+    }
+
+namespace RasterTools::NoiseGenerator {
+
+using namespace Raster::KernelMath;
+
+#define RT_NOISE_FUNCTION inline
+#define params_address_space const
+RT_NOISE_GENERATOR_SOURCE
+#undef params_address_space
+#undef RT_NOISE_FUNCTION
+
+// The sampler block's ten floats, by index.
+enum SamplerIndex : int {
+    AffineIndex = 0, // six: x' = x*p0 + y*p1 + p2, y' = x*p3 + y*p4 + p5
+    SigmaIndex = 6,
+    WidthIndex = 7,
+    MonoIndex = 8,
+    GaussianIndex = 9,
+    SamplerFloatCount = 10,
+};
+
+// The names the generator text defines, which language 1 keeps apart from other fragments' by renaming.
+inline constexpr const char* DefinedNames[] = {"NoiseGaussianDraws", "Hash",
+                                               "GetRandom",          "UniformFromRandom",
+                                               "GaussianFromSum",    "GetUniformNoise",
+                                               "GetGaussianNoise",   "GetNoise",
+                                               "SamplerAffine",      "NoiseSeed",
+                                               "NoiseToInteger"};
+
+// The generator source as kernel text (one line; RT_NOISE_FUNCTION and params_address_space left for the
+// including text to define).
+const char* GetNoiseGeneratorText();
+
+// ---- Span kernels: the same numbers for 32 pixels at a time, written so that the compiler vectorises
+// across pixels. Bit-identical to the functions above (see the tests).
+
+inline constexpr int SpanPixels = 32;
+
+// The seeds of pixels (x0 + i, y), i < 32, whose integer source location is their own (the identity
+// transform stage).
+void SpanSeeds(int x0, int y, const float* samplerParams, std::uint32_t* seeds) noexcept;
+
+// The noise of `channels` channels for 32 seeds, as GetNoise draws it channel after channel from each seed:
+// noise[c][i] for pixel i. channels is 1 to 4.
+using SpanChannelNoise = float[SpanPixels];
+void SpanNoise(const std::uint32_t* seeds, int channels, bool gaussian, float sigma,
+               SpanChannelNoise* noise) noexcept;
+
+// Adds the noise of each colour channel c (noise[c][i], already drawn) to n interleaved pixels of `channels`
+// components, alpha last and untouched (its row of noise is read but not used): integer components truncate
+// and clamp as NoiseToInteger does, float components keep the sum. channels is 2, 4 or 5.
+void SpanAddNoise(std::uint8_t* components, int channels, const SpanChannelNoise* noise, int n) noexcept;
+void SpanAddNoise(std::uint16_t* components, int channels, const SpanChannelNoise* noise, int n) noexcept;
+void SpanAddNoise(float* components, int channels, const SpanChannelNoise* noise, int n) noexcept;
+
+// GetRandom's value for a 16-bit draw r, without a division. In binary r / 65535 is 0.rrrr... (r's 16 bits
+// repeating), so it is r·2^-16 + r·2^-32 + a tail below r·2^-47. The sum a + b' of r·2^-16 (exact) and
+// b' = r·(2^-32 + 2^-48) (one rounding, strictly above r·2^-32) rounds to the same float as the true
+// quotient: no midpoint lies between them. The tests check all 65536 draws.
+inline float RandomToUnit(uint draw) noexcept {
+    static_assert(RandomMax == 65535u, "the identity above is for 16-bit draws");
+    const float r = float(int(draw));
+    return r * 0x1p-16f + r * (0x1p-32f + 0x1p-48f);
+}
+
+// The generator state after k steps from state s is Multiplier(k) * s + Increment(k) (mod 2^32), derived from
+// RandomGet itself. k from 1 to MaxJump.
+inline constexpr int MaxJump = 5 * NoiseGaussianDraws;
+struct Jump {
+    std::uint32_t multiplier;
+    std::uint32_t increment;
+};
+const Jump* GetJumps() noexcept; // [MaxJump + 1], entry 0 the identity
+
+} // namespace RasterTools::NoiseGenerator

@@ -1,0 +1,144 @@
+// The add-noise Sample stage as kernel text, per source format and language: the generator text that the
+// processor compiles (NoiseGenerator.h), then the Sample stage that seeds, draws and adds.
+#include "filters/tonal/NoiseStages.h"
+
+#include "host/raster/KernelText.h"
+
+#include <array>
+#include <string>
+#include <vector>
+
+namespace RasterTools {
+
+namespace {
+
+using Language = HardwareKernelLanguage;
+using Raster::PixelFormat;
+
+// The call that draws one channel's noise.
+constexpr const char* NoiseCall = "GetNoise(sampler_params[9]!=0.0f,sampler_params[6],&random)";
+
+// %1 draws the colour branch's noise into n0, n1, ... (one per accumulator channel, in channel order: the
+// components of a literal are evaluated in no fixed order, so the draws are taken before it), %2 is their
+// list, %3 the mono list, %4 the stores of the colour channels.
+constexpr const char* SampleBody =
+    R"(const int2 coords = TransformPixelCenterToInt(location,transform_params);
+const source_type pixel = Extend(coords,source_bounds,input_pixels,source_params);
+// MapPixelCenter! The sampler affine maps the pixel centre here (+0.5, then a floor), with the processor's
+// arithmetic, so that both paths seed every pixel alike.
+uint random = NoiseSeed(coords,sampler_params);
+source_accumulator_type noise;
+if (sampler_params[8]!=0.0f)
+{
+    const float n = GetNoise(sampler_params[9]!=0.0f,sampler_params[6],&random);
+    noise = source_accumulator_literal(%3);
+}
+else
+{
+%1    noise = source_accumulator_literal(%2);
+}
+source_accumulator_type acc = accumulator_from_source(pixel) + noise*source_channel_maximum();
+source_type result = pixel;
+%4(void)sampler_bounds;
+(void)sampler_pixels;
+return result;)";
+
+struct NoiseFormat {
+    int channels;                 // accumulator channels, alpha last
+    const char* component;        // stored type of a component; null for float
+    const char* maximum;          // as an integer literal
+    std::vector<const char*> out; // the colour channels of the result
+    std::vector<const char*> acc; // and the matching accumulator components
+};
+
+NoiseFormat Describe(PixelFormat format) {
+    switch (format) {
+    case PixelFormat::RGBA8:
+        return {4, "uchar", "255", {"x", "y", "z"}, {"x", "y", "z"}};
+    case PixelFormat::RGBA16:
+    case PixelFormat::LabA16:
+        return {4, "ushort", "65535", {"x", "y", "z"}, {"x", "y", "z"}};
+    case PixelFormat::RGBAUF:
+        return {4, nullptr, nullptr, {"x", "y", "z"}, {"x", "y", "z"}};
+    case PixelFormat::IA8:
+        return {2, "uchar", "255", {"x"}, {"x"}};
+    case PixelFormat::IA16:
+        return {2, "ushort", "65535", {"x"}, {"x"}};
+    case PixelFormat::CMYKA8:
+        return {5, "uchar", "255", {"cmyk[0]", "cmyk[1]", "cmyk[2]", "cmyk[3]"}, {"s0", "s1", "s2", "s3"}};
+    default:
+        return {0, nullptr, nullptr, {}, {}};
+    }
+}
+
+std::string BuildBody(PixelFormat format) {
+    const NoiseFormat f = Describe(format);
+    if (f.channels == 0) return {};
+    std::string draws, list, mono, stores;
+    for (int c = 0; c < f.channels; ++c) {
+        const std::string name = "n" + std::to_string(c);
+        draws += "    const float " + name + " = " + NoiseCall + ";\n";
+        list += (c ? "," : "") + name;
+        mono += c ? ",n" : "n";
+    }
+    if (!f.component) stores += "source_clamp_accumulator(acc);\n"; // the float format's own clamp rule
+    for (std::size_t c = 0; c < f.out.size(); ++c) {
+        const std::string value = std::string("acc.") + f.acc[c];
+        stores +=
+            std::string("result.") + f.out[c] + " = " +
+            (f.component ? std::string("(") + f.component + ")NoiseToInteger(" + value + "," + f.maximum + ")"
+                         : value) +
+            ";\n";
+    }
+    return Raster::FormatKernelText(SampleBody, {draws, list, mono, stores});
+}
+
+// The stage signature's parameters, as a call passes them on.
+constexpr const char* SampleArguments =
+    "location,source_bounds,input_pixels,source_params,transform_params,sampler_params,sampler_bounds,"
+    "sampler_pixels";
+
+std::string BuildText(PixelFormat format, Language language) {
+    const std::string body = BuildBody(format);
+    if (body.empty()) return {};
+    const std::string generator = NoiseGenerator::GetNoiseGeneratorText();
+    if (language == Language::CudaCpp) {
+        // Everything lives in a local structure: the generator as static members, then the stage itself.
+        std::string member(StageSignature::Sample);
+        member.replace(0, std::string_view("inline").size(), "static");
+        return MakeStage(StageSignature::Sample, "struct Noise\n{\n#define RT_NOISE_FUNCTION static\n" +
+                                                     generator + "\n#undef RT_NOISE_FUNCTION\n" +
+                                                     MakeStage(member, body) + "};\nreturn Noise::Sample(" +
+                                                     SampleArguments + ");");
+    }
+    if (language == Language::OpenCLC) {
+        // No scopes: the generator's names are redefined for this fragment and restored after it.
+        std::string text;
+        for (const char* name : NoiseGenerator::DefinedNames)
+            text += std::string("#pragma push_macro(\"") + name + "\")\n#undef " + name + "\n#define " +
+                    name + " AddNoise" + name + "\n";
+        text += "#define RT_NOISE_FUNCTION inline\n" + generator + "\n#undef RT_NOISE_FUNCTION\n";
+        text += MakeStage(StageSignature::Sample, body);
+        for (const char* name : NoiseGenerator::DefinedNames)
+            text += std::string("#undef ") + name + "\n#pragma pop_macro(\"" + name + "\")\n";
+        return text;
+    }
+    return {};
+}
+
+} // namespace
+
+const char* StageText<NoiseSampler>::Get(Language language, PixelFormat source) {
+    using Table = std::array<Raster::KernelTextPair, Raster::PixelFormatCount>;
+    static const Table table = [] {
+        return [&]<std::size_t... I>(std::index_sequence<I...>) {
+            return Table{Raster::KernelTextPair(
+                [](Language l) { return BuildText(static_cast<PixelFormat>(I), l); })...};
+        }
+        (std::make_index_sequence<Raster::PixelFormatCount>{});
+    }();
+    if (!Raster::IsValidPixelFormat(source)) return nullptr;
+    return table[static_cast<std::size_t>(source)].Get(language);
+}
+
+} // namespace RasterTools
