@@ -13,6 +13,29 @@ rm -f "$RASTERTOOLS_SETTINGS"
 "$bin" list | tee out/list.txt
 "$bin" play examples/lifecycle.play | tee out/lifecycle.txt
 
+# Filters on the sample photo, each through the pixel pipeline on the default device.
+photo=examples/coffee.png
+render() { # OUTPUT FILTER [--PARAM VALUE]...
+  local output=$1
+  shift
+  "$bin" apply "$@" "$photo" "out/$output"
+  echo "rendered out/$output"
+}
+render coffee-noise-gaussian.png addnoise --intensity 0.25 --gaussian true
+render coffee-noise-uniform.png addnoise --intensity 0.25 --gaussian false
+render coffee-noise-mono.png addnoise --intensity 0.25 --mono true
+render coffee-noise-rgba16.tif addnoise --intensity 0.25 --format rgba16
+
+# A document: the photo as a layer, noise applied to its pixels, then a live noise layer on top.
+doc=out/coffee.rtd
+"$bin" doc new "$photo" -o "$doc"
+"$bin" doc filter "$doc" addnoise --intensity 0.1 --mono true
+"$bin" doc filter "$doc" addnoise --intensity 0.2 --live
+"$bin" doc render "$doc" out/coffee-document.png
+"$bin" doc show "$doc" | tee out/coffee-document.txt
+
 echo
 echo "demo: the tool and command list is in out/list.txt, the tool session in out/lifecycle.txt,"
-echo "      the settings it committed in out/settings.json and the document it saved in out/lifecycle.rtd"
+echo "      the settings it committed in out/settings.json and the document it saved in out/lifecycle.rtd;"
+echo "      the sample photo with each filter in out/coffee-*.png (and .tif), and a layered document with a"
+echo "      live filter layer in out/coffee.rtd, rendered to out/coffee-document.png (layers in out/coffee-document.txt)"
