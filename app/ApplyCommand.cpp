@@ -11,7 +11,9 @@
 #include "pipeline/RenderJob.h"
 
 #include <algorithm>
+#include <chrono>
 #include <cstring>
+#include <iomanip>
 #include <iostream>
 #include <optional>
 
@@ -185,7 +187,9 @@ int RunApply(const std::vector<std::string>& args) {
     job.channelMask = channelMask;
     ProgressBar progress(options.filter);
     job.progress = progress.Callback();
+    const auto started = std::chrono::steady_clock::now();
     const auto result = RasterTools::RenderImage(*pipeline, source, destination, mask, job);
+    const std::chrono::duration<double, std::milli> renderTime = std::chrono::steady_clock::now() - started;
     progress.Finish();
     if (!result.complete) throw Error(options.filter + ": " + result.error);
 
@@ -196,7 +200,8 @@ int RunApply(const std::vector<std::string>& args) {
               << Raster::GetPixelFormatName(source->GetFormat()) << " -> " << shape.width << "x"
               << shape.height << " " << Raster::GetPixelFormatName(shape.format) << "; " << result.deviceTiles
               << " tiles on " << (device.device ? device.device->GetIdentifier() : std::string("the device"))
-              << ", " << result.processorTiles << " on the processor\n";
+              << ", " << result.processorTiles << " on the processor; rendered in " << std::fixed
+              << std::setprecision(1) << renderTime.count() << " ms\n";
     return 0;
 }
 
