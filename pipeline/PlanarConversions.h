@@ -163,14 +163,38 @@ inline constexpr bool HasPlanarPair = requires {
     Planar<Dest>::FromWorking;
 };
 
+// Between the 8- and 16-bit forms of one layout the trip through working floats is integer arithmetic on
+// each component: widening gives v × 257, narrowing rounds v / 257 (never a tie, 257 being odd), and an
+// intensity's luminance of three equal channels comes back to the same value. The tests check every value.
+template <PixelFormat Source, PixelFormat Dest>
+inline constexpr bool IsWidening = (Source == PixelFormat::RGBA8 && Dest == PixelFormat::RGBA16) ||
+                                   (Source == PixelFormat::IA8 && Dest == PixelFormat::IA16);
+template <PixelFormat Source, PixelFormat Dest>
+inline constexpr bool IsNarrowing = IsWidening<Dest, Source>;
+
 // n (at most one span) pixels from Source to Dest through the working planes.
 template <PixelFormat Source, PixelFormat Dest>
 requires HasPlanarPair<Source, Dest>
 inline void ConvertSpan(const Raster::StoredPixel<Source>* in, Raster::StoredPixel<Dest>* out,
                         int n) noexcept {
-    WorkingPlanes planes;
-    Planar<Source>::ToWorking(in, planes, n);
-    Planar<Dest>::FromWorking(planes, out, n);
+    constexpr int Components = Raster::GetChannelCount(Source);
+    if constexpr (IsWidening<Source, Dest>) {
+        const auto* from = reinterpret_cast<const uchar*>(in);
+        auto* to = reinterpret_cast<ushort*>(out);
+#pragma omp simd
+        for (int i = 0; i < n * Components; ++i)
+            to[i] = ushort(from[i] * 257u);
+    } else if constexpr (IsNarrowing<Source, Dest>) {
+        const auto* from = reinterpret_cast<const ushort*>(in);
+        auto* to = reinterpret_cast<uchar*>(out);
+#pragma omp simd
+        for (int i = 0; i < n * Components; ++i)
+            to[i] = uchar((from[i] * 255u + 32895u) >> 16); // (v + 128) / 257 without a division
+    } else {
+        WorkingPlanes planes;
+        Planar<Source>::ToWorking(in, planes, n);
+        Planar<Dest>::FromWorking(planes, out, n);
+    }
 }
 
 } // namespace RasterTools::PlanarConvert

@@ -99,6 +99,42 @@ TEST(PlanarConversions, EqualThePerPixelBodiesForEveryPair) {
 #undef RT_TO_ALL
 }
 
+// The integer forms of the 8 <-> 16-bit conversions against the bodies for every component value, in every
+// channel (alpha included).
+template <PixelFormat Source, PixelFormat Dest>
+void ExpectEveryValueMatchesBodies() {
+    using Conversion = Raster::PixelConversion<Source, Dest>;
+    using Component = Raster::FormatComponent<Source>;
+    constexpr int Components = Raster::GetChannelCount(Source);
+    constexpr int Values = int(std::numeric_limits<Component>::max()) + 1;
+    StoredPixel<Source> in[Raster::SpanLength];
+    StoredPixel<Dest> span[Raster::SpanLength];
+    for (int first = 0; first < Values; first += Raster::SpanLength) {
+        for (int i = 0; i < Raster::SpanLength; ++i) {
+            Component components[Components];
+            for (int c = 0; c < Components; ++c) // each channel sees every value, shifted by its index
+                components[c] = Component((first + i + c * 7) % Values);
+            std::memcpy(&in[i], components, sizeof components);
+        }
+        Conversion::ConvertSpan(in, span, Raster::SpanLength);
+        for (int i = 0; i < Raster::SpanLength; ++i) {
+            const StoredPixel<Dest> single = Conversion::Convert(in[i]);
+            ASSERT_EQ(std::memcmp(&span[i], &single, sizeof single), 0)
+                << Raster::GetPixelFormatName(Source) << " -> " << Raster::GetPixelFormatName(Dest)
+                << ", value " << first + i;
+        }
+    }
+}
+
+TEST(PlanarConversions, IntegerWideningAndNarrowingEqualTheBodiesForEveryValue) {
+    static_assert(RasterTools::PlanarConvert::IsWidening<PixelFormat::RGBA8, PixelFormat::RGBA16>);
+    static_assert(RasterTools::PlanarConvert::IsNarrowing<PixelFormat::IA16, PixelFormat::IA8>);
+    ExpectEveryValueMatchesBodies<PixelFormat::RGBA8, PixelFormat::RGBA16>();
+    ExpectEveryValueMatchesBodies<PixelFormat::RGBA16, PixelFormat::RGBA8>();
+    ExpectEveryValueMatchesBodies<PixelFormat::IA8, PixelFormat::IA16>();
+    ExpectEveryValueMatchesBodies<PixelFormat::IA16, PixelFormat::IA8>();
+}
+
 // Lab goes through the colour manager a pixel at a time and has no planar form; the pairs with it keep
 // their per-pixel conversion.
 static_assert(!RasterTools::PlanarConvert::HasPlanarPair<PixelFormat::RGBA8, PixelFormat::LabA16>);
