@@ -48,6 +48,23 @@ void CompositeLayer(const RasterNode& layer, Raster::DynamicBuffer& canvas, Kern
     }
 }
 
+// One tile of pixels between the working canvas and a buffer of a layer format, either way.
+void ConvertTile(const Raster::DynamicBuffer& from, Raster::DynamicBuffer& to,
+                 const Kernel::RectT<int>& tile) {
+    const bool toWorking = to.GetFormat() == kWorking;
+    const Raster::PixelFormat other = toWorking ? from.GetFormat() : to.GetFormat();
+    const std::size_t bpp = std::size_t(Raster::GetBytesPerPixel(other));
+    const std::size_t workingOffset = std::size_t(tile.left) * 4, otherOffset = std::size_t(tile.left) * bpp;
+    for (int y = tile.top; y < tile.bottom; ++y) {
+        if (toWorking)
+            WorkingPixels::ToWorking(other, from.RowBytes(y) + otherOffset, to.Row<float>(y) + workingOffset,
+                                     tile.Width());
+        else
+            WorkingPixels::FromWorking(other, from.Row<float>(y) + workingOffset,
+                                       to.RowBytes(y) + otherOffset, tile.Width());
+    }
+}
+
 } // namespace
 
 void CompositeOver(const float* source, float* dest) noexcept {
@@ -134,19 +151,33 @@ FlattenResult FlattenDocument(const Document& document, const FlattenOptions& op
                     ") cannot render; skipped");
                 continue;
             }
-            auto destination = Raster::DynamicBuffer::Create(width, height, kWorking);
-            if (!destination) {
+            // The filter sees the composite in the document's format, as it would see a layer of it: integer
+            // formats get their own rounding and clamping, not the working floats'.
+            auto beneath = format == kWorking ? canvas : Raster::DynamicBuffer::Create(width, height, format);
+            auto destination = Raster::DynamicBuffer::Create(width, height, format);
+            if (!beneath || !destination) {
                 result.error = "not enough memory to render live filter layer \"" + node.GetName() + "\"";
                 return result;
             }
             const Kernel::RectT<double> bounds{0.0, 0.0, double(width), double(height)};
-            rendered = RenderStep(
-                area, options, double(i) / steps, 1.0 / steps, [&](const Kernel::RectT<int>& tile) {
-                    populator->PrepareSpanPopulator(canvas, 0, bounds, Raster::AffineTransform::Params{},
-                                                    tile, destination, abort);
-                    return !Kernel::IsAborted(options.abort);
-                });
-            canvas = std::move(destination);
+            // All of it first: the filter may read beyond the tile it renders.
+            const double share = beneath == canvas ? 0.0 : 0.5 / steps;
+            if (beneath != canvas)
+                rendered =
+                    RenderStep(area, options, double(i) / steps, share, [&](const Kernel::RectT<int>& tile) {
+                        ConvertTile(*canvas, *beneath, tile);
+                        return !Kernel::IsAborted(options.abort);
+                    });
+            rendered = rendered && RenderStep(area, options, double(i) / steps + share, 1.0 / steps - share,
+                                              [&](const Kernel::RectT<int>& tile) {
+                                                  populator->PrepareSpanPopulator(
+                                                      beneath, 0, bounds, Raster::AffineTransform::Params{},
+                                                      tile, destination, abort);
+                                                  if (format != kWorking)
+                                                      ConvertTile(*destination, *canvas, tile);
+                                                  return !Kernel::IsAborted(options.abort);
+                                              });
+            if (format == kWorking) canvas = std::move(destination);
         }
         if (!rendered || Kernel::IsAborted(options.abort)) {
             result.error = "the render was aborted";
@@ -162,15 +193,11 @@ FlattenResult FlattenDocument(const Document& document, const FlattenOptions& op
             result.error = "not enough memory for the rendered image";
             return result;
         }
-        const std::size_t bpp = std::size_t(Raster::GetBytesPerPixel(format));
-        const bool converted = RenderStep(
-            area, options, double(layers.size()) / steps, 1.0 / steps, [&](const Kernel::RectT<int>& tile) {
-                for (int y = tile.top; y < tile.bottom; ++y)
-                    WorkingPixels::FromWorking(format, canvas->Row<float>(y) + std::size_t(tile.left) * 4,
-                                               image->RowBytes(y) + std::size_t(tile.left) * bpp,
-                                               tile.Width());
-                return true;
-            });
+        const bool converted = RenderStep(area, options, double(layers.size()) / steps, 1.0 / steps,
+                                          [&](const Kernel::RectT<int>& tile) {
+                                              ConvertTile(*canvas, *image, tile);
+                                              return true;
+                                          });
         if (!converted) {
             result.error = "the render was aborted";
             return result;

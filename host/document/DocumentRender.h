@@ -31,7 +31,8 @@ Kernel::RectT<int> GetDocumentBounds(const Document& document);
 
 // Composites the layers in the working colour: raster layers with the normal "over" operator on straight
 // alpha; each live filter layer's command renders (through its span-populator face, in tiles) from the
-// composite beneath it and its result replaces that composite. A live layer whose command has no
+// composite beneath it, taken in the result's format as a layer of that format would be, and its result
+// replaces that composite. A live layer whose command has no
 // span-populator face is skipped with a warning.
 FlattenResult FlattenDocument(const Document& document, const FlattenOptions& options = {});
 

@@ -54,23 +54,39 @@ void InvertCommand::PrepareSpanPopulator(const Renderer::SpanPopulatorBitmapFill
                              abort);
 }
 
+namespace {
+
+template <class Component>
+void InvertRows(const Raster::DynamicBuffer& source, Raster::DynamicBuffer& destination,
+                Kernel::RectT<int> rect, Component maximum) {
+    for (int y = rect.top; y < rect.bottom; ++y)
+        for (int x = rect.left; x < rect.right; ++x) {
+            const Component* in = source.Row<Component>(y) + 4 * x;
+            Component* out = destination.Row<Component>(y) + 4 * x;
+            for (int c = 0; c < 3; ++c)
+                out[c] = Component(maximum - in[c]);
+            out[3] = in[3];
+        }
+}
+
+} // namespace
+
 void InvertCommand::PrepareSpanPopulator(Kernel::Counted<Raster::DynamicBuffer> source, int,
                                          Kernel::RectT<double>, Raster::AffineTransform::Params,
                                          Kernel::RectT<int> rect,
                                          Kernel::Counted<Raster::DynamicBuffer> destination,
                                          bool* abort) const {
-    if (Kernel::IsAborted(abort) || source->GetFormat() != Raster::PixelFormat::RGBAUF ||
-        destination->GetFormat() != Raster::PixelFormat::RGBAUF)
-        return;
-    for (int y = rect.top; y < rect.bottom; ++y)
-        for (int x = rect.left; x < rect.right; ++x) {
-            const float* in = source->Row<float>(y) + 4 * x;
-            float* out = destination->Row<float>(y) + 4 * x;
-            out[0] = 1.0f - in[0];
-            out[1] = 1.0f - in[1];
-            out[2] = 1.0f - in[2];
-            out[3] = in[3];
-        }
+    if (Kernel::IsAborted(abort) || source->GetFormat() != destination->GetFormat()) return;
+    switch (source->GetFormat()) {
+    case Raster::PixelFormat::RGBA8:
+        return InvertRows<std::uint8_t>(*source, *destination, rect, 255);
+    case Raster::PixelFormat::RGBA16:
+        return InvertRows<std::uint16_t>(*source, *destination, rect, 65535);
+    case Raster::PixelFormat::RGBAUF:
+        return InvertRows<float>(*source, *destination, rect, 1.0f);
+    default:
+        return; // other formats stay unfiltered, which the tests would notice
+    }
 }
 
 Kernel::Counted<Raster::DynamicBuffer> MakeNoiseImage(int width, int height, Raster::PixelFormat format,

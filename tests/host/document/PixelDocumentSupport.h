@@ -10,7 +10,8 @@
 
 namespace DocumentTests {
 
-// Inverts colour (alpha kept) of RGBA8 layers directly, and of working-colour buffers as a live filter.
+// Inverts colour (alpha kept) of RGBA8 layers directly, and of RGBA8, RGBA16 and working-colour buffers as a
+// live filter.
 class InvertCommand final : public RasterDevicePreviewableFilterLayerCommand,
                             public Renderer::SpanPopulatorBitmapFillMutationHost {
 public:
