@@ -7,6 +7,10 @@
 #include "host/raster/KernelMath.h"
 #include "host/raster/PixelTraits.h"
 
+#include <bit>
+#include <cstdint>
+#include <cstring>
+
 namespace RasterTools::PlanarConvert {
 
 using namespace Raster::KernelMath;
@@ -29,16 +33,19 @@ inline float Clamp01(float v) noexcept {
     const float low = v > 0.0f ? v : 0.0f;
     return low < 1.0f ? low : 1.0f;
 }
+// rt_round for v already within [0, maximum]: the fraction is exact there and halves go up.
+inline int RoundInRange(float v) noexcept {
+    const int truncated = static_cast<int>(v);
+    return truncated + static_cast<int>(v - static_cast<float>(truncated) >= 0.5f);
+}
 // rt_sat(rt_round(v)) for a maximum of 255 or 65535: clamping first gives the same value, since rounding is
-// monotonic and the bounds are whole; inside the bounds the fraction is exact and halves go up.
+// monotonic and the bounds are whole.
 inline int RoundSaturated(float v, float maximum) noexcept {
     const float low = v > 0.0f ? v : 0.0f;
-    const float c = low < maximum ? low : maximum;
-    const int truncated = static_cast<int>(c);
-    return truncated + static_cast<int>(c - static_cast<float>(truncated) >= 0.5f);
+    return RoundInRange(low < maximum ? low : maximum);
 }
 inline uchar ToByte(float v) noexcept { // convert_uchar(round(clamp(v, 0, 1) * 255))
-    return static_cast<uchar>(RoundSaturated(Clamp01(v) * 255.0f, 255.0f));
+    return static_cast<uchar>(RoundInRange(Clamp01(v) * 255.0f));
 }
 // rt_fmin for operands that are never NaN (stored inks, clamped colour).
 inline float Min(float a, float b) noexcept {
@@ -65,13 +72,27 @@ struct PlanarRGBA {
             w.a[i] = in[i].w / Max;
         }
     }
+    // The components are packed into 32-bit words (little-endian: the first component lowest), which the
+    // compiler stores whole instead of component by component.
     static void FromWorking(const WorkingPlanes& w, Pixel* out, int n) noexcept {
+        static_assert(std::endian::native == std::endian::little);
+        constexpr int Words = int(sizeof(Pixel) / sizeof(std::uint32_t));
+        constexpr int Shift = 32 / (4 / Words);
+        alignas(64) std::uint32_t words[SpanLength * Words];
 #pragma omp simd
-        for (int i = 0; i < n; ++i)
-            out[i] = {Component(RoundSaturated(Clamp01(w.r[i]) * Max, Max)),
-                      Component(RoundSaturated(Clamp01(w.g[i]) * Max, Max)),
-                      Component(RoundSaturated(Clamp01(w.b[i]) * Max, Max)),
-                      Component(RoundSaturated(Clamp01(w.a[i]) * Max, Max))};
+        for (int i = 0; i < n; ++i) {
+            const auto r = std::uint32_t(RoundInRange(Clamp01(w.r[i]) * Max));
+            const auto g = std::uint32_t(RoundInRange(Clamp01(w.g[i]) * Max));
+            const auto b = std::uint32_t(RoundInRange(Clamp01(w.b[i]) * Max));
+            const auto a = std::uint32_t(RoundInRange(Clamp01(w.a[i]) * Max));
+            if constexpr (Words == 1) {
+                words[i] = r | g << Shift | b << 2 * Shift | a << 3 * Shift;
+            } else {
+                words[2 * i] = r | g << Shift;
+                words[2 * i + 1] = b | a << Shift;
+            }
+        }
+        std::memcpy(out, words, std::size_t(n) * sizeof(Pixel));
     }
 };
 
