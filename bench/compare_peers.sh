@@ -17,6 +17,7 @@ runs=${RUNS:-3}
 work=${WORK:-${TMPDIR:-/tmp}/rastertools-peers}
 size=4096
 OPERATIONS=(noise-gaussian noise-uniform)
+OPERATIONS+=(motionblur-10 motionblur-50 motionblur-200)
 [ $# -gt 0 ] && OPERATIONS=("$@")
 
 # ---- Peers from Debian
@@ -43,6 +44,23 @@ if [ ! -s "$input" ]; then
     +channel -depth 8 -compress none "$input"
 fi
 
+# A vips matrix file: a line of taps through the centre of a (2R + 1)-square mask at 30 degrees. Prints its path.
+line_matrix() {
+  local r=$1 file=$work/line-$1.mat
+  if [ ! -s "$file" ]; then
+    awk -v r="$r" 'BEGIN {
+      n = 2 * r + 1; c = cos(3.14159265358979 / 6); s = sin(3.14159265358979 / 6); count = 0
+      for (y = 0; y < n; y++) for (x = 0; x < n; x++) {
+        dx = x - r; dy = y - r; along = dx * c + dy * s; across = -dx * s + dy * c
+        m[y, x] = (across > -0.5 && across <= 0.5 && along >= -r && along <= r) ? 1 : 0; count += m[y, x]
+      }
+      print n, n, count, 0
+      for (y = 0; y < n; y++) { line = ""; for (x = 0; x < n; x++) line = line m[y, x] " "; print line }
+    }' > "$file"
+  fi
+  echo "$file"
+}
+
 # ---- One command per tool and operation; "copy" is the tool's load-and-save baseline. Prints nothing when
 # the tool lacks the operation. $1 operation, $2 output, $3 threads.
 rastertools_command() {
@@ -51,6 +69,8 @@ rastertools_command() {
   copy) echo "$rastertools apply copy $common $input $2" ;;
   noise-gaussian) echo "$rastertools apply addnoise --intensity 0.3 --gaussian true $common $input $2" ;;
   noise-uniform) echo "$rastertools apply addnoise --intensity 0.3 --gaussian false $common $input $2" ;;
+  # Large tiles: each tile blurs its own rotated strip, and small tiles would repeat the radius's pad rows.
+  motionblur-*) echo "$rastertools apply motionblur --radius ${1#motionblur-} --radians 0.5235987755982988 --tile 2048 $common $input $2" ;;
   esac
 }
 imagemagick_command() {
@@ -59,6 +79,7 @@ imagemagick_command() {
   copy) echo "/usr/bin/convert $common $input -compress none $2" ;;
   noise-gaussian) echo "/usr/bin/convert $common $input -attenuate 1 +noise Gaussian -compress none $2" ;;
   noise-uniform) echo "/usr/bin/convert $common $input -attenuate 1 +noise Uniform -compress none $2" ;;
+  motionblur-*) echo "/usr/bin/convert $common $input -motion-blur 0x${1#motionblur-}+30 -compress none $2" ;;
   esac
 }
 vips_command() {
@@ -67,6 +88,8 @@ vips_command() {
   copy) echo "$env vips copy $input $2" ;;
   # No single noise operation: a gaussian image added to the input and cast back to 8 bits, in one pipeline.
   noise-gaussian) echo "$env sh -c 'vips gaussnoise $work/noise.v $size $size --sigma 25 && vips add $input $work/noise.v $work/sum.v && vips cast $work/sum.v $2 uchar'" ;;
+  # An integer convolution with a one-pixel line of 2R + 1 taps at 30 degrees.
+  motionblur-*) echo "$env vips conv $input $2 $(line_matrix "${1#motionblur-}") --precision integer" ;;
   esac
 }
 gegl_command() {
@@ -75,6 +98,7 @@ gegl_command() {
   copy) echo "$env gegl -i $input -o $2" ;;
   noise-gaussian) echo "$env gegl -i $input -o $2 -- gegl:noise-rgb gaussian=true" ;;
   noise-uniform) echo "$env gegl -i $input -o $2 -- gegl:noise-rgb gaussian=false" ;;
+  motionblur-*) echo "$env gegl -i $input -o $2 -- gegl:motion-blur-linear length=$((2 * ${1#motionblur-})) angle=30" ;;
   esac
 }
 tools=(rastertools imagemagick vips gegl)

@@ -1,5 +1,7 @@
 #include "filters/Catalogue.h"
 
+#include "filters/blur/MotionBlurTool.h"
+#include "filters/blur/RasterMotionBlurCommand.h"
 #include "filters/copy/RasterCopyCommand.h"
 #include "filters/tonal/DiffuseTool.h"
 #include "filters/tonal/NoiseTool.h"
@@ -64,6 +66,7 @@ const std::vector<FilterInfo>& GetFilterCatalogue() {
         Describe<DiffuseFilter>("DiffuseTool", "RasterDiffuseCommand"),
         Describe<UnsharpMaskFilter>("UnsharpMaskTool", "RasterUnsharpMaskCommand"),
         Describe<CopyFilter>("", "RasterCopyCommand"),
+        Describe<MotionBlurFilter>("MotionBlurTool", "RasterMotionBlurCommand"),
     };
     return catalogue;
 }

@@ -30,6 +30,9 @@ public:
     virtual RenderPath Render(const RenderTarget& target) const = 0;
     // Blocks until the kernel for target has compiled; true when the device can take it.
     virtual bool PrepareDevice(const RenderTarget& target) const = 0;
+    // False for a command without a device kernel: it renders every target on the processor, and agreement
+    // tests compare only its processor renders.
+    virtual bool HasDeviceKernel() const { return true; }
 
     // The host's two forms: render rect of the destination from the source, on the device that
     // Raster::Hardware::GetDevice() picks (RASTERTOOLS_DEVICE) or else on the processor.

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <vector>
 
 namespace RasterTools {
 
@@ -36,6 +37,61 @@ void RasterUnsharpMaskCommand::PrepareInputRectangle(Kernel::RectT<double>& rect
 bool RasterUnsharpMaskCommand::PrepareOutputRectangle(Kernel::RectT<double>& rect) const {
     rect = rect.Inflated(GetMargin());
     return true;
+}
+
+UnsharpMaskRender::Plan RasterUnsharpMaskCommand::MakePlan() const {
+    UnsharpMaskRender::Plan plan;
+    const int margin = GetMargin();
+    const double sigma = std::clamp(m_Params.radius, 0.0, 1e6) / 6.0;
+    plan.taps.assign(std::size_t(2 * margin + 1), 0.0f);
+    double total = 0.0;
+    std::vector<double> weights(plan.taps.size());
+    for (int k = -margin; k <= margin; ++k)
+        if (margin == 0)
+            total += weights[0] = 1.0;
+        else
+            total += weights[std::size_t(k + margin)] =
+                std::exp(-double(k) * double(k) / (2.0 * sigma * sigma));
+    for (std::size_t k = 0; k < weights.size(); ++k)
+        plan.taps[k] = float(weights[k] / total);
+    plan.factor = std::isfinite(m_Params.factor) ? float(m_Params.factor) : 0.0f;
+    plan.threshold = std::isfinite(m_Params.threshold) ? float(m_Params.threshold) : 0.0f;
+    return plan;
+}
+
+RenderPath RasterUnsharpMaskCommand::Render(const RenderTarget& target) const {
+    if (!target.source || !target.destination) return RenderPath::Failed;
+    const Raster::DynamicBuffer& source = *target.source.pixels;
+    const Raster::DynamicBuffer& destination = *target.destination.pixels;
+    const Raster::PixelFormat format = source.GetFormat();
+    if (destination.GetFormat() != format || !LayerFormatList::Contains(format)) return RenderPath::Failed;
+    if (source.GetWidth() != destination.GetWidth() || source.GetHeight() != destination.GetHeight())
+        return RenderPath::Failed;
+    if (target.mask && (target.mask.pixels->GetFormat() != Raster::PixelFormat::MaskA8 ||
+                        target.mask.pixels->GetWidth() < destination.GetWidth() ||
+                        target.mask.pixels->GetHeight() < destination.GetHeight()))
+        return RenderPath::Failed;
+    const Kernel::RectT<int> rect = target.rect.Intersect(destination.GetBounds());
+    if (rect.IsEmpty()) return RenderPath::Nothing;
+    if (Kernel::IsAborted(target.abort)) return RenderPath::Aborted;
+    // No kernel: the device's copies are brought to the host and the processor renders.
+    Detail::SetCompleted(target.completed);
+    if (const RenderPath ready = Detail::PrepareHostCopies(target, rect); ready != RenderPath::Processor)
+        return ready;
+    const UnsharpMaskRender::Plan plan = MakePlan();
+    RenderPath path = RenderPath::Failed;
+    LayerFormatList::Dispatch(format, [&](auto tag) {
+        path = UnsharpMaskRender::Run<decltype(tag)::value>(target, rect, plan);
+        return true;
+    });
+    if (path == RenderPath::Processor) Detail::MarkProcessorResult(target, rect);
+    return path;
+}
+
+Kernel::RectT<int>
+RasterUnsharpMaskCommand::DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const {
+    if (!raster) return {};
+    return RenderDirectly(*raster);
 }
 
 } // namespace RasterTools

@@ -2,11 +2,13 @@
 // The unsharp-mask command: adds back factor × (source − blur) where the difference passes the threshold.
 
 #include "filters/tonal/UnsharpMask.h"
+#include "filters/tonal/UnsharpMaskRender.h"
 #include "frame/FilterCommand.h"
+#include "pipeline/PipelineCommand.h"
 
 namespace RasterTools {
 
-class RasterUnsharpMaskCommand final : public FilterCommand<UnsharpMaskFilter> {
+class RasterUnsharpMaskCommand final : public FilterCommand<UnsharpMaskFilter>, public PipelineCommand {
 public:
     RasterUnsharpMaskCommand(bool liveEffect, double radius, double factor, double threshold);
     RasterUnsharpMaskCommand(bool liveEffect, const UnsharpMaskParameters& params);
@@ -20,6 +22,15 @@ public:
     void PrepareInputRectangle(Kernel::RectT<double>& rect) const override;
     bool PrepareOutputRectangle(Kernel::RectT<double>& rect) const override;
     int GetMargin() const noexcept;
+    // The Gaussian (standard deviation radius / 6, cut off at the margin), factor and threshold.
+    UnsharpMaskRender::Plan MakePlan() const;
+
+    // Renders on the processor for every layer format (source and destination of one format). There is no
+    // kernel yet: a target with a device renders on the processor alike, and PrepareDevice says false.
+    RenderPath Render(const RenderTarget& target) const override;
+    bool PrepareDevice(const RenderTarget&) const override { return false; }
+    bool HasDeviceKernel() const override { return false; }
+    Kernel::RectT<int> DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const override;
 
     const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
     static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }

@@ -1,0 +1,55 @@
+#pragma once
+// The motion blur's parameters, declared once for its tool and command.
+
+#include "frame/Parameters.h"
+#include "host/document/ToolID.h"
+
+namespace RasterTools {
+
+class MotionBlurTool;
+class RasterMotionBlurCommand;
+
+struct MotionBlurParameters {
+    double radius = 0.0;  // length of the smear on each side of a pixel, in document units
+    double radians = 0.0; // direction of the motion (0: along rows, pi/2: along columns)
+};
+
+struct MotionBlurFilter {
+    using Params = MotionBlurParameters;
+    using Tool = MotionBlurTool;
+    using Command = RasterMotionBlurCommand;
+
+    static constexpr std::string_view kName = "motionblur";
+    static constexpr std::string_view kDescription = "Motion Blur";
+    static constexpr std::string_view kHint = "|DRAG| to set radius and direction. |CLICK| to reset.";
+    static constexpr ToolID kToolID = ToolID::MotionBlur;
+    // The drag shows the motion: its length is the radius, its direction the angle.
+    static constexpr double kDragScale = 1.0;
+
+    static constexpr std::array<Parameter<Params>, 2> kParameters{{
+        {{.name = "radius",
+          .type = ParameterType::Double,
+          .code = Kernel::MakeFourCC("Radi"),
+          .reflected = Kernel::MakeFourCC("radi"),
+          .toolLabel = "Radius",
+          .commandLabel = "Radius",
+          .minimum = 0.0,
+          .maximum = 500.0,
+          .defaultValue = 0.0,
+          .unit = Kernel::UnitKind::Pixels},
+         &Params::radius},
+        {{.name = "radians",
+          .type = ParameterType::Double,
+          .code = Kernel::MakeFourCC("Angl"),
+          .reflected = Kernel::MakeFourCC("angl"),
+          .toolLabel = "Angle",
+          .commandLabel = "Angle",
+          .minimum = 0.0,
+          .maximum = 6.2832, // a whole turn, rounded up for display
+          .defaultValue = 0.0,
+          .unit = Kernel::UnitKind::Radians},
+         &Params::radians},
+    }};
+};
+
+} // namespace RasterTools
