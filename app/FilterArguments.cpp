@@ -85,7 +85,7 @@ ParseFilterParameters(const RasterTools::FilterInfo& filter,
         } else if (spec.type != RasterTools::ParameterType::Bool) {
             const double number = spec.type == RasterTools::ParameterType::Int ? double(std::get<int>(*value))
                                                                                : std::get<double>(*value);
-            if (number < spec.minimum || number > spec.maximum)
+            if (number < spec.minimum || (number > spec.maximum && !spec.openMaximum))
                 throw UsageError("--" + name + " must lie within " +
                                  RasterTools::FormatParameterValue(spec.minimum) + " .. " +
                                  RasterTools::FormatParameterValue(spec.maximum));

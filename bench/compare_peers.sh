@@ -16,7 +16,7 @@ rastertools=${RASTERTOOLS:-$root/build/release/app/rastertools}
 runs=${RUNS:-3}
 work=${WORK:-${TMPDIR:-/tmp}/rastertools-peers}
 size=4096
-OPERATIONS=(noise-gaussian noise-uniform)
+OPERATIONS=(noise-gaussian noise-uniform twirl-90 sphere-50)
 OPERATIONS+=(motionblur-10 motionblur-50 motionblur-200)
 [ $# -gt 0 ] && OPERATIONS=("$@")
 
@@ -71,6 +71,9 @@ rastertools_command() {
   noise-uniform) echo "$rastertools apply addnoise --intensity 0.3 --gaussian false $common $input $2" ;;
   # Large tiles: each tile blurs its own rotated strip, and small tiles would repeat the radius's pad rows.
   motionblur-*) echo "$rastertools apply motionblur --radius ${1#motionblur-} --radians 0.5235987755982988 --tile 2048 $common $input $2" ;;
+  # The whole image: a circle of half the side about the middle, as ImageMagick's swirl and implode take.
+  twirl-90) echo "$rastertools apply twirl --angle 90 --radius $((size / 2)) $common $input $2" ;;
+  sphere-50) echo "$rastertools apply sphere --intensity 50 --radius $((size / 2)) $common $input $2" ;;
   esac
 }
 imagemagick_command() {
@@ -80,6 +83,8 @@ imagemagick_command() {
   noise-gaussian) echo "/usr/bin/convert $common $input -attenuate 1 +noise Gaussian -compress none $2" ;;
   noise-uniform) echo "/usr/bin/convert $common $input -attenuate 1 +noise Uniform -compress none $2" ;;
   motionblur-*) echo "/usr/bin/convert $common $input -motion-blur 0x${1#motionblur-}+30 -compress none $2" ;;
+  twirl-90) echo "/usr/bin/convert $common $input -swirl 90 -compress none $2" ;;
+  sphere-50) echo "/usr/bin/convert $common $input -implode -0.5 -compress none $2" ;;
   esac
 }
 vips_command() {
@@ -99,6 +104,8 @@ gegl_command() {
   noise-gaussian) echo "$env gegl -i $input -o $2 -- gegl:noise-rgb gaussian=true" ;;
   noise-uniform) echo "$env gegl -i $input -o $2 -- gegl:noise-rgb gaussian=false" ;;
   motionblur-*) echo "$env gegl -i $input -o $2 -- gegl:motion-blur-linear length=$((2 * ${1#motionblur-})) angle=30" ;;
+  twirl-90) echo "$env gegl -i $input -o $2 -- gegl:whirl-pinch whirl=90 pinch=0 radius=1" ;;
+  sphere-50) echo "$env gegl -i $input -o $2 -- gegl:spherize amount=0.5" ;;
   esac
 }
 tools=(rastertools imagemagick vips gegl)

@@ -3,6 +3,10 @@
 #include "filters/blur/MotionBlurTool.h"
 #include "filters/blur/RasterMotionBlurCommand.h"
 #include "filters/copy/RasterCopyCommand.h"
+#include "filters/distort/RasterSphereCommand.h"
+#include "filters/distort/RasterTwirlCommand.h"
+#include "filters/distort/SphereTool.h"
+#include "filters/distort/TwirlTool.h"
 #include "filters/tonal/DiffuseTool.h"
 #include "filters/tonal/NoiseTool.h"
 #include "filters/tonal/RasterAddNoiseCommand.h"
@@ -67,6 +71,8 @@ const std::vector<FilterInfo>& GetFilterCatalogue() {
         Describe<UnsharpMaskFilter>("UnsharpMaskTool", "RasterUnsharpMaskCommand"),
         Describe<CopyFilter>("", "RasterCopyCommand"),
         Describe<MotionBlurFilter>("MotionBlurTool", "RasterMotionBlurCommand"),
+        Describe<TwirlFilter>("TwirlTool", "RasterTwirlCommand"),
+        Describe<SphereFilter>("SphereTool", "RasterSphereCommand"),
     };
     return catalogue;
 }

@@ -48,7 +48,8 @@ std::optional<ParameterValue> ParseParameterValue(ParameterType type, std::strin
 }
 
 std::string SettingsKey(std::string_view filterName, const ParameterSpec& spec) {
-    return "tools." + std::string(filterName) + "." + std::string(spec.name);
+    return "tools." + std::string(filterName) + "." +
+           std::string(spec.settingsName.empty() ? spec.name : spec.settingsName);
 }
 
 } // namespace RasterTools

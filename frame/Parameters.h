@@ -43,7 +43,10 @@ struct ParameterSpec {
     ParameterValue defaultValue{}; // value when the settings store has none, and after Reset
     std::string_view image{};      // tool panel icon, if any
     Kernel::UnitKind unit = Kernel::UnitKind::None;
-    bool persisted = true; // kept under "tools.<filter>.<name>"
+    bool persisted = true;           // kept under "tools.<filter>.<name>"
+    std::string_view settingsName{}; // the settings-key leaf when it differs from name
+    std::string_view labelContext{}; // the labels' localisation context; empty: "Reflected property"
+    bool openMaximum = false; // maximum ends the panel's range only; larger values are accepted
 };
 
 std::string SettingsKey(std::string_view filterName, const ParameterSpec& spec);

@@ -60,10 +60,12 @@ Kernel::ReflectedList ReflectParameters(Kernel::Counted<Kernel::Countable> owner
     for (const auto& parameter : table) {
         const ParameterSpec& spec = parameter.spec;
         Kernel::LocalisedString label(std::string(panel == Panel::Tool ? spec.toolLabel : spec.commandLabel),
-                                      "Reflected property");
+                                      spec.labelContext.empty() ? std::string("Reflected property")
+                                                                : std::string(spec.labelContext));
         Kernel::AttributeList attributes;
         if (panel == Panel::Tool && !spec.image.empty())
             attributes.emplace_back(new Kernel::ImageAttribute(std::string(spec.image)));
+        if (spec.openMaximum) attributes.emplace_back(new Kernel::NoHardLimitAttribute());
         if (spec.unit != Kernel::UnitKind::None)
             attributes.emplace_back(new Kernel::ValueTypeAttribute(spec.unit));
         std::visit(

@@ -213,9 +213,17 @@ struct BilinearSampler {
     static typename Image::Stored Sample(const Image& image, KernelMath::int2 location,
                                          const PreparedTransform<Transform>& t) noexcept {
         using namespace KernelMath;
-        using T = typename Image::Traits;
         float2 flocation = TransformPixelCenterToFloat<Transform>(location, t);
         flocation -= 0.5f;
+        return Interpolate<Extend>(image, flocation);
+    }
+
+    // The interpolated pixel at flocation, a transformed pixel centre less half a pixel: for samplers that
+    // transform a whole span first.
+    template <class Extend, class Image>
+    static typename Image::Stored Interpolate(const Image& image, KernelMath::float2 flocation) noexcept {
+        using namespace KernelMath;
+        using T = typename Image::Traits;
         // Truncation, then one less for negatives: a floor except at exact negative integers.
         int ix = rt_sat_int(flocation.x);
         if (flocation.x < 0.0f) ix -= 1;

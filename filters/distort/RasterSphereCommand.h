@@ -1,0 +1,31 @@
+#pragma once
+// The sphere command: bulges (positive intensity) or pinches (negative) the pixels of a circle, as if
+// seen through a lens; the rim stays in place.
+
+#include "filters/distort/DistortCommand.h"
+#include "filters/distort/Sphere.h"
+
+namespace RasterTools {
+
+class RasterSphereCommand final : public DistortCommand<SphereFilter, SphereTransform> {
+public:
+    RasterSphereCommand(bool liveEffect, double intensity, double radius, Kernel::PointT<double> centre);
+    RasterSphereCommand(bool liveEffect, const SphereParameters& params);
+
+    double GetIntensity() const noexcept { return m_Params.intensity; }
+
+    // The Transform stage's third float: intensity / 100.
+    static float StrengthOf(const SphereParameters& params) noexcept {
+        return float(params.intensity / 100.0);
+    }
+
+    const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
+    static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }
+
+private:
+    friend class FilterCommand<SphereFilter>; // creates the default-constructed command for loading
+    RasterSphereCommand() = default;
+    static const Kernel::ClassProperties ms_ClassProperties;
+};
+
+} // namespace RasterTools
