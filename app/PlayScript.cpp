@@ -210,7 +210,10 @@ private:
             if (!value) throw ScriptError("\"" + words[i] + "\" has a value that does not parse");
             values[index] = *value;
         }
-        m_Controller->EnqueueCommand(info->makeCommand(true, values), false);
+        auto command = info->makeCommand(true, values);
+        if (!dynamic_cast<const RasterDevicePreviewableFilterLayerCommand*>(command.Get()))
+            throw ScriptError(words[1] + " cannot be the filter of a live filter layer");
+        m_Controller->EnqueueCommand(std::move(command), false);
     }
 
     std::string DescribeParameters(const Command& command) const {

@@ -16,7 +16,7 @@ rastertools=${RASTERTOOLS:-$root/build/release/app/rastertools}
 runs=${RUNS:-3}
 work=${WORK:-${TMPDIR:-/tmp}/rastertools-peers}
 size=4096
-OPERATIONS=(noise-gaussian noise-uniform twirl-90 sphere-50)
+OPERATIONS=(noise-gaussian noise-uniform diffuse edge twirl-90 sphere-50)
 OPERATIONS+=(motionblur-10 motionblur-50 motionblur-200)
 [ $# -gt 0 ] && OPERATIONS=("$@")
 
@@ -61,6 +61,9 @@ line_matrix() {
   echo "$file"
 }
 
+# The libvips convolution matrix: width, height, scale, offset, then the rows.
+printf '3 3 1 0\n-1 0 1\n-2 0 2\n-1 0 1\n' > "$work/gradient.mat"
+
 # ---- One command per tool and operation; "copy" is the tool's load-and-save baseline. Prints nothing when
 # the tool lacks the operation. $1 operation, $2 output, $3 threads.
 rastertools_command() {
@@ -74,6 +77,9 @@ rastertools_command() {
   # The whole image: a circle of half the side about the middle, as ImageMagick's swirl and implode take.
   twirl-90) echo "$rastertools apply twirl --angle 90 --radius $((size / 2)) $common $input $2" ;;
   sphere-50) echo "$rastertools apply sphere --intensity 50 --radius $((size / 2)) $common $input $2" ;;
+  # Up to 512 × 0.01 = 5 pixels, as far as -spread 5.
+  diffuse) echo "$rastertools apply diffuse --intensity 0.01 $common $input $2" ;;
+  edge) echo "$rastertools apply verticaledgedetect $common $input $2" ;;
   esac
 }
 imagemagick_command() {
@@ -85,6 +91,8 @@ imagemagick_command() {
   motionblur-*) echo "/usr/bin/convert $common $input -motion-blur 0x${1#motionblur-}+30 -compress none $2" ;;
   twirl-90) echo "/usr/bin/convert $common $input -swirl 90 -compress none $2" ;;
   sphere-50) echo "/usr/bin/convert $common $input -implode -0.5 -compress none $2" ;;
+  diffuse) echo "/usr/bin/convert $common $input -spread 5 -compress none $2" ;;
+  edge) echo "/usr/bin/convert $common $input -morphology Convolve '3x3: -1,0,1 -2,0,2 -1,0,1' -compress none $2" ;;
   esac
 }
 vips_command() {
@@ -95,6 +103,8 @@ vips_command() {
   noise-gaussian) echo "$env sh -c 'vips gaussnoise $work/noise.v $size $size --sigma 25 && vips add $input $work/noise.v $work/sum.v && vips cast $work/sum.v $2 uchar'" ;;
   # An integer convolution with a one-pixel line of 2R + 1 taps at 30 degrees.
   motionblur-*) echo "$env vips conv $input $2 $(line_matrix "${1#motionblur-}") --precision integer" ;;
+  # The 3 × 3 horizontal gradient as an integer convolution (negative sums clip to 0 in 8 bits).
+  edge) echo "$env vips conv $input $2 $work/gradient.mat --precision integer" ;;
   esac
 }
 gegl_command() {
@@ -106,6 +116,7 @@ gegl_command() {
   motionblur-*) echo "$env gegl -i $input -o $2 -- gegl:motion-blur-linear length=$((2 * ${1#motionblur-})) angle=30" ;;
   twirl-90) echo "$env gegl -i $input -o $2 -- gegl:whirl-pinch whirl=90 pinch=0 radius=1" ;;
   sphere-50) echo "$env gegl -i $input -o $2 -- gegl:spherize amount=0.5" ;;
+  diffuse) echo "$env gegl -i $input -o $2 -- gegl:noise-spread amount-x=5 amount-y=5" ;;
   esac
 }
 tools=(rastertools imagemagick vips gegl)

@@ -12,6 +12,7 @@
 #include "filters/tonal/RasterAddNoiseCommand.h"
 #include "filters/tonal/RasterDiffuseCommand.h"
 #include "filters/tonal/RasterUnsharpMaskCommand.h"
+#include "filters/tonal/RasterVerticalEdgeDetectCommand.h"
 #include "filters/tonal/UnsharpMaskTool.h"
 
 #include <algorithm>
@@ -73,6 +74,7 @@ const std::vector<FilterInfo>& GetFilterCatalogue() {
         Describe<MotionBlurFilter>("MotionBlurTool", "RasterMotionBlurCommand"),
         Describe<TwirlFilter>("TwirlTool", "RasterTwirlCommand"),
         Describe<SphereFilter>("SphereTool", "RasterSphereCommand"),
+        Describe<VerticalEdgeDetectFilter>("", "RasterVerticalEdgeDetectCommand"),
     };
     return catalogue;
 }

@@ -189,6 +189,15 @@ template <int Channels>
             noise[c][i] = GaussianFromSum(sums[c][i], sigma);
 }
 
+RT_NOISE_CLONES void SpanUnitDraws(const std::uint32_t* seeds, int draws, SpanChannelNoise* values) noexcept {
+    const Jump* jumps = Jumps.data() + 1;
+    for (int k = 0; k < draws && k < MaxJump; ++k) {
+        const std::uint32_t multiplier = jumps[k].multiplier, increment = jumps[k].increment;
+        for (int i = 0; i < SpanPixels; ++i)
+            values[k][i] = RandomToUnit((seeds[i] * multiplier + increment) >> 16);
+    }
+}
+
 RT_NOISE_CLONES void SpanNoise(const std::uint32_t* seeds, int channels, bool gaussian, float sigma,
                                SpanChannelNoise* noise) noexcept {
     switch (channels) {

@@ -8,6 +8,7 @@
 
 #include "host/raster/KernelMath.h"
 
+#include <cmath>
 #include <cstdint>
 
 // Hash seeds the generator; RandomGet (host fragments) is a linear congruential step returning 16 bits.
@@ -78,6 +79,13 @@ enum SamplerIndex : int {
     SamplerFloatCount = 10,
 };
 
+// The sampler block's width entry for a raster's bounds: right minus left, truncated toward zero; 0 for
+// widths that no raster can have.
+inline float TruncatedWidth(double left, double right) noexcept {
+    const double width = std::trunc(right - left);
+    return std::isfinite(width) && std::fabs(width) < 2147483647.0 ? float(int(width)) : 0.0f;
+}
+
 // The names the generator text defines, which language 1 keeps apart from other fragments' by renaming.
 inline constexpr const char* DefinedNames[] = {"NoiseGaussianDraws", "Hash",
                                                "GetRandom",          "UniformFromRandom",
@@ -104,6 +112,10 @@ void SpanSeeds(int x0, int y, const float* samplerParams, std::uint32_t* seeds) 
 using SpanChannelNoise = float[SpanPixels];
 void SpanNoise(const std::uint32_t* seeds, int channels, bool gaussian, float sigma,
                SpanChannelNoise* noise) noexcept;
+
+// The first `draws` GetRandom values of each of 32 seeds: values[k][i] is draw k + 1 from seeds[i]. draws is
+// 1 to MaxJump.
+void SpanUnitDraws(const std::uint32_t* seeds, int draws, SpanChannelNoise* values) noexcept;
 
 // Adds the noise of each colour channel c (noise[c][i], already drawn) to n interleaved pixels of `channels`
 // components, alpha last and untouched (its row of noise is read but not used): integer components truncate

@@ -101,22 +101,29 @@ constexpr const char* SampleArguments =
 std::string BuildText(PixelFormat format, Language language) {
     const std::string body = BuildBody(format);
     if (body.empty()) return {};
+    return MakeGeneratorSampleStage(language, "AddNoise", body);
+}
+
+} // namespace
+
+std::string MakeGeneratorSampleStage(Language language, std::string_view scope, std::string_view body) {
     const std::string generator = NoiseGenerator::GetNoiseGeneratorText();
     if (language == Language::CudaCpp) {
         // Everything lives in a local structure: the generator as static members, then the stage itself.
         std::string member(StageSignature::Sample);
         member.replace(0, std::string_view("inline").size(), "static");
-        return MakeStage(StageSignature::Sample, "struct Noise\n{\n#define RT_NOISE_FUNCTION static\n" +
-                                                     generator + "\n#undef RT_NOISE_FUNCTION\n" +
-                                                     MakeStage(member, body) + "};\nreturn Noise::Sample(" +
-                                                     SampleArguments + ");");
+        const std::string name(scope);
+        return MakeStage(StageSignature::Sample,
+                         "struct " + name + "\n{\n#define RT_NOISE_FUNCTION static\n" + generator +
+                             "\n#undef RT_NOISE_FUNCTION\n" + MakeStage(member, body) + "};\nreturn " + name +
+                             "::Sample(" + SampleArguments + ");");
     }
     if (language == Language::OpenCLC) {
         // No scopes: the generator's names are redefined for this fragment and restored after it.
         std::string text;
         for (const char* name : NoiseGenerator::DefinedNames)
             text += std::string("#pragma push_macro(\"") + name + "\")\n#undef " + name + "\n#define " +
-                    name + " AddNoise" + name + "\n";
+                    name + " " + std::string(scope) + name + "\n";
         text += "#define RT_NOISE_FUNCTION inline\n" + generator + "\n#undef RT_NOISE_FUNCTION\n";
         text += MakeStage(StageSignature::Sample, body);
         for (const char* name : NoiseGenerator::DefinedNames)
@@ -125,8 +132,6 @@ std::string BuildText(PixelFormat format, Language language) {
     }
     return {};
 }
-
-} // namespace
 
 const char* StageText<NoiseSampler>::Get(Language language, PixelFormat source) {
     using Table = std::array<Raster::KernelTextPair, Raster::PixelFormatCount>;

@@ -7,6 +7,8 @@
 
 #include <algorithm>
 #include <cstring>
+#include <string>
+#include <string_view>
 
 namespace RasterTools {
 
@@ -116,6 +118,12 @@ template <>
 struct StageText<NoiseSampler> {
     static const char* Get(HardwareKernelLanguage language, Raster::PixelFormat source);
 };
+
+// A Sample stage whose body calls the generator (NoiseGenerator.h): language 0 keeps the generator in a local
+// structure named scope, language 1 renames its functions with scope as a prefix, so that several such
+// stages can share a kernel. Empty for another language.
+std::string MakeGeneratorSampleStage(HardwareKernelLanguage language, std::string_view scope,
+                                     std::string_view body);
 
 } // namespace RasterTools
 

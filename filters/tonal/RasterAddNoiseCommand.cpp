@@ -2,9 +2,7 @@
 
 #include "frame/Registration.h"
 
-#include <array>
 #include <cmath>
-#include <limits>
 
 namespace RasterTools {
 
@@ -18,9 +16,6 @@ const CommandRegistration<RasterAddNoiseCommand> kRegistration("RasterAddNoiseCo
 
 // Uniform noise is scaled down so that its spread is comparable to the gaussian's at equal intensity.
 constexpr double UniformSpread = 0.341;
-
-// Views whose determinant is this small in magnitude are singular.
-constexpr double SingularDeterminant = 1e-128;
 
 // Calls f with the stages for the target's format, with or without a mask; Failed for another format.
 template <class Function>
@@ -47,24 +42,12 @@ NoiseSampler::Params
 RasterAddNoiseCommand::GetSamplerParams(const Kernel::RectT<double>& bounds,
                                         const Raster::AffineTransform::Params& view) const noexcept {
     using namespace NoiseGenerator;
-    const auto& m = view.m;
-    std::array<double, 6> inverse{};
-    const double determinant = m[0] * m[4] - m[1] * m[3];
-    if (std::fabs(determinant) <= SingularDeterminant || !std::isfinite(determinant)) {
-        inverse = {0.0, 0.0, -m[2], 0.0, 0.0, -m[5]};
-    } else {
-        inverse = {m[4] / determinant,  -m[1] / determinant, (m[1] * m[5] - m[2] * m[4]) / determinant,
-                   -m[3] / determinant, m[0] / determinant,  (m[2] * m[3] - m[0] * m[5]) / determinant};
-    }
+    const auto inverse = Raster::AffineTransform::Invert(view).m;
     NoiseSampler::Params params;
     for (int i = 0; i < 6; ++i)
         params.block[AffineIndex + i] = float(inverse[std::size_t(i)]);
     params.block[SigmaIndex] = float((m_Params.gaussian ? 1.0 : UniformSpread) * m_Params.intensity);
-    // Truncated toward zero; widths beyond what an int holds cannot be rasters.
-    const double width = std::trunc(bounds.right - bounds.left);
-    params.block[WidthIndex] =
-        std::isfinite(width) && std::fabs(width) < double(std::numeric_limits<int>::max()) ? float(int(width))
-                                                                                           : 0.0f;
+    params.block[WidthIndex] = TruncatedWidth(bounds.left, bounds.right);
     params.block[MonoIndex] = m_Params.mono ? 1.0f : 0.0f;
     params.block[GaussianIndex] = m_Params.gaussian ? 1.0f : 0.0f;
     return params;

@@ -2,11 +2,13 @@
 // The diffuse command: replaces each pixel by a randomly chosen neighbour (frosted glass).
 
 #include "filters/tonal/Diffuse.h"
+#include "filters/tonal/DiffuseStages.h"
 #include "frame/FilterCommand.h"
+#include "pipeline/PipelineCommand.h"
 
 namespace RasterTools {
 
-class RasterDiffuseCommand final : public FilterCommand<DiffuseFilter> {
+class RasterDiffuseCommand final : public FilterCommand<DiffuseFilter>, public PipelineCommand {
 public:
     RasterDiffuseCommand(bool liveEffect, double intensity);
     RasterDiffuseCommand(bool liveEffect, const DiffuseParameters& params);
@@ -20,6 +22,18 @@ public:
     void PrepareInputRectangle(Kernel::RectT<double>& rect) const override;
     // The written area grows by the same distance, unrounded.
     bool PrepareOutputRectangle(Kernel::RectT<double>& rect) const override;
+
+    // The sampler block for a raster of the given bounds (document units) seen through view (raster pixels
+    // to the view): the inverse of view as the sampler affine (a singular view collapses, see
+    // Raster::AffineTransform::Invert), sigma = intensity × the view's scale, the bounds' width truncated.
+    DiffuseSampler::Params GetSamplerParams(const Kernel::RectT<double>& bounds,
+                                            const Raster::AffineTransform::Params& view) const noexcept;
+
+    // Renders on the device or the processor, for every layer format (source and destination alike).
+    RenderPath Render(const RenderTarget& target) const override;
+    bool PrepareDevice(const RenderTarget& target) const override;
+    // The whole raster (cut to the selection) on the processor.
+    Kernel::RectT<int> DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const override;
 
     const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
     static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }

@@ -39,11 +39,10 @@ Kernel::RectT<int> GetEffectArea(const MutableRasterInterface& raster) {
     if (!selection || selection->IsSelectNone()) return box;
 
     // Document pixels back to layer pixels through the inverse of the layer's transform.
-    const auto& m = raster.GetTransform().m;
-    const double det = m[0] * m[4] - m[1] * m[3];
-    if (std::abs(det) <= 1e-128) return {};
-    const double i0 = m[4] / det, i1 = -m[1] / det, i3 = -m[3] / det, i4 = m[0] / det;
-    const double i2 = -(i0 * m[2] + i1 * m[5]), i5 = -(i3 * m[2] + i4 * m[5]);
+    if (Raster::AffineTransform::IsSingular(raster.GetTransform())) return {};
+    const auto inverse = Raster::AffineTransform::Invert(raster.GetTransform()).m;
+    const double i0 = inverse[0], i1 = inverse[1], i2 = inverse[2];
+    const double i3 = inverse[3], i4 = inverse[4], i5 = inverse[5];
     const Kernel::RectT<double> spread = selection->GetSelectedSpreadBox();
     double left = 1e300, top = 1e300, right = -1e300, bottom = -1e300;
     for (const double x : {spread.left, spread.right})

@@ -4,6 +4,7 @@
 #include "host/raster/KernelMath.h"
 
 #include <array>
+#include <cmath>
 
 namespace Raster {
 
@@ -21,6 +22,30 @@ public:
                 out[i] = static_cast<float>(m[i]);
         }
     };
+
+    // Maps whose determinant is at most this in magnitude (or not finite) have no inverse.
+    static constexpr double SingularDeterminant = 1e-128;
+
+    static bool IsSingular(const Params& params) noexcept {
+        const auto& m = params.m;
+        const double determinant = m[0] * m[4] - m[1] * m[3];
+        return !(std::fabs(determinant) > SingularDeterminant) || !std::isfinite(determinant);
+    }
+
+    // The inverse map. A singular one collapses instead: the zero linear part with the negated translation,
+    // so that every location lands on one point rather than on infinities.
+    static Params Invert(const Params& params) noexcept {
+        const auto& m = params.m;
+        Params inverse;
+        if (IsSingular(params)) {
+            inverse.m = {0.0, 0.0, -m[2], 0.0, 0.0, -m[5]};
+            return inverse;
+        }
+        const double d = m[0] * m[4] - m[1] * m[3];
+        inverse.m = {m[4] / d,  -m[1] / d, (m[1] * m[5] - m[2] * m[4]) / d,
+                     -m[3] / d, m[0] / d,  (m[2] * m[3] - m[0] * m[5]) / d};
+        return inverse;
+    }
 
     // The floats a kernel reads, so that the processor computes with exactly the same values.
     struct Prepared {

@@ -96,11 +96,13 @@ TEST(CommandSerialisation, EveryFilterRoundTripsThroughTheClassRegistry) {
             ASSERT_TRUE(restored);
             EXPECT_EQ(restored->GetObjectClassProperties().GetClassCode(), info.classCode);
             EXPECT_EQ(info.readCommand(*restored), values);
+            // One-shot commands without a live form (vertical edge detect) ignore the flag and repeat.
             const auto* filter =
                 dynamic_cast<const RasterDevicePreviewableFilterLayerCommand*>(restored.Get());
-            ASSERT_NE(filter, nullptr);
-            EXPECT_EQ(filter->IsLiveEffect(), live);
-            EXPECT_EQ(restored->CanRepeat(), !live);
+            if (filter) {
+                EXPECT_EQ(filter->IsLiveEffect(), live);
+            }
+            EXPECT_EQ(restored->CanRepeat(), !filter || !live);
 
             const auto clone = Kernel::CountedCast<RasterCommand>(restored->Clone());
             ASSERT_TRUE(clone);

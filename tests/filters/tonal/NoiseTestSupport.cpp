@@ -4,11 +4,9 @@
 
 namespace NoiseTest {
 
-Kernel::Counted<Raster::DynamicBuffer> Render(const RasterTools::RasterAddNoiseCommand& command,
-                                              const Kernel::Counted<Raster::DynamicBuffer>& source,
-                                              int tileSize,
-                                              const Kernel::Counted<Raster::HardwareDevice>& device,
-                                              const View& view) {
+Kernel::Counted<Raster::DynamicBuffer>
+Render(const RasterTools::PipelineCommand& command, const Kernel::Counted<Raster::DynamicBuffer>& source,
+       int tileSize, const Kernel::Counted<Raster::HardwareDevice>& device, const View& view) {
     auto destination = PipelineTest::MakeDestination(command, *source);
     RasterTools::RenderJobOptions options;
     options.tileSize = tileSize;

@@ -1,6 +1,6 @@
 #pragma once
-// Shared by the add-noise tests: rendering a noise command over a whole image, on the processor or the
-// OpenCL device, in tiles, under a view.
+// Shared by the add-noise, diffuse and edge detect tests: rendering a pipeline command over a whole image,
+// on the processor or the OpenCL device, in tiles, under a view.
 
 #include "PipelineTestSupport.h"
 #include "filters/tonal/RasterAddNoiseCommand.h"
@@ -14,11 +14,9 @@ struct View {
 
 // The command's render of source into a fresh image of its format, in square tiles of tileSize (0: whole),
 // on device when given (every tile must then run there). Null when the render did not complete.
-Kernel::Counted<Raster::DynamicBuffer> Render(const RasterTools::RasterAddNoiseCommand& command,
-                                              const Kernel::Counted<Raster::DynamicBuffer>& source,
-                                              int tileSize,
-                                              const Kernel::Counted<Raster::HardwareDevice>& device = nullptr,
-                                              const View& view = {});
+Kernel::Counted<Raster::DynamicBuffer>
+Render(const RasterTools::PipelineCommand& command, const Kernel::Counted<Raster::DynamicBuffer>& source,
+       int tileSize, const Kernel::Counted<Raster::HardwareDevice>& device = nullptr, const View& view = {});
 
 inline Kernel::Counted<RasterTools::RasterAddNoiseCommand> MakeNoise(double intensity, bool mono,
                                                                      bool gaussian) {
