@@ -119,7 +119,8 @@ gegl_command() {
   diffuse) echo "$env gegl -i $input -o $2 -- gegl:noise-spread amount-x=5 amount-y=5" ;;
   esac
 }
-tools=(rastertools imagemagick vips gegl)
+# TOOLS (default all four) picks the tools, e.g. TOOLS="rastertools vips" to leave out the slowest.
+read -r -a tools <<<"${TOOLS:-rastertools imagemagick vips gegl}"
 
 # Best wall time of $runs runs, in seconds; empty when the command fails.
 best_time() {
