@@ -66,14 +66,15 @@ void Register() {
         new RasterTools::RasterTwirlCommand(false, 90.0, Side / 2.0, RasterTools::UnsetCentre));
     static const Kernel::Counted<RasterTools::RasterSphereCommand> sphere(
         new RasterTools::RasterSphereCommand(false, 50.0, Side / 2.0, RasterTools::UnsetCentre));
-    const std::pair<const char*, const RasterTools::PipelineCommand*> commands[] = {{"twirl/90", twirl.Get()},
-                                                                                   {"sphere/50", sphere.Get()}};
+    const std::pair<const char*, const RasterTools::PipelineCommand*> commands[] = {
+        {"twirl/90", twirl.Get()}, {"sphere/50", sphere.Get()}};
     const std::pair<Path, const char*> paths[] = {{Path::Processor1, "processor/threads:1"},
                                                   {Path::Processor2, "processor/threads:2"},
                                                   {Path::OpenCL, "opencl"}};
     for (const auto& [name, command] : commands)
         for (const auto& [path, label] : paths)
-            benchmark::RegisterBenchmark((std::string(name) + "/RGBA8/" + label).c_str(), Render, command, path)
+            benchmark::RegisterBenchmark((std::string(name) + "/RGBA8/" + label).c_str(), Render, command,
+                                         path)
                 ->Unit(benchmark::kMillisecond)
                 ->UseRealTime();
 }

@@ -46,7 +46,7 @@ struct ParameterSpec {
     bool persisted = true;           // kept under "tools.<filter>.<name>"
     std::string_view settingsName{}; // the settings-key leaf when it differs from name
     std::string_view labelContext{}; // the labels' localisation context; empty: "Reflected property"
-    bool openMaximum = false; // maximum ends the panel's range only; larger values are accepted
+    bool openMaximum = false;        // maximum ends the panel's range only; larger values are accepted
 };
 
 std::string SettingsKey(std::string_view filterName, const ParameterSpec& spec);
