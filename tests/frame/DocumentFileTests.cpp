@@ -126,8 +126,9 @@ TEST_F(DocumentFiles, HostileCountsWithAValidChecksumAreRefused) {
     std::memcpy(future.data() + 8, &version, 4);
     Reseal(future);
     Kernel::Counted<Document> loaded;
-    EXPECT_EQ(DocumentFile::Decode(future, loaded).value_or(""),
-              "document version 99 is from a newer rastertools and cannot be read (this program reads version 2)");
+    EXPECT_EQ(
+        DocumentFile::Decode(future, loaded).value_or(""),
+        "document version 99 is from a newer rastertools and cannot be read (this program reads version 2)");
 }
 
 TEST_F(DocumentFiles, AFailedLoadLeavesTheFileAndAFailedSaveLeavesTheOldFile) {
