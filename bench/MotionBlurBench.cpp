@@ -4,11 +4,9 @@
 //
 //   motion_blur_bench [--benchmark_filter=...]
 
+#include "bench/BenchSupport.h"
 #include "filters/blur/RasterMotionBlurCommand.h"
 #include "filters/tonal/RasterUnsharpMaskCommand.h"
-#include "pipeline/RenderJob.h"
-
-#include <benchmark/benchmark.h>
 
 #include <numbers>
 #include <string>
@@ -19,32 +17,9 @@ using Raster::PixelFormat;
 
 constexpr int Side = 4096;
 
-Kernel::Counted<Raster::DynamicBuffer> Image() {
-    auto image = Raster::DynamicBuffer::Create(Side, Side, PixelFormat::RGBA8);
-    std::uint32_t state = 12345;
-    for (int y = 0; y < Side; ++y) {
-        auto* row = reinterpret_cast<unsigned char*>(image->RowBytes(y));
-        for (std::size_t i = 0; i < image->GetRowBytes(); ++i)
-            row[i] = static_cast<unsigned char>((state = state * 1664525u + 1013904223u) >> 24);
-    }
-    return image;
-}
-
 void Render(benchmark::State& state, const RasterTools::PipelineCommand& command, int tile, int threads) {
-    static const auto source = Image();
-    auto destination = Raster::DynamicBuffer::Create(Side, Side, PixelFormat::RGBA8);
-    RasterTools::RenderJobOptions options;
-    options.tileSize = tile;
-    options.threads = threads;
-    for (auto _ : state) {
-        const auto result = RasterTools::RenderImage(command, source, destination, nullptr, options);
-        if (!result.complete) {
-            state.SkipWithError(result.error.c_str());
-            return;
-        }
-    }
-    state.counters["Mpx/s"] =
-        benchmark::Counter(double(state.iterations()) * Side * Side / 1e6, benchmark::Counter::kIsRate);
+    static const auto source = Bench::MakeImage(Side, PixelFormat::RGBA8);
+    Bench::RenderWhole(state, command, source, PixelFormat::RGBA8, {.tileSize = tile, .threads = threads});
 }
 
 void Register() {
@@ -80,10 +55,5 @@ void Register() {
 } // namespace
 
 int main(int argc, char** argv) {
-    Register();
-    benchmark::Initialize(&argc, argv);
-    if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
-    benchmark::RunSpecifiedBenchmarks();
-    benchmark::Shutdown();
-    return 0;
+    return Bench::Main(argc, argv, Register);
 }

@@ -6,10 +6,8 @@
 // Every render is a whole 4096 × 4096 image through RenderImage in 256-pixel tiles; device renders include
 // copying the source to the device and the result back.
 
+#include "bench/BenchSupport.h"
 #include "filters/tonal/RasterAddNoiseCommand.h"
-#include "pipeline/RenderJob.h"
-
-#include <benchmark/benchmark.h>
 
 #include <string>
 
@@ -20,64 +18,16 @@ using RasterTools::RasterAddNoiseCommand;
 
 constexpr int Side = 4096;
 
-Kernel::Counted<Raster::DynamicBuffer> Image(PixelFormat format) {
-    auto image = Raster::DynamicBuffer::Create(Side, Side, format);
-    std::uint32_t state = 12345;
-    for (int y = 0; y < Side; ++y) {
-        auto* row = reinterpret_cast<unsigned char*>(image->RowBytes(y));
-        if (Raster::IsFloatFormat(format)) {
-            auto* values = reinterpret_cast<float*>(row);
-            for (std::size_t i = 0; i < image->GetRowBytes() / 4; ++i)
-                values[i] = float((state = state * 1664525u + 1013904223u) >> 16) / 65535.0f;
-        } else {
-            for (std::size_t i = 0; i < image->GetRowBytes(); ++i)
-                row[i] = static_cast<unsigned char>((state = state * 1664525u + 1013904223u) >> 24);
-        }
-    }
-    return image;
-}
-
-enum class Path { Processor1, Processor2, OpenCL };
-
-void Render(benchmark::State& state, PixelFormat format, bool gaussian, bool mono, Path path) {
-    const auto source = Image(format);
-    auto destination = Raster::DynamicBuffer::Create(Side, Side, format);
+void Render(benchmark::State& state, PixelFormat format, bool gaussian, bool mono, Bench::Path path) {
     const RasterAddNoiseCommand command(false, 0.3, mono, gaussian);
-    RasterTools::RenderJobOptions options;
-    options.tileSize = 256;
-    options.threads = path == Path::Processor2 ? 2 : 1;
-    if (path == Path::OpenCL) {
-        options.device = Raster::Hardware::GetDevice("opencl");
-        if (!options.device) {
-            state.SkipWithError("no OpenCL device");
-            return;
-        }
-    }
-    long processorTiles = 0;
-    for (auto _ : state) {
-        const auto result = RasterTools::RenderImage(command, source, destination, nullptr, options);
-        if (!result.complete) {
-            state.SkipWithError(result.error.c_str());
-            return;
-        }
-        processorTiles += result.processorTiles;
-    }
-    if (path == Path::OpenCL && processorTiles > 0) state.SkipWithError("tiles fell back to the processor");
-    state.counters["Mpx/s"] =
-        benchmark::Counter(double(state.iterations()) * Side * Side / 1e6, benchmark::Counter::kIsRate);
+    Bench::RenderWhole(state, command, Bench::MakeImage(Side, format), format, Bench::SetupFor(path));
 }
 
 void Register() {
-    const PixelFormat layers[] = {PixelFormat::RGBA8, PixelFormat::RGBA16, PixelFormat::RGBAUF,
-                                  PixelFormat::IA8,   PixelFormat::IA16,   PixelFormat::CMYKA8,
-                                  PixelFormat::LabA16};
-    const std::pair<Path, const char*> paths[] = {{Path::Processor1, "processor/threads:1"},
-                                                  {Path::Processor2, "processor/threads:2"},
-                                                  {Path::OpenCL, "opencl"}};
-    for (PixelFormat format : layers)
+    for (PixelFormat format : Bench::LayerFormats)
         for (const bool gaussian : {true, false})
             for (const bool mono : {false, true})
-                for (const auto& [path, label] : paths) {
+                for (const auto& [path, label] : Bench::Paths) {
                     const std::string name = std::string("noise/") + (gaussian ? "gaussian/" : "uniform/") +
                                              (mono ? "mono/" : "colour/") +
                                              std::string(Raster::GetPixelFormatName(format)) + "/" + label;
@@ -90,10 +40,5 @@ void Register() {
 } // namespace
 
 int main(int argc, char** argv) {
-    Register();
-    benchmark::Initialize(&argc, argv);
-    if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
-    benchmark::RunSpecifiedBenchmarks();
-    benchmark::Shutdown();
-    return 0;
+    return Bench::Main(argc, argv, Register);
 }
