@@ -5,7 +5,7 @@
 
 #include "filters/copy/CopyStages.h"
 #include "host/raster/KernelText.h"
-#include "host/raster/device/CudaCompiler.h"
+#include "tests/pipeline/LanguageZeroCheck.h"
 
 using namespace PipelineTest;
 using namespace Raster::KernelMath;
@@ -159,14 +159,7 @@ TEST(KernelText, EveryLanguageZeroTextCompilesWithNvrtc) {
                      << Raster::DescribeNvrtc() << ")";
     using namespace RasterTools;
     const auto check = [](auto stages, const KernelShape& shape) {
-        using Stages = decltype(stages);
-        const auto descriptor = DescribeKernel<Stages>(Raster::HardwareKernelLanguage::CudaCpp, shape);
-        ASSERT_TRUE(descriptor);
-        const auto text = Raster::AssembleKernelSource(*descriptor, Raster::HardwareKernelLanguage::CudaCpp);
-        const auto ptx = Raster::CompileToPtx(text, descriptor->entryPoint);
-        EXPECT_TRUE(ptx.ptx) << Raster::GetPixelFormatName(shape.source) << " to "
-                             << Raster::GetPixelFormatName(shape.dest) << ":\n"
-                             << ptx.log;
+        PipelineTest::ExpectLanguageZeroCompiles<decltype(stages)>(shape);
     };
     for (PixelFormat source : RasterTools::LayerFormats)
         for (PixelFormat dest : RasterTools::LayerFormats)

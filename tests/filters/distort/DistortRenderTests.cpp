@@ -4,8 +4,8 @@
 
 #include "DistortTestSupport.h"
 
-#include "host/raster/device/CudaCompiler.h"
 #include "pipeline/Formats.h"
+#include "tests/pipeline/LanguageZeroCheck.h"
 
 #include <cmath>
 #include <numbers>
@@ -193,12 +193,7 @@ TEST(DistortKernelText, LanguageZeroCompilesWithNvrtcForEveryFormat) {
         GTEST_SKIP() << "NVRTC is not installed, so language-0 text cannot be compiled here ("
                      << Raster::DescribeNvrtc() << ")";
     const auto check = [](auto stages, const KernelShape& shape) {
-        using Stages = decltype(stages);
-        const auto descriptor = DescribeKernel<Stages>(Raster::HardwareKernelLanguage::CudaCpp, shape);
-        ASSERT_TRUE(descriptor);
-        const auto text = Raster::AssembleKernelSource(*descriptor, Raster::HardwareKernelLanguage::CudaCpp);
-        const auto ptx = Raster::CompileToPtx(text, descriptor->entryPoint);
-        EXPECT_TRUE(ptx.ptx) << Raster::GetPixelFormatName(shape.source) << ":\n" << ptx.log;
+        PipelineTest::ExpectLanguageZeroCompiles<decltype(stages)>(shape);
     };
     [&]<std::size_t... I>(std::index_sequence<I...>) {
         ((check(DistortStages::TwirlPlain<LayerFormatList::Values[I]>{},

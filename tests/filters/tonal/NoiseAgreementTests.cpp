@@ -3,8 +3,8 @@
 
 #include "NoiseTestSupport.h"
 
-#include "host/raster/device/CudaCompiler.h"
 #include "pipeline/Formats.h"
+#include "tests/pipeline/LanguageZeroCheck.h"
 
 #include <cmath>
 #include <cstring>
@@ -230,12 +230,7 @@ TEST(NoiseKernelText, LanguageZeroCompilesWithNvrtcForEveryFormat) {
                      << Raster::DescribeNvrtc() << ")";
     using namespace RasterTools;
     const auto check = [](auto stages, const KernelShape& shape) {
-        using Stages = decltype(stages);
-        const auto descriptor = DescribeKernel<Stages>(Raster::HardwareKernelLanguage::CudaCpp, shape);
-        ASSERT_TRUE(descriptor);
-        const auto text = Raster::AssembleKernelSource(*descriptor, Raster::HardwareKernelLanguage::CudaCpp);
-        const auto ptx = Raster::CompileToPtx(text, descriptor->entryPoint);
-        EXPECT_TRUE(ptx.ptx) << Raster::GetPixelFormatName(shape.source) << ":\n" << ptx.log;
+        PipelineTest::ExpectLanguageZeroCompiles<decltype(stages)>(shape);
     };
     [&]<std::size_t... I>(std::index_sequence<I...>) {
         ((check(NoiseStages::Plain<LayerFormatList::Values[I]>{},

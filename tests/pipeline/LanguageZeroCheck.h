@@ -1,0 +1,25 @@
+#pragma once
+// Compiling a pipeline's language-0 (CUDA C++) kernel text with NVRTC, as the pipeline and filter tests do.
+
+#include "host/raster/device/CudaCompiler.h"
+#include "pipeline/KernelAssembly.h"
+
+#include <gtest/gtest.h>
+
+namespace PipelineTest {
+
+// Expects the language-0 text that Stages assemble for shape to compile to PTX; a failure names the formats
+// and carries the compiler's log. Callers skip when NVRTC is missing (Raster::IsNvrtcAvailable).
+template <class Stages>
+void ExpectLanguageZeroCompiles(const RasterTools::KernelShape& shape) {
+    const auto descriptor =
+        RasterTools::DescribeKernel<Stages>(Raster::HardwareKernelLanguage::CudaCpp, shape);
+    ASSERT_TRUE(descriptor);
+    const auto text = Raster::AssembleKernelSource(*descriptor, Raster::HardwareKernelLanguage::CudaCpp);
+    const auto ptx = Raster::CompileToPtx(text, descriptor->entryPoint);
+    EXPECT_TRUE(ptx.ptx) << Raster::GetPixelFormatName(shape.source) << " to "
+                         << Raster::GetPixelFormatName(shape.dest) << ":\n"
+                         << ptx.log;
+}
+
+} // namespace PipelineTest
