@@ -57,6 +57,19 @@ TiledResult RenderTiled(const RasterTools::PipelineCommand& command, const Raste
 Kernel::Counted<Raster::DynamicBuffer> MakeDestination(const RasterTools::PipelineCommand& command,
                                                        const Raster::DynamicBuffer& source);
 
+// How a whole-image render sees its raster.
+struct View {
+    Kernel::RectT<double> bounds;              // empty: the image's own
+    Raster::AffineTransform::Params transform; // raster pixels to the view
+};
+
+// The command's render of source into a fresh image (MakeDestination) through the tile renderer, in square
+// tiles of tileSize (0: whole), on device when given (every tile must then run there). Null when the render
+// did not complete.
+Kernel::Counted<Raster::DynamicBuffer>
+Render(const RasterTools::PipelineCommand& command, const Kernel::Counted<Raster::DynamicBuffer>& source,
+       int tileSize, const Kernel::Counted<Raster::HardwareDevice>& device = nullptr, const View& view = {});
+
 } // namespace PipelineTest
 
 #define REQUIRE_OPENCL(name)                                                                                 \

@@ -1,6 +1,6 @@
 #pragma once
-// Shared by the twirl and sphere tests: commands, and whole-image renders on the processor or the OpenCL
-// device, in tiles, under a view.
+// Shared by the twirl and sphere tests: commands, and the pipeline tests' whole-image render on the processor
+// or the OpenCL device, in tiles, under a view.
 
 #include "PipelineTestSupport.h"
 #include "filters/distort/RasterSphereCommand.h"
@@ -8,16 +8,8 @@
 
 namespace DistortTest {
 
-struct View {
-    Kernel::RectT<double> bounds;              // empty: the image's own
-    Raster::AffineTransform::Params transform; // raster pixels to the view
-};
-
-// The command's render of source into a fresh image of its format, in square tiles of tileSize (0: whole),
-// on device when given (every tile must then run there). Null when the render did not complete.
-Kernel::Counted<Raster::DynamicBuffer>
-Render(const RasterTools::PipelineCommand& command, const Kernel::Counted<Raster::DynamicBuffer>& source,
-       int tileSize, const Kernel::Counted<Raster::HardwareDevice>& device = nullptr, const View& view = {});
+using PipelineTest::Render;
+using PipelineTest::View;
 
 inline Kernel::Counted<RasterTools::RasterTwirlCommand> MakeTwirl(double angle, double radius,
                                                                   Kernel::PointT<double> centre) {
