@@ -1,6 +1,7 @@
 #include "filters/tonal/RasterUnsharpMaskCommand.h"
 
 #include "frame/Registration.h"
+#include "pipeline/ProcessorOnlyRender.h"
 
 #include <algorithm>
 #include <cmath>
@@ -60,24 +61,11 @@ UnsharpMaskRender::Plan RasterUnsharpMaskCommand::MakePlan() const {
 }
 
 RenderPath RasterUnsharpMaskCommand::Render(const RenderTarget& target) const {
-    if (!target.source || !target.destination) return RenderPath::Failed;
-    const Raster::DynamicBuffer& source = *target.source.pixels;
-    const Raster::DynamicBuffer& destination = *target.destination.pixels;
-    const Raster::PixelFormat format = source.GetFormat();
-    if (destination.GetFormat() != format || !LayerFormatList::Contains(format)) return RenderPath::Failed;
-    if (source.GetWidth() != destination.GetWidth() || source.GetHeight() != destination.GetHeight())
-        return RenderPath::Failed;
-    if (target.mask && (target.mask.pixels->GetFormat() != Raster::PixelFormat::MaskA8 ||
-                        target.mask.pixels->GetWidth() < destination.GetWidth() ||
-                        target.mask.pixels->GetHeight() < destination.GetHeight()))
-        return RenderPath::Failed;
-    const Kernel::RectT<int> rect = target.rect.Intersect(destination.GetBounds());
-    if (rect.IsEmpty()) return RenderPath::Nothing;
-    if (Kernel::IsAborted(target.abort)) return RenderPath::Aborted;
-    // No kernel: the device's copies are brought to the host and the processor renders.
-    Detail::SetCompleted(target.completed);
-    if (const RenderPath ready = Detail::PrepareHostCopies(target, rect); ready != RenderPath::Processor)
+    Kernel::RectT<int> rect;
+    if (const RenderPath ready = BeginProcessorOnlyRender(target, rect); ready != RenderPath::Processor)
         return ready;
+    const Raster::DynamicBuffer& destination = *target.destination.pixels;
+    const Raster::PixelFormat format = destination.GetFormat();
     const UnsharpMaskRender::Plan plan = MakePlan();
     RenderPath path = RenderPath::Failed;
     LayerFormatList::Dispatch(format, [&](auto tag) {
