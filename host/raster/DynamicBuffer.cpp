@@ -1,9 +1,10 @@
 #include "host/raster/DynamicBuffer.h"
 
-#include <cstring>
+#include <sys/mman.h>
 
 #include <algorithm>
 #include <cstdlib>
+#include <cstring>
 #include <limits>
 #include <new>
 
@@ -20,6 +21,23 @@ std::uint64_t DynamicBuffer::ComputeStorageBytes(std::int64_t width, std::int64_
     return total <= MaxStorageBytes ? total : 0;
 }
 
+namespace {
+
+// Large blocks ask for transparent huge pages: a fresh 64 MB destination otherwise takes sixteen thousand
+// page faults on first write, which cost a fast filter a fifth of its time and serialise threads that fault
+// at once.
+void AdviseHugePages(void* block, std::size_t bytes) noexcept {
+    constexpr std::uintptr_t HugePage = std::uintptr_t(2) << 20;
+    if (bytes < 4 * HugePage) return;
+    const auto begin = reinterpret_cast<std::uintptr_t>(block);
+    const std::uintptr_t first = (begin + HugePage - 1) & ~(HugePage - 1);
+    const std::uintptr_t last = (begin + bytes) & ~(HugePage - 1);
+    // Advice only: a kernel without huge pages refuses it and the block works as before.
+    if (last > first) (void)madvise(reinterpret_cast<void*>(first), last - first, MADV_HUGEPAGE);
+}
+
+} // namespace
+
 DynamicBuffer::Storage DynamicBuffer::AllocateStorage(int width, int height, PixelFormat format) noexcept {
     Storage storage;
     const std::uint64_t total = ComputeStorageBytes(width, height, format);
@@ -28,6 +46,7 @@ DynamicBuffer::Storage DynamicBuffer::AllocateStorage(int width, int height, Pix
     // buffer costs nothing until it is written. The extra bytes let the start be moved to a 64-byte boundary.
     void* block = std::calloc(std::size_t(total) + RowAlignment, 1);
     if (!block) return storage;
+    AdviseHugePages(block, std::size_t(total) + RowAlignment);
     const auto address = reinterpret_cast<std::uintptr_t>(block);
     const std::uintptr_t aligned = (address + RowAlignment - 1) & ~std::uintptr_t(RowAlignment - 1);
     storage.block = block;
