@@ -237,6 +237,13 @@ public:
     }
 
     HardwareKernelLanguage GetLanguage() const noexcept override { return HardwareKernelLanguage::OpenCLC; }
+
+    // OpenCL lets a single-precision division or square root be off by a few units in the last place; a
+    // device that can round them exactly is asked to, so that its pixels match the processor's.
+    const char* BuildOptions() const {
+        const auto config = DeviceValue<cl_device_fp_config>(m_Device, CL_DEVICE_SINGLE_FP_CONFIG, 0);
+        return (config & CL_FP_CORRECTLY_ROUNDED_DIVIDE_SQRT) ? "-cl-fp32-correctly-rounded-divide-sqrt" : "";
+    }
     std::size_t GetMaxAllocationBytes() const noexcept override { return m_MaxAllocation; }
 
     CompileResult Compile(const std::string& source, const std::string& entryPoint) override {
@@ -253,7 +260,7 @@ public:
             result.log = "clCreateProgramWithSource: " + ErrorText(error);
             return result;
         }
-        error = clBuildProgram(program, 1, &m_Device, "", nullptr, nullptr);
+        error = clBuildProgram(program, 1, &m_Device, BuildOptions(), nullptr, nullptr);
         result.log = BuildLog(program);
         if (error != CL_SUCCESS) {
             result.log = "clBuildProgram: " + ErrorText(error) + "\n" + result.log;
