@@ -9,6 +9,7 @@
 #include <cmath>
 #include <cstdint>
 #include <cstring>
+#include <emmintrin.h>
 #include <type_traits>
 
 namespace RasterTools::Blur {
@@ -96,51 +97,117 @@ struct Layout {
     }
 };
 
-// Premultiplied bilinear sample of image at continuous index (x, y) (pixel i's centre is at i), clamped to
-// the image's edges. A sample exactly on a pixel centre copies that pixel, so quarter turns are exact.
+// The pixels a bilinear sample reads, by intermediate coordinates: RowGrid reads an image row by row;
+// LineGrid reads an image stored transposed, each of its rows holding one column (a line along the motion).
+// Both take coordinates in their own frame, where the image's first pixel is at (left, top): a sample's
+// fractions then come from that frame's coordinates, whatever part of it the image holds.
 template <Raster::PixelFormat F>
-inline void SampleBilinear(const Raster::DynamicBuffer& image, double x, double y,
-                           typename Layout<F>::T* out) noexcept {
+struct RowGrid {
+    using T = typename Layout<F>::T;
+    const Raster::DynamicBuffer& image;
+    int left = 0, top = 0;
+    int Width() const noexcept { return image.GetWidth(); }
+    int Height() const noexcept { return image.GetHeight(); }
+    const T* At(int x, int y) const noexcept {
+        return image.Row<T>(y - top) + std::size_t(x - left) * Layout<F>::N;
+    }
+};
+template <Raster::PixelFormat F>
+struct LineGrid {
+    using T = typename Layout<F>::T;
+    const Raster::DynamicBuffer& lines;
+    int left = 0, top = 0;
+    int count = 0; // lines in use, from the first row of lines
+    int Width() const noexcept { return count; }
+    int Height() const noexcept { return lines.GetWidth(); }
+    const T* At(int x, int y) const noexcept {
+        return lines.Row<T>(x - left) + std::size_t(y - top) * Layout<F>::N;
+    }
+};
+
+namespace Detail {
+
+// Four components with alpha last as floats, and back with the rounding of Layout::Store.
+template <class T>
+inline __m128 Load4(const T* p) noexcept {
+    if constexpr (std::is_same_v<T, float>) {
+        return _mm_loadu_ps(p);
+    } else if constexpr (sizeof(T) == 1) {
+        std::int32_t word;
+        std::memcpy(&word, p, sizeof word);
+        const __m128i zero = _mm_setzero_si128();
+        const __m128i bytes = _mm_cvtsi32_si128(word);
+        return _mm_cvtepi32_ps(_mm_unpacklo_epi16(_mm_unpacklo_epi8(bytes, zero), zero));
+    } else {
+        const __m128i words = _mm_loadl_epi64(reinterpret_cast<const __m128i*>(p));
+        return _mm_cvtepi32_ps(_mm_unpacklo_epi16(words, _mm_setzero_si128()));
+    }
+}
+
+template <class T>
+inline void Store4(__m128 v, T* out) noexcept {
+    if constexpr (std::is_same_v<T, float>) {
+        _mm_storeu_ps(out, v);
+    } else {
+        constexpr float Max = sizeof(T) == 1 ? 255.0f : 65535.0f;
+        v = _mm_add_ps(_mm_min_ps(_mm_max_ps(v, _mm_setzero_ps()), _mm_set1_ps(Max)), _mm_set1_ps(0.5f));
+        const __m128i whole = _mm_cvttps_epi32(v);
+        if constexpr (sizeof(T) == 1) {
+            const __m128i words = _mm_packs_epi32(whole, whole);
+            const std::int32_t word = _mm_cvtsi128_si32(_mm_packus_epi16(words, words));
+            std::memcpy(out, &word, sizeof word);
+        } else {
+            // Signed packing saturates at 32767: move the range down and flip the top bit back.
+            const __m128i shifted = _mm_sub_epi32(whole, _mm_set1_epi32(32768));
+            const __m128i words = _mm_xor_si128(_mm_packs_epi32(shifted, shifted), _mm_set1_epi16(-32768));
+            _mm_storel_epi64(reinterpret_cast<__m128i*>(out), words);
+        }
+    }
+}
+
+} // namespace Detail
+
+// Premultiplied bilinear sample of grid at continuous index (x, y) of its frame (pixel i's centre is at i),
+// clamped to the grid's edges. A sample exactly on a pixel centre copies that pixel, so quarter turns are
+// exact.
+template <Raster::PixelFormat F, class Grid>
+inline void SampleBilinear(const Grid& grid, double x, double y, typename Layout<F>::T* out) noexcept {
     using L = Layout<F>;
     using T = typename L::T;
-    const int w = image.GetWidth(), h = image.GetHeight();
-    x = std::clamp(x, 0.0, double(w - 1));
-    y = std::clamp(y, 0.0, double(h - 1));
-    const int x0 = int(x), y0 = int(y);
+    const int lastX = grid.left + grid.Width() - 1, lastY = grid.top + grid.Height() - 1;
+    x = std::clamp(x, double(grid.left), double(lastX));
+    y = std::clamp(y, double(grid.top), double(lastY));
+    const int x0 = int(std::floor(x)), y0 = int(std::floor(y));
     const float fx = float(x - x0), fy = float(y - y0);
-    const T* r0 = image.Row<T>(y0);
     if (fx == 0.0f && fy == 0.0f) {
-        std::copy_n(r0 + std::size_t(x0) * L::N, L::N, out);
+        std::copy_n(grid.At(x0, y0), L::N, out);
         return;
     }
-    const int x1 = std::min(x0 + 1, w - 1), y1 = std::min(y0 + 1, h - 1);
-    const T* r1 = image.Row<T>(y1);
-    const T* p[4] = {r0 + std::size_t(x0) * L::N, r0 + std::size_t(x1) * L::N, r1 + std::size_t(x0) * L::N,
-                     r1 + std::size_t(x1) * L::N};
+    const int x1 = std::min(x0 + 1, lastX), y1 = std::min(y0 + 1, lastY);
+    const T* p[4] = {grid.At(x0, y0), grid.At(x1, y0), grid.At(x0, y1), grid.At(x1, y1)};
     const float weight[4] = {(1.0f - fx) * (1.0f - fy), fx * (1.0f - fy), (1.0f - fx) * fy, fx * fy};
     if constexpr (L::N == 4 && L::A == 3) {
-        // The same arithmetic on all four components at once.
-        using V4 = float __attribute__((vector_size(16)));
-        V4 sum{};
+        // The same arithmetic as below on all four components at once, in the same order.
+        __m128 v[4], sum = _mm_setzero_ps();
         float alpha = 0.0f;
         for (int k = 0; k < 4; ++k) {
-            const V4 v{float(p[k][0]), float(p[k][1]), float(p[k][2]), float(p[k][3])};
-            const float a = v[3] * weight[k];
+            v[k] = Detail::Load4(p[k]);
+            const float a = float(p[k][3]) * weight[k];
             alpha += a;
-            sum += v * a;
+            sum = _mm_add_ps(sum, _mm_mul_ps(v[k], _mm_set1_ps(a)));
         }
-        const T alphaOut = L::Store(alpha);
+        const float alphaOut = alpha;
         if (!(std::fabs(alpha) >= 1e-20f)) {
-            sum = V4{};
+            sum = _mm_setzero_ps();
             for (int k = 0; k < 4; ++k)
-                sum += V4{float(p[k][0]), float(p[k][1]), float(p[k][2]), float(p[k][3])} * weight[k];
+                sum = _mm_add_ps(sum, _mm_mul_ps(v[k], _mm_set1_ps(weight[k])));
             alpha = 1.0f;
         }
-        sum *= 1.0f / alpha;
-        out[0] = L::Store(sum[0]);
-        out[1] = L::Store(sum[1]);
-        out[2] = L::Store(sum[2]);
-        out[3] = alphaOut;
+        sum = _mm_mul_ps(sum, _mm_set1_ps(1.0f / alpha));
+        // Alpha is the weighted sum itself, not divided.
+        const __m128 last = _mm_castsi128_ps(_mm_set_epi32(-1, 0, 0, 0));
+        sum = _mm_or_ps(_mm_and_ps(last, _mm_set1_ps(alphaOut)), _mm_andnot_ps(last, sum));
+        Detail::Store4(sum, out);
         return;
     }
     float alpha = 0.0f;

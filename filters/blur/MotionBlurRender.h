@@ -6,6 +6,8 @@
 #include "host/raster/PixelFormat.h"
 #include "pipeline/Pipeline.h"
 
+#include <vector>
+
 namespace RasterTools::MotionBlurRender {
 
 // Rotating by theta about a fixed pivot turns the motion onto the columns of an intermediate image, where
@@ -25,6 +27,15 @@ struct Plan {
 // 1e-6 so that edges that land on whole numbers stay there.
 Kernel::RectT<int> RotatedBounds(const Kernel::RectT<int>& rect, double cosine, double sine, double pivotX,
                                  double pivotY) noexcept;
+
+// The rows of the blurred intermediate image (rows of plan.box, from 0) that the resample out of rect reads
+// in each column of the box: [first, last), empty where it reads none. Worked out from the parallelogram
+// that rect's pixel centres turn into, with a row to spare on each side for rounding.
+struct RowRange {
+    int first = 0;
+    int last = 0;
+};
+std::vector<RowRange> NeededRows(const Kernel::RectT<int>& rect, const Plan& plan);
 
 // Renders rect of the target's destination (same format as its source). Processor, Aborted, or Failed when
 // the scratch buffers cannot be had.

@@ -8,8 +8,73 @@
 
 namespace RasterTools::MotionBlurRender {
 
-// Side of the blocks that the two resamples walk, in pixels.
-inline constexpr int Block = 64;
+// Lines of the intermediate image worked out at a time: a band's two scratch images stay in the caches, and
+// the resample out writes every destination pixel that the band's lines make.
+inline constexpr int Band = 32;
+// Lines resampled side by side, LineChunk rows at a time, so that neighbouring lines reuse the source rows
+// they cross.
+inline constexpr int LineGroup = 8;
+inline constexpr int LineChunk = 64;
+
+// Float sums round, so a running sum's value at a row would depend on where it began: float windows are
+// summed afresh at every multiple of this many intermediate rows, which makes each row's value the same in
+// every tiling. Integer sums are exact and need no restart.
+inline int RestartPeriod(int whole) noexcept {
+    return 64 * ((2 * whole + 1 + 63) / 64);
+}
+
+// Non-negative remainder of value by period.
+inline int FloorMod(int value, int period) noexcept {
+    const int r = value % period;
+    return r < 0 ? r + period : r;
+}
+
+// Which line of the box the resample out of a destination row starts its sample in, as a function of x: the
+// sampler's own arithmetic (clamp, floor), monotonic in x, so that a band's pixels in a row are one run.
+class LineOfPixel {
+public:
+    LineOfPixel(const Plan& plan, int y) noexcept
+        : m_Plan(plan)
+        , m_Base(plan.sine * (double(y) + 0.5 - plan.pivotY) + plan.pivotX - 0.5) {}
+
+    int operator()(int x) const noexcept {
+        const double at = m_Base + m_Plan.cosine * (double(x) + 0.5 - m_Plan.pivotX);
+        const double clamped = std::clamp(at, double(m_Plan.box.left), double(m_Plan.box.right - 1));
+        return int(std::floor(clamped)) - m_Plan.box.left;
+    }
+
+    // The first x in [left, right) from which on the line is at least (cosine >= 0) or below (cosine < 0)
+    // line; right when there is none. Worked out, then checked against operator() pixel by pixel.
+    int Boundary(int line, int left, int right) const noexcept {
+        const double c = m_Plan.cosine;
+        auto past = [&](int x) { return c >= 0.0 ? (*this)(x) >= line : (*this)(x) < line; };
+        if (c == 0.0) return past(left) ? left : right;
+        const double guess = (double(m_Plan.box.left + line) - m_Base) / c + m_Plan.pivotX - 0.5;
+        int x = int(std::clamp(std::ceil(guess), double(left), double(right)));
+        for (int step = 0; step < 4; ++step) {
+            if (x > left && past(x - 1))
+                --x;
+            else if (x < right && !past(x))
+                ++x;
+            else
+                return x;
+        }
+        // Far from the guess (it cannot be, but the answer must be exact): search.
+        int low = left, high = right;
+        while (low < high) {
+            const int middle = low + (high - low) / 2;
+            if (past(middle))
+                high = middle;
+            else
+                low = middle + 1;
+        }
+        return low;
+    }
+
+private:
+    const Plan& m_Plan;
+    double m_Base;
+};
 
 template <Raster::PixelFormat F>
 RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const Plan& plan) {
@@ -24,108 +89,137 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
     const int width = plan.box.Width();
     const int height = plan.box.Height();
     const double c = plan.cosine, s = plan.sine, px = plan.pivotX, py = plan.pivotY;
+    const int period = L::IsFloat ? RestartPeriod(plan.whole) : 0;
+    const int lead = period; // rows before the box's first blurred row that a float restart may need
+
+    // The intermediate images are stored transposed: each row of a scratch buffer is one column of the box,
+    // a line along the motion, so that the blur and the resample in run through contiguous memory. The
+    // lines are worked out a band at a time, and only the rows of each line that the resample out reads
+    // (with the blur's reach around them).
+    const std::vector<RowRange> needed = NeededRows(rect, plan);
+    // Rotated rows (from -lead) whose samples line j needs: the blurred rows, the reach on both sides and,
+    // for floats, back to the restart before the first.
+    auto sampledRows = [&](int j) {
+        const RowRange range = needed[std::size_t(j)];
+        if (range.first >= range.last) return range;
+        const int from =
+            L::IsFloat ? range.first - FloorMod(plan.box.top + range.first, period) : range.first;
+        return RowRange{from, range.last + 2 * reach};
+    };
 
     // Both scratch images live for this call only; the counted references free them on every way out.
+    const int lines = std::min(Band + 1, width);
     const Kernel::Counted<Raster::DynamicBuffer> rotated =
-        Raster::DynamicBuffer::Create(width, height + 2 * reach, F);
+        Raster::DynamicBuffer::Create(lead + height + 2 * reach, lines, F);
     if (!rotated) return RenderPath::Failed;
     if (Kernel::IsAborted(target.abort)) return RenderPath::Aborted;
-    const Kernel::Counted<Raster::DynamicBuffer> blurred = Raster::DynamicBuffer::Create(width, height, F);
+    const Kernel::Counted<Raster::DynamicBuffer> blurred = Raster::DynamicBuffer::Create(height, lines, F);
     if (!blurred) return RenderPath::Failed;
 
-    // 1. Resample the source into the rotated image. Every sample position is worked out from its own
-    // intermediate coordinates, never stepped along the row, so a pixel's value does not depend on the tile.
-    // Blocks of Block × Block pixels keep the source rows that a turned row crosses in the caches.
-    for (int top = 0; top < rotated->GetHeight(); top += Block) {
-        if (Kernel::IsAborted(target.abort)) return RenderPath::Aborted;
-        const int bottom = std::min(top + Block, rotated->GetHeight());
-        for (int left = 0; left < width; left += Block) {
-            const int right = std::min(left + Block, width);
-            for (int row = top; row < bottom; ++row) {
-                const double my = double(plan.box.top - reach + row) + 0.5 - py;
-                const double baseX = -s * my + px - 0.5, baseY = c * my + py - 0.5;
-                T* out = rotated->Row<T>(row);
-                for (int i = left; i < right; ++i) {
-                    const double mx = double(plan.box.left + i) + 0.5 - px;
-                    Blur::SampleBilinear<F>(source, baseX + c * mx, baseY + s * mx, out + std::size_t(i) * N);
-                }
-            }
-        }
-    }
-    if (Kernel::IsAborted(target.abort)) return RenderPath::Aborted;
-
-    // 2. Blur down the columns: running premultiplied sums over 2·whole + 1 rows, so a pixel costs the same
-    // whatever the radius; a fractional radius adds the two rows beyond at weight fraction. The sweep goes
-    // row by row across all columns, so every write is a whole aligned row.
+    const Blur::RowGrid<F> sourceGrid{source};
     const float weight = float(double(2 * plan.whole + 1) + 2.0 * double(plan.fraction));
-    std::vector<Acc> sums(std::size_t(width) * N, Acc(0));
-    std::vector<Acc> outer(plan.fraction > 0.0f ? std::size_t(width) * N : 0);
-    for (int k = reach - plan.whole; k <= reach + plan.whole; ++k) {
-        const T* in = rotated->Row<T>(k);
-        for (int i = 0; i < width; ++i)
-            L::Accumulate(&sums[std::size_t(i) * N], in + std::size_t(i) * N);
-    }
-    for (int row = 0; row < height; ++row) {
-        if (Kernel::IsAborted(target.abort)) return RenderPath::Aborted;
-        const int centre = row + reach;
-        if (row > 0) {
-            const T* entering = rotated->Row<T>(centre + plan.whole);
-            const T* leaving = rotated->Row<T>(centre - plan.whole - 1);
-            for (int i = 0; i < width; ++i) {
-                L::Accumulate(&sums[std::size_t(i) * N], entering + std::size_t(i) * N);
-                L::Remove(&sums[std::size_t(i) * N], leaving + std::size_t(i) * N);
-            }
-        }
-        if (!outer.empty()) {
-            std::fill(outer.begin(), outer.end(), Acc(0));
-            const T* above = rotated->Row<T>(centre - plan.whole - 1);
-            const T* below = rotated->Row<T>(centre + plan.whole + 1);
-            for (int i = 0; i < width; ++i) {
-                L::Accumulate(&outer[std::size_t(i) * N], above + std::size_t(i) * N);
-                L::Accumulate(&outer[std::size_t(i) * N], below + std::size_t(i) * N);
-            }
-        }
-        T* out = blurred->Row<T>(row);
-        for (int i = 0; i < width; ++i) {
-            float total[N];
-            for (int k = 0; k < N; ++k) {
-                total[k] = float(sums[std::size_t(i) * N + std::size_t(k)]);
-                if (!outer.empty())
-                    total[k] += plan.fraction * float(outer[std::size_t(i) * N + std::size_t(k)]);
-            }
-            L::Resolve(total, weight, out + std::size_t(i) * N);
-        }
-    }
-    if (Kernel::IsAborted(target.abort)) return RenderPath::Aborted;
-
-    // 3. Resample the blurred image back into the destination through the inverse rotation, in blocks.
     const int channelMask = target.channelMask;
-    for (int top = rect.top; top < rect.bottom; top += Block) {
+    // Destination pixels whose samples start in lines [first, first + Band) need lines first to
+    // first + Band inclusive; the next band starts at the last of them again.
+    for (int first = 0; first < width; first += Band) {
         if (Kernel::IsAborted(target.abort)) return RenderPath::Aborted;
-        const int bottom = std::min(top + Block, rect.bottom);
-        for (int left = rect.left; left < rect.right; left += Block) {
-            const int right = std::min(left + Block, rect.right);
-            for (int y = top; y < bottom; ++y) {
-                const double my = double(y) + 0.5 - py;
-                const double baseX = s * my + px - 0.5 - plan.box.left,
-                             baseY = c * my + py - 0.5 - plan.box.top;
-                T* out = destination.Row<T>(y);
-                const T* original = source.Row<T>(y);
-                const std::uint8_t* weights = mask ? mask->Row<std::uint8_t>(y) : nullptr;
-                for (int x = left; x < right; ++x) {
-                    const double mx = double(x) + 0.5 - px;
-                    T value[N];
-                    Blur::SampleBilinear<F>(*blurred, baseX + c * mx, baseY - s * mx, value);
-                    T* pixel = out + std::size_t(x) * N;
-                    if (weights && weights[x] != 255) {
-                        const float w = float(weights[x]) / 255.0f;
-                        const T* from = original + std::size_t(x) * N;
-                        for (int k = 0; k < N; ++k)
-                            value[k] = L::Store(float(from[k]) + (float(value[k]) - float(from[k])) * w);
+        const int end = std::min(first + Band, width);
+        const int count = std::min(end + 1, width) - first;
+
+        // 1. Resample the source into the band's rotated lines. Every sample position is worked out from its
+        // own intermediate coordinates, never stepped along the line, so a pixel does not depend on the tile.
+        for (int group = 0; group < count; group += LineGroup) {
+            const int groupEnd = std::min(group + LineGroup, count);
+            int from = 0, to = 0;
+            for (int i = group; i < groupEnd; ++i) {
+                const RowRange rows = sampledRows(first + i);
+                if (rows.first >= rows.last) continue;
+                from = from < to ? std::min(from, rows.first) : rows.first;
+                to = std::max(to, rows.last);
+            }
+            for (int chunk = from; chunk < to; chunk += LineChunk) {
+                for (int i = group; i < groupEnd; ++i) {
+                    const int j = first + i;
+                    const RowRange rows = sampledRows(j);
+                    const int begin = std::max(rows.first, chunk),
+                              stop = std::min(rows.last, chunk + LineChunk);
+                    T* line = rotated->Row<T>(i) + std::ptrdiff_t(lead) * N;
+                    const double mx = double(plan.box.left + j) + 0.5 - px;
+                    for (int r = begin; r < stop; ++r) {
+                        const double my = double(plan.box.top - reach + r) + 0.5 - py;
+                        const double baseX = -s * my + px - 0.5, baseY = c * my + py - 0.5;
+                        Blur::SampleBilinear<F>(sourceGrid, baseX + c * mx, baseY + s * mx,
+                                                line + std::ptrdiff_t(r) * N);
                     }
-                    for (int k = 0; k < N; ++k)
-                        if (channelMask < 0 || (channelMask & Blur::ChannelBit<F>(k))) pixel[k] = value[k];
                 }
+            }
+        }
+        if (Kernel::IsAborted(target.abort)) return RenderPath::Aborted;
+
+        // 2. Blur along each line: a running premultiplied sum over 2·whole + 1 rows, so a pixel costs the
+        // same whatever the radius; a fractional radius adds the two rows beyond at weight fraction.
+        for (int i = 0; i < count; ++i) {
+            const int j = first + i;
+            const RowRange range = needed[std::size_t(j)];
+            if (range.first >= range.last) continue;
+            // in[r] is rotated row r; blurred row b is centred on rotated row b + reach.
+            const T* in = rotated->Row<T>(i) + std::ptrdiff_t(lead + reach) * N;
+            T* out = blurred->Row<T>(i);
+            const int start = sampledRows(j).first;
+            Acc sum[N] = {};
+            for (int b = start; b < range.last; ++b) {
+                if (b == start || (L::IsFloat && FloorMod(plan.box.top + b, period) == 0)) {
+                    std::fill_n(sum, N, Acc(0));
+                    for (int k = b - plan.whole; k <= b + plan.whole; ++k)
+                        L::Accumulate(sum, in + std::ptrdiff_t(k) * N);
+                } else {
+                    L::Accumulate(sum, in + std::ptrdiff_t(b + plan.whole) * N);
+                    L::Remove(sum, in + std::ptrdiff_t(b - plan.whole - 1) * N);
+                }
+                if (b < range.first) continue;
+                float total[N];
+                for (int k = 0; k < N; ++k)
+                    total[k] = float(sum[k]);
+                if (plan.fraction > 0.0f) {
+                    Acc outer[N] = {};
+                    L::Accumulate(outer, in + std::ptrdiff_t(b - plan.whole - 1) * N);
+                    L::Accumulate(outer, in + std::ptrdiff_t(b + plan.whole + 1) * N);
+                    for (int k = 0; k < N; ++k)
+                        total[k] += plan.fraction * float(outer[k]);
+                }
+                L::Resolve(total, weight, out + std::ptrdiff_t(b) * N);
+            }
+        }
+        if (Kernel::IsAborted(target.abort)) return RenderPath::Aborted;
+
+        // 3. Resample the band back into the destination pixels whose samples start in it, through the
+        // inverse rotation. Positions stay in intermediate coordinates, so that a sample's weights do not
+        // depend on where this rectangle's box begins.
+        const Blur::LineGrid<F> blurredGrid{*blurred, plan.box.left + first, plan.box.top, count};
+        for (int y = rect.top; y < rect.bottom; ++y) {
+            const LineOfPixel lineOf(plan, y);
+            const int a = lineOf.Boundary(first, rect.left, rect.right);
+            const int b = lineOf.Boundary(end, rect.left, rect.right);
+            const int left = c < 0.0 ? b : a, right = c < 0.0 ? a : b;
+            if (left >= right) continue;
+            const double my = double(y) + 0.5 - py;
+            const double baseX = s * my + px - 0.5, baseY = c * my + py - 0.5;
+            T* out = destination.Row<T>(y);
+            const T* original = source.Row<T>(y);
+            const std::uint8_t* weights = mask ? mask->Row<std::uint8_t>(y) : nullptr;
+            for (int x = left; x < right; ++x) {
+                const double mx = double(x) + 0.5 - px;
+                T value[N];
+                Blur::SampleBilinear<F>(blurredGrid, baseX + c * mx, baseY - s * mx, value);
+                T* pixel = out + std::size_t(x) * N;
+                if (weights && weights[x] != 255) {
+                    const float w = float(weights[x]) / 255.0f;
+                    const T* from = original + std::size_t(x) * N;
+                    for (int k = 0; k < N; ++k)
+                        value[k] = L::Store(float(from[k]) + (float(value[k]) - float(from[k])) * w);
+                }
+                for (int k = 0; k < N; ++k)
+                    if (channelMask < 0 || (channelMask & Blur::ChannelBit<F>(k))) pixel[k] = value[k];
             }
         }
     }
