@@ -11,6 +11,7 @@
 #include <cstring>
 #include <emmintrin.h>
 #include <type_traits>
+#include <xmmintrin.h>
 
 namespace RasterTools::Blur {
 
@@ -84,6 +85,10 @@ struct Layout {
         else
             return T(int(std::clamp(v, 0.0f, Max) + 0.5f)); // round half up: no library call per component
     }
+
+    // Resolve for four pixels at once, one component per register, with the same arithmetic: formats of
+    // four components with alpha last.
+    static void Resolve4(const float (*sum)[N], float weight, T* out) noexcept;
 
     // Writes the pixel of premultiplied sums colour[] and alpha (in stored units) over total weight: colour
     // is divided by the normalised alpha unless that is exactly 1 or within 1e-20 of 0.
@@ -167,6 +172,32 @@ inline void Store4(__m128 v, T* out) noexcept {
 
 } // namespace Detail
 
+template <Raster::PixelFormat F>
+inline void Layout<F>::Resolve4(const float (*sum)[N], float weight, T* out) noexcept {
+    static_assert(N == 4 && A == 3, "four components with alpha last");
+    const float inverse = 1.0f / weight;
+    const float scaled = inverse / PremultipliedScale;
+    __m128 c0 = _mm_loadu_ps(sum[0]), c1 = _mm_loadu_ps(sum[1]), c2 = _mm_loadu_ps(sum[2]),
+           a = _mm_loadu_ps(sum[3]);
+    _MM_TRANSPOSE4_PS(c0, c1, c2, a);
+    const __m128 one = _mm_set1_ps(1.0f);
+    const __m128 alpha = _mm_div_ps(_mm_mul_ps(a, _mm_set1_ps(inverse)), _mm_set1_ps(Max));
+    const __m128 tiny =
+        _mm_and_ps(_mm_cmpgt_ps(alpha, _mm_set1_ps(-1e-20f)), _mm_cmplt_ps(alpha, _mm_set1_ps(1e-20f)));
+    const __m128 divide = _mm_andnot_ps(tiny, _mm_cmpneq_ps(alpha, one));
+    const __m128 divisor = _mm_or_ps(_mm_and_ps(divide, alpha), _mm_andnot_ps(divide, one));
+    const __m128 colourScale = _mm_div_ps(_mm_set1_ps(scaled), divisor);
+    c0 = _mm_mul_ps(c0, colourScale);
+    c1 = _mm_mul_ps(c1, colourScale);
+    c2 = _mm_mul_ps(c2, colourScale);
+    a = _mm_mul_ps(a, _mm_set1_ps(inverse));
+    _MM_TRANSPOSE4_PS(c0, c1, c2, a);
+    Detail::Store4(c0, out);
+    Detail::Store4(c1, out + 4);
+    Detail::Store4(c2, out + 8);
+    Detail::Store4(a, out + 12);
+}
+
 // Premultiplied bilinear sample of grid at continuous index (x, y) of its frame (pixel i's centre is at i),
 // clamped to the grid's edges. A sample exactly on a pixel centre copies that pixel, so quarter turns are
 // exact.
@@ -231,6 +262,84 @@ inline void SampleBilinear(const Grid& grid, double x, double y, typename Layout
     const float inverse = 1.0f / alpha;
     for (int c = 0; c < L::N; ++c)
         out[c] = c == L::A ? alphaOut : L::Store(colour[c] * inverse);
+}
+
+// Four samples at once, each exactly as SampleBilinear gives it: formats of four components with alpha last
+// work the four pixels side by side, one component per register; others sample one by one. out receives the
+// four pixels one after another.
+template <Raster::PixelFormat F, class Grid>
+inline void SampleBilinear4(const Grid& grid, const double* xs, const double* ys,
+                            typename Layout<F>::T* out) noexcept {
+    using L = Layout<F>;
+    using T = typename L::T;
+    if constexpr (!(L::N == 4 && L::A == 3)) {
+        for (int i = 0; i < 4; ++i)
+            SampleBilinear<F>(grid, xs[i], ys[i], out + i * L::N);
+    } else {
+        const int lastX = grid.left + grid.Width() - 1, lastY = grid.top + grid.Height() - 1;
+        alignas(16) float fxs[4], fys[4];
+        const T* p[4][4];
+        int exact = 0; // pixels that sit on a pixel centre and copy it
+        for (int i = 0; i < 4; ++i) {
+            const double x = std::clamp(xs[i], double(grid.left), double(lastX));
+            const double y = std::clamp(ys[i], double(grid.top), double(lastY));
+            const int x0 = int(std::floor(x)), y0 = int(std::floor(y));
+            fxs[i] = float(x - x0);
+            fys[i] = float(y - y0);
+            const int x1 = std::min(x0 + 1, lastX), y1 = std::min(y0 + 1, lastY);
+            p[i][0] = grid.At(x0, y0);
+            p[i][1] = grid.At(x1, y0);
+            p[i][2] = grid.At(x0, y1);
+            p[i][3] = grid.At(x1, y1);
+            if (fxs[i] == 0.0f && fys[i] == 0.0f) exact |= 1 << i;
+        }
+        const __m128 one = _mm_set1_ps(1.0f);
+        const __m128 fx = _mm_load_ps(fxs), fy = _mm_load_ps(fys);
+        const __m128 gx = _mm_sub_ps(one, fx), gy = _mm_sub_ps(one, fy);
+        const __m128 weight[4] = {_mm_mul_ps(gx, gy), _mm_mul_ps(fx, gy), _mm_mul_ps(gx, fy),
+                                  _mm_mul_ps(fx, fy)};
+        // Corner k of the four pixels, one component per register: c[k][component].
+        __m128 c[4][4];
+        for (int k = 0; k < 4; ++k) {
+            __m128 r0 = Detail::Load4(p[0][k]), r1 = Detail::Load4(p[1][k]);
+            __m128 r2 = Detail::Load4(p[2][k]), r3 = Detail::Load4(p[3][k]);
+            _MM_TRANSPOSE4_PS(r0, r1, r2, r3);
+            c[k][0] = r0;
+            c[k][1] = r1;
+            c[k][2] = r2;
+            c[k][3] = r3;
+        }
+        __m128 alpha = _mm_setzero_ps(), sum[3] = {_mm_setzero_ps(), _mm_setzero_ps(), _mm_setzero_ps()};
+        for (int k = 0; k < 4; ++k) {
+            const __m128 a = _mm_mul_ps(c[k][3], weight[k]);
+            alpha = _mm_add_ps(alpha, a);
+            for (int m = 0; m < 3; ++m)
+                sum[m] = _mm_add_ps(sum[m], _mm_mul_ps(c[k][m], a));
+        }
+        // Where every neighbour is transparent the colour is the plain weighted average.
+        const __m128 absAlpha = _mm_andnot_ps(_mm_set1_ps(-0.0f), alpha);
+        const __m128 weighted = _mm_cmpge_ps(absAlpha, _mm_set1_ps(1e-20f));
+        if (_mm_movemask_ps(weighted) != 0xF) {
+            __m128 plain[3] = {_mm_setzero_ps(), _mm_setzero_ps(), _mm_setzero_ps()};
+            for (int k = 0; k < 4; ++k)
+                for (int m = 0; m < 3; ++m)
+                    plain[m] = _mm_add_ps(plain[m], _mm_mul_ps(c[k][m], weight[k]));
+            for (int m = 0; m < 3; ++m)
+                sum[m] = _mm_or_ps(_mm_and_ps(weighted, sum[m]), _mm_andnot_ps(weighted, plain[m]));
+        }
+        const __m128 divisor = _mm_or_ps(_mm_and_ps(weighted, alpha), _mm_andnot_ps(weighted, one));
+        const __m128 inverse = _mm_div_ps(one, divisor);
+        __m128 r0 = _mm_mul_ps(sum[0], inverse), r1 = _mm_mul_ps(sum[1], inverse);
+        __m128 r2 = _mm_mul_ps(sum[2], inverse), r3 = alpha;
+        _MM_TRANSPOSE4_PS(r0, r1, r2, r3);
+        const __m128 pixels[4] = {r0, r1, r2, r3};
+        for (int i = 0; i < 4; ++i) {
+            if (exact & (1 << i))
+                std::copy_n(p[i][0], 4, out + i * 4);
+            else
+                Detail::Store4(pixels[i], out + i * 4);
+        }
+    }
 }
 
 // The write-mask bit of component c of a pixel of F (see Raster::WriteChannels).

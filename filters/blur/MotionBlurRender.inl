@@ -119,6 +119,8 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
     const Blur::RowGrid<F> sourceGrid{source};
     const float weight = float(double(2 * plan.whole + 1) + 2.0 * double(plan.fraction));
     const int channelMask = target.channelMask;
+    const bool writesAll =
+        channelMask < 0 || (channelMask & Raster::AllChannelsMask(F)) == Raster::AllChannelsMask(F);
     // Destination pixels whose samples start in lines [first, first + Band) need lines first to
     // first + Band inclusive; the next band starts at the last of them again.
     for (int first = 0; first < width; first += Band) {
@@ -145,11 +147,23 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
                               stop = std::min(rows.last, chunk + LineChunk);
                     T* line = rotated->Row<T>(i) + std::ptrdiff_t(lead) * N;
                     const double mx = double(plan.box.left + j) + 0.5 - px;
-                    for (int r = begin; r < stop; ++r) {
+                    auto position = [&](int r, double& x, double& y) {
                         const double my = double(plan.box.top - reach + r) + 0.5 - py;
                         const double baseX = -s * my + px - 0.5, baseY = c * my + py - 0.5;
-                        Blur::SampleBilinear<F>(sourceGrid, baseX + c * mx, baseY + s * mx,
-                                                line + std::ptrdiff_t(r) * N);
+                        x = baseX + c * mx;
+                        y = baseY + s * mx;
+                    };
+                    int r = begin;
+                    for (; r + 4 <= stop; r += 4) {
+                        double xs[4], ys[4];
+                        for (int k = 0; k < 4; ++k)
+                            position(r + k, xs[k], ys[k]);
+                        Blur::SampleBilinear4<F>(sourceGrid, xs, ys, line + std::ptrdiff_t(r) * N);
+                    }
+                    for (; r < stop; ++r) {
+                        double x, y;
+                        position(r, x, y);
+                        Blur::SampleBilinear<F>(sourceGrid, x, y, line + std::ptrdiff_t(r) * N);
                     }
                 }
             }
@@ -167,6 +181,10 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
             T* out = blurred->Row<T>(i);
             const int start = sampledRows(j).first;
             Acc sum[N] = {};
+            // Four-component pixels resolve four rows at a time.
+            constexpr int Batch = N == 4 && L::A == 3 ? 4 : 1;
+            float totals[Batch][N];
+            int pending = 0;
             for (int b = start; b < range.last; ++b) {
                 if (b == start || (L::IsFloat && FloorMod(plan.box.top + b, period) == 0)) {
                     std::fill_n(sum, N, Acc(0));
@@ -177,7 +195,7 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
                     L::Remove(sum, in + std::ptrdiff_t(b - plan.whole - 1) * N);
                 }
                 if (b < range.first) continue;
-                float total[N];
+                float* total = totals[pending];
                 for (int k = 0; k < N; ++k)
                     total[k] = float(sum[k]);
                 if (plan.fraction > 0.0f) {
@@ -187,8 +205,17 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
                     for (int k = 0; k < N; ++k)
                         total[k] += plan.fraction * float(outer[k]);
                 }
-                L::Resolve(total, weight, out + std::ptrdiff_t(b) * N);
+                if constexpr (Batch == 4) {
+                    if (++pending == Batch) {
+                        L::Resolve4(totals, weight, out + std::ptrdiff_t(b - 3) * N);
+                        pending = 0;
+                    }
+                } else {
+                    L::Resolve(total, weight, out + std::ptrdiff_t(b) * N);
+                }
             }
+            for (int k = 0; k < pending; ++k)
+                L::Resolve(totals[k], weight, out + std::ptrdiff_t(range.last - pending + k) * N);
         }
         if (Kernel::IsAborted(target.abort)) return RenderPath::Aborted;
 
@@ -207,10 +234,25 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
             T* out = destination.Row<T>(y);
             const T* original = source.Row<T>(y);
             const std::uint8_t* weights = mask ? mask->Row<std::uint8_t>(y) : nullptr;
-            for (int x = left; x < right; ++x) {
+            auto position = [&](int x, double& sx, double& sy) {
                 const double mx = double(x) + 0.5 - px;
+                sx = baseX + c * mx;
+                sy = baseY - s * mx;
+            };
+            int x = left;
+            if (!weights && writesAll) { // straight into the destination, four pixels at a time
+                for (; x + 4 <= right; x += 4) {
+                    double xs[4], ys[4];
+                    for (int k = 0; k < 4; ++k)
+                        position(x + k, xs[k], ys[k]);
+                    Blur::SampleBilinear4<F>(blurredGrid, xs, ys, out + std::size_t(x) * N);
+                }
+            }
+            for (; x < right; ++x) {
+                double sx, sy;
+                position(x, sx, sy);
                 T value[N];
-                Blur::SampleBilinear<F>(blurredGrid, baseX + c * mx, baseY - s * mx, value);
+                Blur::SampleBilinear<F>(blurredGrid, sx, sy, value);
                 T* pixel = out + std::size_t(x) * N;
                 if (weights && weights[x] != 255) {
                     const float w = float(weights[x]) / 255.0f;

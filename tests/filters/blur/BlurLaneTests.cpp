@@ -1,0 +1,106 @@
+// The motion blur's four-lane routines against the one-pixel routines they stand in for, in every format of
+// four components with alpha last: bilinear samples and resolved sums equal bit for bit, over translucent
+// and transparent neighbours, pixel centres, the grid's edges and locations beyond them.
+
+#include "filters/blur/BlurPixels.h"
+#include "host/raster/DynamicBuffer.h"
+
+#include <gtest/gtest.h>
+
+#include <cstring>
+#include <random>
+#include <vector>
+
+namespace {
+
+using Raster::PixelFormat;
+using namespace RasterTools;
+
+template <PixelFormat F>
+struct Format {
+    static constexpr PixelFormat Value = F;
+};
+using FourComponentFormats = ::testing::Types<Format<PixelFormat::RGBA8>, Format<PixelFormat::RGBA16>,
+                                              Format<PixelFormat::RGBAUF>, Format<PixelFormat::LabA16>>;
+
+template <class P>
+class BlurLanes : public ::testing::Test {};
+TYPED_TEST_SUITE(BlurLanes, FourComponentFormats);
+
+template <PixelFormat F>
+typename Blur::Layout<F>::T Component(std::mt19937& random, bool alpha) {
+    using L = Blur::Layout<F>;
+    const std::uint32_t kind = random() % 4;
+    if (alpha && kind == 0) return typename L::T(L::Max); // opaque
+    if (alpha && kind == 1) return typename L::T(0);      // transparent
+    if constexpr (L::IsFloat)
+        return std::uniform_real_distribution<float>(alpha ? 0.0f : -0.5f, alpha ? 1.0f : 1.5f)(random);
+    else
+        return typename L::T(random() % (std::uint32_t(L::Max) + 1));
+}
+
+template <PixelFormat F>
+Kernel::Counted<Raster::DynamicBuffer> Grid(int width, int height, std::uint32_t seed) {
+    using L = Blur::Layout<F>;
+    auto image = Raster::DynamicBuffer::Create(width, height, F);
+    std::mt19937 random(seed);
+    for (int y = 0; y < height; ++y) {
+        auto* row = image->template Row<typename L::T>(y);
+        for (int i = 0; i < width * L::N; ++i)
+            row[i] = Component<F>(random, i % L::N == L::A);
+    }
+    return image;
+}
+
+TYPED_TEST(BlurLanes, FourSamplesEqualFourSingleSamples) {
+    constexpr PixelFormat F = TypeParam::Value;
+    using L = Blur::Layout<F>;
+    const auto image = Grid<F>(23, 17, 5);
+    // A frame that does not start at the origin, as the motion blur's grids do.
+    const Blur::RowGrid<F> grid{*image, -4, 9};
+    std::mt19937 random(9);
+    std::uniform_real_distribution<double> along(-8.0, 22.0), down(6.0, 29.0);
+    int compared = 0;
+    for (int round = 0; round < 20000; ++round) {
+        double xs[4], ys[4];
+        for (int i = 0; i < 4; ++i) {
+            const std::uint32_t kind = random() % 4;
+            xs[i] = kind == 0 ? double(int(random() % 30) - 6) : along(random); // pixel centres too
+            ys[i] = kind == 1 ? double(int(random() % 24) + 7) : down(random);
+        }
+        typename L::T lanes[4 * L::N], single[4 * L::N];
+        Blur::SampleBilinear4<F>(grid, xs, ys, lanes);
+        for (int i = 0; i < 4; ++i)
+            Blur::SampleBilinear<F>(grid, xs[i], ys[i], single + i * L::N);
+        ASSERT_EQ(std::memcmp(lanes, single, sizeof lanes), 0)
+            << "round " << round << ", first location (" << xs[0] << ", " << ys[0] << ")";
+        ++compared;
+    }
+    EXPECT_EQ(compared, 20000);
+}
+
+TYPED_TEST(BlurLanes, FourResolvesEqualFourSingleResolves) {
+    constexpr PixelFormat F = TypeParam::Value;
+    using L = Blur::Layout<F>;
+    std::mt19937 random(13);
+    for (int round = 0; round < 20000; ++round) {
+        const int rows = 1 + int(random() % 40);
+        const float weight = float(rows) + (random() % 2 ? 0.5f : 0.0f);
+        float sums[4][4];
+        for (auto& sum : sums) {
+            // Sums of premultiplied rows: alpha from none to every row opaque, colour up to what alpha
+            // allows.
+            const float coverage = random() % 5 == 0 ? 0.0f : float(random() % 1001) / 1000.0f;
+            sum[3] = coverage * L::Max * weight;
+            for (int c = 0; c < 3; ++c)
+                sum[c] = float(random() % 1001) / 1000.0f * sum[3] * L::PremultipliedScale;
+        }
+        typename L::T lanes[16], single[16];
+        L::Resolve4(sums, weight, lanes);
+        for (int i = 0; i < 4; ++i)
+            L::Resolve(sums[i], weight, single + 4 * i);
+        ASSERT_EQ(std::memcmp(lanes, single, sizeof lanes), 0) << "round " << round;
+    }
+}
+
+} // namespace
