@@ -3,6 +3,7 @@
 // it interpolates (so that the mapping vectorises across pixels), and the distortions' kinds of render: one
 // per layer format, source and destination alike, without or with a mask.
 
+#include "filters/distort/BilinearRGBA8.h"
 #include "filters/distort/DistortMath.h"
 #include "pipeline/Pipeline.h"
 
@@ -69,7 +70,14 @@ struct SpanBilinearSampler {
             xs[i] = at.x - 0.5f;
             ys[i] = at.y - 0.5f;
         }
-        for (int i = 0; i < n; ++i)
+        int i = 0;
+        if constexpr (Image::Format == Raster::PixelFormat::RGBA8 && std::is_same_v<Extend, Raster::Safe>) {
+            for (; i + 4 <= n; i += 4)
+                if (!BilinearRGBA8::SampleSafe4(image, xs + i, ys + i, out + i))
+                    for (int k = i; k < i + 4; ++k)
+                        out[k] = At<Extend>(image, make_float2(xs[k], ys[k]));
+        }
+        for (; i < n; ++i)
             out[i] = At<Extend>(image, make_float2(xs[i], ys[i]));
     }
 };
