@@ -27,6 +27,32 @@ using TwirlTransform = DistortTransform<&DistortMath::TwirlMap>;
 // [centre x, centre y, intensity / 100, radius]
 using SphereTransform = DistortTransform<&DistortMath::SphereMap>;
 
+namespace DistortStages {
+
+// The view's affine (output pixels to source pixels), then the distortion in source pixels.
+template <class Map>
+using Chain = Raster::ChainedTransform<Raster::AffineTransform, Map>;
+
+// The source locations of the 32 pixel centres from (x0, y), less half a pixel: one loop that the compiler
+// vectorises. The twirl's and the sphere's are built for AVX2 and for any x86-64 (DistortSpans.cpp).
+template <class Transform>
+inline void MapSpanInline(const Raster::PreparedTransform<Transform>& t, int x0, int y, float* xs,
+                          float* ys) noexcept {
+    using namespace Raster::KernelMath;
+    const float centreY = (float)y + 0.5f;
+    for (int i = 0; i < Raster::SpanLength; ++i) {
+        const float2 at = Transform::Transform(make_float2((float)(x0 + i) + 0.5f, centreY), t);
+        xs[i] = at.x - 0.5f;
+        ys[i] = at.y - 0.5f;
+    }
+}
+void MapSpan(const Raster::PreparedTransform<Chain<TwirlTransform>>& t, int x0, int y, float* xs,
+             float* ys) noexcept;
+void MapSpan(const Raster::PreparedTransform<Chain<SphereTransform>>& t, int x0, int y, float* xs,
+             float* ys) noexcept;
+
+} // namespace DistortStages
+
 // Bilinear sampling as Raster::BilinearSampler (whose kernel text it wraps), except that a location on a
 // pixel centre reads that pixel as it is: the premultiplied round trip would move partly transparent pixels
 // that the distortion leaves in place. The span's locations are transformed in one loop of their own before
@@ -62,14 +88,11 @@ struct SpanBilinearSampler {
         using namespace Raster::KernelMath;
         alignas(64) float xs[Raster::SpanLength];
         alignas(64) float ys[Raster::SpanLength];
-        const float centreY = (float)y + 0.5f;
-        // All 32 lanes, whatever n is: a fixed trip count that the compiler vectorises; the extra lanes are
-        // never read.
-        for (int i = 0; i < Raster::SpanLength; ++i) {
-            const float2 at = Transform::Transform(make_float2((float)(x0 + i) + 0.5f, centreY), t);
-            xs[i] = at.x - 0.5f;
-            ys[i] = at.y - 0.5f;
-        }
+        // All 32 lanes, whatever n is: a fixed trip count; the extra lanes are never read.
+        if constexpr (requires { DistortStages::MapSpan(t, x0, y, xs, ys); })
+            DistortStages::MapSpan(t, x0, y, xs, ys);
+        else
+            DistortStages::MapSpanInline<Transform>(t, x0, y, xs, ys);
         int i = 0;
         if constexpr (Image::Format == Raster::PixelFormat::RGBA8 && std::is_same_v<Extend, Raster::Safe>) {
             for (; i + 4 <= n; i += 4)
@@ -83,10 +106,6 @@ struct SpanBilinearSampler {
 };
 
 namespace DistortStages {
-
-// The view's affine (output pixels to source pixels), then the distortion in source pixels.
-template <class Map>
-using Chain = Raster::ChainedTransform<Raster::AffineTransform, Map>;
 
 // Edge pixels continue outwards, so that locations mapped beyond the image do not fade into transparency.
 template <class Map, Raster::PixelFormat F>

@@ -1,17 +1,11 @@
 // The vertical edge detect's span kernels: the gradient across the components of a span, so that the
 // compiler vectorises it whatever the channel count.
 #include "filters/tonal/EdgeDetectStages.h"
+#include "pipeline/SimdClones.h"
 
 #include <algorithm>
 #include <cstdlib>
 #include <limits>
-
-// Built twice, for AVX2 and for any x86-64; the loader picks one at run time.
-#if defined(__GNUC__) && !defined(__clang__) && defined(__x86_64__) && !defined(__SANITIZE_ADDRESS__)
-#define RT_EDGE_CLONES __attribute__((target_clones("avx2", "default")))
-#else
-#define RT_EDGE_CLONES
-#endif
 
 namespace RasterTools::EdgeDetectSpan {
 
@@ -78,15 +72,15 @@ template <class Component>
 
 } // namespace
 
-RT_EDGE_CLONES void Gradient(const std::uint8_t* above, const std::uint8_t* row, const std::uint8_t* below,
+RT_AVX2_CLONES void Gradient(const std::uint8_t* above, const std::uint8_t* row, const std::uint8_t* below,
                              int channels, int n, std::uint8_t* out) noexcept {
     Dispatch(above, row, below, channels, n, out);
 }
-RT_EDGE_CLONES void Gradient(const std::uint16_t* above, const std::uint16_t* row, const std::uint16_t* below,
+RT_AVX2_CLONES void Gradient(const std::uint16_t* above, const std::uint16_t* row, const std::uint16_t* below,
                              int channels, int n, std::uint16_t* out) noexcept {
     Dispatch(above, row, below, channels, n, out);
 }
-RT_EDGE_CLONES void Gradient(const float* above, const float* row, const float* below, int channels, int n,
+RT_AVX2_CLONES void Gradient(const float* above, const float* row, const float* below, int channels, int n,
                              float* out) noexcept {
     Dispatch(above, row, below, channels, n, out);
 }

@@ -2,6 +2,7 @@
 #include "filters/tonal/NoiseGenerator.h"
 
 #include "host/raster/KernelText.h"
+#include "pipeline/SimdClones.h"
 
 #include <array>
 #include <bit>
@@ -9,13 +10,6 @@
 #include <cstring>
 #include <limits>
 #include <type_traits>
-
-// The span kernels are built twice, for AVX2 and for any x86-64, and the loader picks one at run time.
-#if defined(__GNUC__) && !defined(__clang__) && defined(__x86_64__) && !defined(__SANITIZE_ADDRESS__)
-#define RT_NOISE_CLONES __attribute__((target_clones("avx2", "default")))
-#else
-#define RT_NOISE_CLONES
-#endif
 
 namespace RasterTools::NoiseGenerator {
 
@@ -114,16 +108,16 @@ template <class Component>
 
 } // namespace
 
-RT_NOISE_CLONES void SpanAddNoise(std::uint8_t* components, int channels, const SpanChannelNoise* noise,
-                                  int n) noexcept {
+RT_AVX2_CLONES void SpanAddNoise(std::uint8_t* components, int channels, const SpanChannelNoise* noise,
+                                 int n) noexcept {
     AddNoiseToSpan(components, channels, noise, n);
 }
-RT_NOISE_CLONES void SpanAddNoise(std::uint16_t* components, int channels, const SpanChannelNoise* noise,
-                                  int n) noexcept {
+RT_AVX2_CLONES void SpanAddNoise(std::uint16_t* components, int channels, const SpanChannelNoise* noise,
+                                 int n) noexcept {
     AddNoiseToSpan(components, channels, noise, n);
 }
-RT_NOISE_CLONES void SpanAddNoise(float* components, int channels, const SpanChannelNoise* noise,
-                                  int n) noexcept {
+RT_AVX2_CLONES void SpanAddNoise(float* components, int channels, const SpanChannelNoise* noise,
+                                 int n) noexcept {
     AddNoiseToSpan(components, channels, noise, n);
 }
 
@@ -131,7 +125,7 @@ const Jump* GetJumps() noexcept {
     return Jumps.data();
 }
 
-RT_NOISE_CLONES void SpanSeeds(int x0, int y, const float* samplerParams, std::uint32_t* seeds) noexcept {
+RT_AVX2_CLONES void SpanSeeds(int x0, int y, const float* samplerParams, std::uint32_t* seeds) noexcept {
     alignas(64) float xs[SpanPixels], ys[SpanPixels];
     const float centreY = float(y) + 0.5f;
     int outside = 0;
@@ -189,7 +183,7 @@ template <int Channels>
             noise[c][i] = GaussianFromSum(sums[c][i], sigma);
 }
 
-RT_NOISE_CLONES void SpanUnitDraws(const std::uint32_t* seeds, int draws, SpanChannelNoise* values) noexcept {
+RT_AVX2_CLONES void SpanUnitDraws(const std::uint32_t* seeds, int draws, SpanChannelNoise* values) noexcept {
     const Jump* jumps = Jumps.data() + 1;
     for (int k = 0; k < draws && k < MaxJump; ++k) {
         const std::uint32_t multiplier = jumps[k].multiplier, increment = jumps[k].increment;
@@ -198,8 +192,8 @@ RT_NOISE_CLONES void SpanUnitDraws(const std::uint32_t* seeds, int draws, SpanCh
     }
 }
 
-RT_NOISE_CLONES void SpanNoise(const std::uint32_t* seeds, int channels, bool gaussian, float sigma,
-                               SpanChannelNoise* noise) noexcept {
+RT_AVX2_CLONES void SpanNoise(const std::uint32_t* seeds, int channels, bool gaussian, float sigma,
+                              SpanChannelNoise* noise) noexcept {
     switch (channels) {
     case 1:
         return DrawSpanNoise<1>(seeds, gaussian, sigma, noise);
