@@ -43,7 +43,7 @@
         const float c = DistortCosPolynomial(r);                                                             \
         const float sine = (q & 1) ? c : s;                                                                  \
         const float cosine = (q & 1) ? s : c;                                                                \
-        return float2_literal((q & 2) ? -sine : sine, ((q + 1) & 2) ? -cosine : cosine);                     \
+        return float2_literal((q & 2) ? -sine : sine, (((q & 3) + 1) & 2) ? -cosine : cosine);               \
     }                                                                                                        \
     RT_DISTORT_FUNCTION float DistortAsin(float x) {                                                         \
         const int high = x > 0.5f;                                                                           \
