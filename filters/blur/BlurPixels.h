@@ -342,6 +342,26 @@ inline void SampleBilinear4(const Grid& grid, const double* xs, const double* ys
     }
 }
 
+// Samples indices first..last - 1 into out (index i's pixel at out + i × N), four at a time and the rest one
+// by one; position(i, x, y) gives index i's location.
+template <Raster::PixelFormat F, class Grid, class Position>
+inline void SampleBilinearRun(const Grid& grid, int first, int last, const Position& position,
+                              typename Layout<F>::T* out) noexcept {
+    constexpr int N = Layout<F>::N;
+    int i = first;
+    for (; i + 4 <= last; i += 4) {
+        double xs[4], ys[4];
+        for (int k = 0; k < 4; ++k)
+            position(i + k, xs[k], ys[k]);
+        SampleBilinear4<F>(grid, xs, ys, out + std::ptrdiff_t(i) * N);
+    }
+    for (; i < last; ++i) {
+        double x, y;
+        position(i, x, y);
+        SampleBilinear<F>(grid, x, y, out + std::ptrdiff_t(i) * N);
+    }
+}
+
 // The write-mask bit of component c of a pixel of F (see Raster::WriteChannels).
 template <Raster::PixelFormat F>
 constexpr int ChannelBit(int c) noexcept {

@@ -153,18 +153,7 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
                         x = baseX + c * mx;
                         y = baseY + s * mx;
                     };
-                    int r = begin;
-                    for (; r + 4 <= stop; r += 4) {
-                        double xs[4], ys[4];
-                        for (int k = 0; k < 4; ++k)
-                            position(r + k, xs[k], ys[k]);
-                        Blur::SampleBilinear4<F>(sourceGrid, xs, ys, line + std::ptrdiff_t(r) * N);
-                    }
-                    for (; r < stop; ++r) {
-                        double x, y;
-                        position(r, x, y);
-                        Blur::SampleBilinear<F>(sourceGrid, x, y, line + std::ptrdiff_t(r) * N);
-                    }
+                    Blur::SampleBilinearRun<F>(sourceGrid, begin, stop, position, line);
                 }
             }
         }
@@ -239,16 +228,11 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
                 sx = baseX + c * mx;
                 sy = baseY - s * mx;
             };
-            int x = left;
-            if (!weights && writesAll) { // straight into the destination, four pixels at a time
-                for (; x + 4 <= right; x += 4) {
-                    double xs[4], ys[4];
-                    for (int k = 0; k < 4; ++k)
-                        position(x + k, xs[k], ys[k]);
-                    Blur::SampleBilinear4<F>(blurredGrid, xs, ys, out + std::size_t(x) * N);
-                }
+            if (!weights && writesAll) { // straight into the destination
+                Blur::SampleBilinearRun<F>(blurredGrid, left, right, position, out);
+                continue;
             }
-            for (; x < right; ++x) {
+            for (int x = left; x < right; ++x) {
                 double sx, sy;
                 position(x, sx, sy);
                 T value[N];

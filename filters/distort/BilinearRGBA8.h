@@ -80,11 +80,12 @@ inline bool SampleSafe4(const Image& image, const float* xs, const float* ys,
     __m128 sum[4];
     for (int k = 0; k < 4; ++k) {
         const __m128i pixels = _mm_load_si128(reinterpret_cast<const __m128i*>(corners[k]));
-        const __m128 alpha = _mm_cvtepi32_ps(_mm_srli_epi32(pixels, 24));
+        const __m128i alphas = _mm_srli_epi32(pixels, 24);
+        const __m128 alpha = _mm_cvtepi32_ps(alphas);
         __m128 channel[4] = {Detail::Channel(pixels, 0), Detail::Channel(pixels, 8),
                              Detail::Channel(pixels, 16), alpha};
         // Opaque pixels premultiply to themselves exactly (c × 255 / 255 = c), so the divisions can go.
-        const __m128i opaque = _mm_cmpeq_epi32(_mm_srli_epi32(pixels, 24), _mm_set1_epi32(255));
+        const __m128i opaque = _mm_cmpeq_epi32(alphas, _mm_set1_epi32(255));
         if (_mm_movemask_epi8(opaque) != 0xFFFF)
             for (int c = 0; c < 3; ++c)
                 channel[c] = Detail::Premultiply(channel[c], alpha);
