@@ -26,6 +26,15 @@ struct MotionBlurFilter {
     // The drag shows the motion: its length is the radius, its direction the angle.
     static constexpr double kDragScale = 1.0;
 
+    // The fractional blur, the whole-radius blur at an oblique angle and at a quarter turn, and a smear
+    // longer than the image, for the conformance tests.
+    static constexpr std::array<Params, 4> kSamples{{
+        {2.5, 0.5},
+        {16.0, 0.5236},
+        {7.0, 1.5707963267948966},
+        {45.0, 2.0},
+    }};
+
     static constexpr std::array<Parameter<Params>, 2> kParameters{{
         {{.name = "radius",
           .type = ParameterType::Double,

@@ -23,6 +23,19 @@ struct Plan {
     int Reach() const noexcept { return whole + (fraction > 0.0f ? 1 : 0); }
 };
 
+// Float sums round, so a running sum's value at a row would depend on where it began: float windows are
+// summed afresh at every multiple of this many intermediate rows, which makes each row's value the same in
+// every tiling. Integer sums are exact and need no restart.
+inline int RestartPeriod(int whole) noexcept {
+    return 64 * ((2 * whole + 1 + 63) / 64);
+}
+
+// Non-negative remainder of value by period.
+inline int FloorMod(int value, int period) noexcept {
+    const int r = value % period;
+    return r < 0 ? r + period : r;
+}
+
 // The enclosing whole-pixel rectangle of rect (pixel edges) under the rotation of plan, with a tolerance of
 // 1e-6 so that edges that land on whole numbers stay there.
 Kernel::RectT<int> RotatedBounds(const Kernel::RectT<int>& rect, double cosine, double sine, double pivotX,

@@ -16,19 +16,6 @@ inline constexpr int Band = 32;
 inline constexpr int LineGroup = 8;
 inline constexpr int LineChunk = 64;
 
-// Float sums round, so a running sum's value at a row would depend on where it began: float windows are
-// summed afresh at every multiple of this many intermediate rows, which makes each row's value the same in
-// every tiling. Integer sums are exact and need no restart.
-inline int RestartPeriod(int whole) noexcept {
-    return 64 * ((2 * whole + 1 + 63) / 64);
-}
-
-// Non-negative remainder of value by period.
-inline int FloorMod(int value, int period) noexcept {
-    const int r = value % period;
-    return r < 0 ? r + period : r;
-}
-
 // Which line of the box the resample out of a destination row starts its sample in, as a function of x: the
 // sampler's own arithmetic (clamp, floor), monotonic in x, so that a band's pixels in a row are one run.
 class LineOfPixel {

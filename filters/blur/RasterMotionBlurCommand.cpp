@@ -1,8 +1,9 @@
 #include "filters/blur/RasterMotionBlurCommand.h"
 
 #include "filters/blur/BlurPixels.h"
+#include "filters/blur/MotionBlurDevice.h"
 #include "frame/Registration.h"
-#include "pipeline/ProcessorOnlyRender.h"
+#include "pipeline/StepsRender.h"
 
 #include <algorithm>
 #include <cmath>
@@ -169,26 +170,33 @@ bool RasterMotionBlurCommand::PrepareOutputRectangle(Kernel::RectT<double>& rect
 }
 
 RenderPath RasterMotionBlurCommand::Render(const RenderTarget& target) const {
-    Kernel::RectT<int> rect;
-    if (const RenderPath ready = BeginProcessorOnlyRender(target, rect); ready != RenderPath::Processor)
-        return ready;
-    const Raster::DynamicBuffer& destination = *target.destination.pixels;
-    const Raster::PixelFormat format = destination.GetFormat();
-    const MotionBlurRender::Plan plan =
-        MakePlan(rect, destination.GetWidth(), destination.GetHeight(), target.transform);
-    RenderPath path = RenderPath::Failed;
-    LayerFormatList::Dispatch(format, [&](auto tag) {
-        constexpr Raster::PixelFormat F = decltype(tag)::value;
-        if (plan.whole == 0 && plan.fraction == 0.0f) { // a box of one row: the source itself
-            CopyRect<F>(target, rect);
-            path = RenderPath::Processor;
-        } else {
-            path = MotionBlurRender::Run<F>(target, rect, plan);
-        }
-        return true;
-    });
-    if (path == RenderPath::Processor) Detail::MarkProcessorResult(target, rect);
-    return path;
+    auto planFor = [&](const Kernel::RectT<int>& rect) {
+        const Raster::DynamicBuffer& destination = *target.destination.pixels;
+        return MakePlan(rect, destination.GetWidth(), destination.GetHeight(), target.transform);
+    };
+    auto onDevice = [&](const Kernel::RectT<int>& rect) {
+        return MotionBlurDevice::Run(target, rect, planFor(rect));
+    };
+    auto onProcessor = [&](const Kernel::RectT<int>& rect) {
+        const MotionBlurRender::Plan plan = planFor(rect);
+        RenderPath path = RenderPath::Failed;
+        LayerFormatList::Dispatch(target.destination.pixels->GetFormat(), [&](auto tag) {
+            constexpr Raster::PixelFormat F = decltype(tag)::value;
+            if (plan.whole == 0 && plan.fraction == 0.0f) { // a box of one row: the source itself
+                CopyRect<F>(target, rect);
+                path = RenderPath::Processor;
+            } else {
+                path = MotionBlurRender::Run<F>(target, rect, plan);
+            }
+            return true;
+        });
+        return path;
+    };
+    return RenderInSteps(target, onDevice, onProcessor);
+}
+
+bool RasterMotionBlurCommand::PrepareDevice(const RenderTarget& target) const {
+    return MotionBlurDevice::KernelsReady(target, true);
 }
 
 Kernel::RectT<int>

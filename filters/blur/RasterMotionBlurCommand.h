@@ -33,11 +33,10 @@ public:
     MotionBlurRender::Plan MakePlan(const Kernel::RectT<int>& rect, int width, int height,
                                     const Raster::AffineTransform::Params& view) const noexcept;
 
-    // Renders on the processor for every layer format (source and destination of one format). There is no
-    // kernel yet: a target with a device renders on the processor alike, and PrepareDevice says false.
+    // Renders every layer format (source and destination of one format) with the device's steps when the
+    // target has a device whose kernels are compiled, else on the processor; both give the same pixels.
     RenderPath Render(const RenderTarget& target) const override;
-    bool PrepareDevice(const RenderTarget&) const override { return false; }
-    bool HasDeviceKernel() const override { return false; }
+    bool PrepareDevice(const RenderTarget& target) const override;
     // The whole raster (cut to the selection) on the processor.
     Kernel::RectT<int> DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const override;
 

@@ -1,7 +1,8 @@
 #include "filters/tonal/RasterUnsharpMaskCommand.h"
 
+#include "filters/tonal/UnsharpMaskDevice.h"
 #include "frame/Registration.h"
-#include "pipeline/ProcessorOnlyRender.h"
+#include "pipeline/StepsRender.h"
 
 #include <algorithm>
 #include <cmath>
@@ -61,19 +62,23 @@ UnsharpMaskRender::Plan RasterUnsharpMaskCommand::MakePlan() const {
 }
 
 RenderPath RasterUnsharpMaskCommand::Render(const RenderTarget& target) const {
-    Kernel::RectT<int> rect;
-    if (const RenderPath ready = BeginProcessorOnlyRender(target, rect); ready != RenderPath::Processor)
-        return ready;
-    const Raster::DynamicBuffer& destination = *target.destination.pixels;
-    const Raster::PixelFormat format = destination.GetFormat();
     const UnsharpMaskRender::Plan plan = MakePlan();
-    RenderPath path = RenderPath::Failed;
-    LayerFormatList::Dispatch(format, [&](auto tag) {
-        path = UnsharpMaskRender::Run<decltype(tag)::value>(target, rect, plan);
-        return true;
-    });
-    if (path == RenderPath::Processor) Detail::MarkProcessorResult(target, rect);
-    return path;
+    auto onDevice = [&](const Kernel::RectT<int>& rect) {
+        return UnsharpMaskDevice::Run(target, rect, plan);
+    };
+    auto onProcessor = [&](const Kernel::RectT<int>& rect) {
+        RenderPath path = RenderPath::Failed;
+        LayerFormatList::Dispatch(target.destination.pixels->GetFormat(), [&](auto tag) {
+            path = UnsharpMaskRender::Run<decltype(tag)::value>(target, rect, plan);
+            return true;
+        });
+        return path;
+    };
+    return RenderInSteps(target, onDevice, onProcessor);
+}
+
+bool RasterUnsharpMaskCommand::PrepareDevice(const RenderTarget& target) const {
+    return UnsharpMaskDevice::KernelsReady(target, true);
 }
 
 Kernel::RectT<int>

@@ -25,11 +25,10 @@ public:
     // The Gaussian (standard deviation radius / 6, cut off at the margin), factor and threshold.
     UnsharpMaskRender::Plan MakePlan() const;
 
-    // Renders on the processor for every layer format (source and destination of one format). There is no
-    // kernel yet: a target with a device renders on the processor alike, and PrepareDevice says false.
+    // Renders every layer format (source and destination of one format) with the device's steps when the
+    // target has a device whose kernels are compiled, else on the processor; both give the same pixels.
     RenderPath Render(const RenderTarget& target) const override;
-    bool PrepareDevice(const RenderTarget&) const override { return false; }
-    bool HasDeviceKernel() const override { return false; }
+    bool PrepareDevice(const RenderTarget& target) const override;
     Kernel::RectT<int> DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const override;
 
     const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }

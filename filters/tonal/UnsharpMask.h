@@ -27,6 +27,13 @@ struct UnsharpMaskFilter {
     // The drag shows the radius: one document unit of drag per pixel of radius.
     static constexpr double kDragScale = 1.0;
 
+    // A sharpening with every difference counted and one that leaves small differences alone, for the
+    // conformance tests.
+    static constexpr std::array<Params, 2> kSamples{{
+        {5.0, 1.5, 0.0},
+        {12.0, 0.8, 0.05},
+    }};
+
     static constexpr std::array<Parameter<Params>, 3> kParameters{{
         {{.name = "radius",
           .type = ParameterType::Double,

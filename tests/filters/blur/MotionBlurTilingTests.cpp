@@ -23,17 +23,33 @@ constexpr PixelFormat kLayerFormats[] = {PixelFormat::RGBA8, PixelFormat::RGBA16
 // Radius and angle: whole and fractional radii, a quarter turn and turns that resample.
 constexpr std::pair<double, double> kCases[] = {{5.0, 0.0}, {3.5, 0.6}, {9.0, 2.2}, {20.0, -1.0}};
 
-Kernel::Counted<Raster::DynamicBuffer>
-Render(const RasterMotionBlurCommand& command, const Kernel::Counted<Raster::DynamicBuffer>& source, int tile,
-       const Kernel::Counted<Raster::HardwareDevice>& device = nullptr) {
+// What a render goes through besides the source: a selection, a channel write mask, a view transform.
+struct Extras {
+    Kernel::Counted<Raster::DynamicBuffer> mask;
+    int channelMask = -1;
+    Raster::AffineTransform::Params view;
+};
+
+// The render of source in tiles of tile × tile (0: whole), shifted off the origin, on the processor or, with
+// a device, on the device for every tile.
+Kernel::Counted<Raster::DynamicBuffer> Render(const RasterMotionBlurCommand& command,
+                                              const Kernel::Counted<Raster::DynamicBuffer>& source, int tile,
+                                              const Kernel::Counted<Raster::HardwareDevice>& device = nullptr,
+                                              const Extras& extras = {}) {
     RasterTools::RenderTarget target;
     target.source.pixels = source;
     target.destination.pixels = PipelineTest::MakeDestination(command, *source);
     target.bounds = {0.0, 0.0, double(source->GetWidth()), double(source->GetHeight())};
     target.device = device;
+    target.mask.pixels = extras.mask;
+    target.channelMask = extras.channelMask;
+    target.transform = extras.view;
+    if (device) {
+        EXPECT_TRUE(command.PrepareDevice(target)) << Raster::GetLastHardwareError();
+    }
     const auto paths = PipelineTest::RenderTiled(command, target, tile, tile, tile ? 7 : 0, tile ? 3 : 0);
     EXPECT_EQ(paths.other, 0);
-    EXPECT_EQ(paths.device, 0) << "there is no kernel: every tile renders on the processor";
+    EXPECT_EQ(device ? paths.processor : paths.device, 0) << "tiles took the other path";
     return target.destination.pixels;
 }
 
@@ -71,6 +87,11 @@ TEST(MotionBlurTiling, FloatSumsAgreeInEveryTilingAtFullPrecision) {
             EXPECT_FALSE(difference) << "radius " << radius << " angle " << radians << " tile " << tile
                                      << ": " << difference->Describe();
         }
+        if (const auto device = PipelineTest::OpenCLDevice()) {
+            const auto difference = PipelineTest::Compare(*whole, *Render(command, source, 37, device));
+            EXPECT_FALSE(difference) << "radius " << radius << " angle " << radians
+                                     << " on the device: " << difference->Describe();
+        }
     }
 }
 
@@ -107,16 +128,36 @@ TEST(MotionBlurTiling, TheRowsWorkedOutCoverEverySampleOfTheResampleOut) {
         }
 }
 
-TEST(MotionBlurTiling, ADeviceChangesNothing) {
+// The device's three steps give the processor's pixels: the copy of radius 0, the fractional and the
+// whole-radius blur, through a selection and a channel write mask, under a zoom, and for floats over windows
+// long enough that their sums restart inside the image.
+TEST(MotionBlurTiling, TheDeviceGivesTheProcessorsPixels) {
     REQUIRE_OPENCL(device);
-    for (const PixelFormat format : {PixelFormat::RGBA8, PixelFormat::RGBAUF, PixelFormat::LabA16}) {
-        const auto source = PipelineTest::MakeImage(format, 64, 40, 5);
-        const RasterMotionBlurCommand command(false, 6.0, 0.8);
-        EXPECT_FALSE(command.PrepareDevice({}));
-        EXPECT_FALSE(
-            PipelineTest::Compare(*Render(command, source, 32), *Render(command, source, 32, device)))
-            << Raster::GetPixelFormatName(format);
-    }
+    Extras selected;
+    selected.mask = PipelineTest::MakeImage(PixelFormat::MaskA8, 45, 170, 9);
+    selected.channelMask = 0b1011; // for IA formats: grey and alpha
+    Extras zoomed;
+    zoomed.view.m = {2.0, 0.0, 0.0, 0.0, 2.0, 0.0};
+    struct Case {
+        double radius, radians;
+        const Extras* extras;
+    };
+    const Case cases[] = {{0.0, 0.7, nullptr},  {3.5, 0.6, &selected}, {16.0, 1.5707963267948966, nullptr},
+                          {40.0, 2.7, nullptr}, {6.25, -1.0, &zoomed}, {70.0, 1.45, &selected}};
+    for (const PixelFormat format : kLayerFormats)
+        for (const Case& c : cases) {
+            const auto source = PipelineTest::MakeImage(format, 45, 170, 13);
+            const RasterMotionBlurCommand command(false, c.radius, c.radians);
+            const Extras extras = c.extras ? *c.extras : Extras{};
+            const auto reference = Render(command, source, 0, nullptr, extras);
+            for (const int tile : {0, 23}) {
+                const auto difference =
+                    PipelineTest::Compare(*reference, *Render(command, source, tile, device, extras));
+                EXPECT_FALSE(difference)
+                    << Raster::GetPixelFormatName(format) << " radius " << c.radius << " angle " << c.radians
+                    << " tile " << tile << ": " << difference->Describe();
+            }
+        }
 }
 
 TEST(MotionBlurTiling, AnAbortEndsTheRenderAndFreesTheScratchImages) {

@@ -1,5 +1,6 @@
 // Unsharp mask pixels: flat images stay flat, an edge gains contrast on both sides, the threshold leaves
-// small differences alone, and renders agree whole and in tiles in every layer format.
+// small differences alone, and renders agree whole and in tiles, on the processor and the device, in every
+// layer format.
 #include "PipelineTestSupport.h"
 #include "filters/tonal/RasterUnsharpMaskCommand.h"
 #include "pipeline/RenderJob.h"
@@ -13,14 +14,24 @@ namespace {
 using Raster::PixelFormat;
 using RasterTools::RasterUnsharpMaskCommand;
 
-Kernel::Counted<Raster::DynamicBuffer> Sharpen(const RasterUnsharpMaskCommand& command,
-                                               const Kernel::Counted<Raster::DynamicBuffer>& source,
-                                               int tile = 0) {
+// The render of source in tiles of tile × tile (0: whole), on the processor or, given a device, on the
+// device for every tile; through a selection and a channel write mask when given.
+Kernel::Counted<Raster::DynamicBuffer>
+Sharpen(const RasterUnsharpMaskCommand& command, const Kernel::Counted<Raster::DynamicBuffer>& source,
+        int tile = 0, const Kernel::Counted<Raster::HardwareDevice>& device = nullptr,
+        const Kernel::Counted<Raster::DynamicBuffer>& mask = nullptr, int channelMask = -1) {
     RasterTools::RenderTarget target;
     target.source.pixels = source;
     target.destination.pixels = PipelineTest::MakeDestination(command, *source);
+    target.mask.pixels = mask;
+    target.channelMask = channelMask;
+    target.device = device;
+    if (device) {
+        EXPECT_TRUE(command.PrepareDevice(target)) << Raster::GetLastHardwareError();
+    }
     const auto paths = PipelineTest::RenderTiled(command, target, tile, tile, tile ? 5 : 0, tile ? 9 : 0);
     EXPECT_EQ(paths.other, 0);
+    EXPECT_EQ(device ? paths.processor : paths.device, 0) << "tiles took the other path";
     return target.destination.pixels;
 }
 
@@ -82,6 +93,32 @@ TEST(UnsharpMaskPixels, TheThresholdLeavesSmallDifferencesAlone) {
     const auto large = Edge(60, 190);
     const auto result = Sharpen(strict, large);
     EXPECT_LT(int(result->Row<std::uint8_t>(4)[4 * 15]), 60);
+}
+
+// The device's two passes give the processor's pixels, with and without a selection and a channel write
+// mask, with a threshold and without, whole and in tiles.
+TEST(UnsharpMaskPixels, TheDeviceGivesTheProcessorsPixels) {
+    REQUIRE_OPENCL(device);
+    const auto mask = PipelineTest::MakeImage(PixelFormat::MaskA8, 45, 38, 4);
+    for (const PixelFormat format :
+         {PixelFormat::RGBA8, PixelFormat::RGBA16, PixelFormat::RGBAUF, PixelFormat::IA8, PixelFormat::IA16,
+          PixelFormat::CMYKA8, PixelFormat::LabA16}) {
+        const auto source = PipelineTest::MakeImage(format, 45, 38, 8);
+        const RasterUnsharpMaskCommand sharp(false, 3.0, 2.5, 0.0), gentle(false, 10.0, 0.8, 0.02);
+        for (const auto* command : {&sharp, &gentle}) {
+            const bool masked = command == &gentle;
+            const auto reference =
+                Sharpen(*command, source, 0, nullptr, masked ? mask : nullptr, masked ? 0b1101 : -1);
+            for (const int tile : {0, 16}) {
+                const auto difference = PipelineTest::Compare(
+                    *reference,
+                    *Sharpen(*command, source, tile, device, masked ? mask : nullptr, masked ? 0b1101 : -1));
+                EXPECT_FALSE(difference)
+                    << Raster::GetPixelFormatName(format) << " radius " << command->GetParameters().radius
+                    << " tile " << tile << ": " << difference->Describe();
+            }
+        }
+    }
 }
 
 TEST(UnsharpMaskPixels, WholeAndTiledRendersAgreeInEveryFormat) {

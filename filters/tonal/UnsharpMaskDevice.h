@@ -1,0 +1,17 @@
+#pragma once
+// The unsharp mask on the device: the Gaussian across rows into a scratch buffer, then down columns with the
+// sharpening, with the processor's pixels.
+
+#include "filters/tonal/UnsharpMaskRender.h"
+
+namespace RasterTools::UnsharpMaskDevice {
+
+// Whether the target's device has the kernels for its format compiled; the first call starts them compiling
+// (with wait, blocks until they are done). False without a device.
+bool KernelsReady(const RenderTarget& target, bool wait);
+
+// Renders rect (clipped, not empty) of the target's destination on its device; false, with the destination
+// left for the processor to render, on any refusal or failure.
+bool Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const UnsharpMaskRender::Plan& plan);
+
+} // namespace RasterTools::UnsharpMaskDevice
