@@ -90,6 +90,12 @@ DeviceKernelTable<Kernels> Programs(Build);
 
 } // namespace
 
+std::vector<DeviceKernelText> GetKernelTexts(Raster::HardwareKernelLanguage language,
+                                             Raster::PixelFormat format) {
+    const Kernels kernels = Build(language, format);
+    return {kernels.across, kernels.sharpen};
+}
+
 bool KernelsReady(const RenderTarget& target, bool wait) {
     const Kernels* kernels = Programs.Find(target);
     return kernels &&

@@ -2,7 +2,10 @@
 // Compiling a pipeline's language-0 (CUDA C++) kernel text with NVRTC, as the pipeline and filter tests do.
 
 #include "host/raster/device/CudaCompiler.h"
+#include "pipeline/DeviceSteps.h"
 #include "pipeline/KernelAssembly.h"
+
+#include <vector>
 
 #include <gtest/gtest.h>
 
@@ -20,6 +23,17 @@ void ExpectLanguageZeroCompiles(const RasterTools::KernelShape& shape) {
     EXPECT_TRUE(ptx.ptx) << Raster::GetPixelFormatName(shape.source) << " to "
                          << Raster::GetPixelFormatName(shape.dest) << ":\n"
                          << ptx.log;
+}
+
+// Expects every kernel of a filter's own device steps to compile to PTX; a failure names the entry point and
+// the format and carries the compiler's log.
+inline void ExpectStepsCompile(const std::vector<RasterTools::DeviceKernelText>& kernels,
+                               Raster::PixelFormat format) {
+    for (const auto& kernel : kernels) {
+        const auto ptx = Raster::CompileToPtx(kernel.text, kernel.entryPoint);
+        EXPECT_TRUE(ptx.ptx) << kernel.entryPoint << " for " << Raster::GetPixelFormatName(format) << ":\n"
+                             << ptx.log;
+    }
 }
 
 } // namespace PipelineTest

@@ -1,8 +1,10 @@
 // Motion blur renders of every layer format agree whole and in tiles, with or without a device, and an
 // abort in the middle of a render ends it cleanly (the scratch images are freed: run under ASan).
 #include "PipelineTestSupport.h"
+#include "filters/blur/MotionBlurDevice.h"
 #include "filters/blur/RasterMotionBlurCommand.h"
 #include "pipeline/RenderJob.h"
+#include "tests/pipeline/LanguageZeroCheck.h"
 
 #include <gtest/gtest.h>
 
@@ -158,6 +160,16 @@ TEST(MotionBlurTiling, TheDeviceGivesTheProcessorsPixels) {
                     << " tile " << tile << ": " << difference->Describe();
             }
         }
+}
+
+TEST(MotionBlurTiling, LanguageZeroStepsCompileWithNvrtcForEveryFormat) {
+    if (!Raster::IsNvrtcAvailable())
+        GTEST_SKIP() << "NVRTC is not installed, so language-0 text cannot be compiled here ("
+                     << Raster::DescribeNvrtc() << ")";
+    for (const PixelFormat format : kLayerFormats)
+        PipelineTest::ExpectStepsCompile(
+            RasterTools::MotionBlurDevice::GetKernelTexts(Raster::HardwareKernelLanguage::CudaCpp, format),
+            format);
 }
 
 TEST(MotionBlurTiling, AnAbortEndsTheRenderAndFreesTheScratchImages) {

@@ -3,7 +3,9 @@
 // layer format.
 #include "PipelineTestSupport.h"
 #include "filters/tonal/RasterUnsharpMaskCommand.h"
+#include "filters/tonal/UnsharpMaskDevice.h"
 #include "pipeline/RenderJob.h"
+#include "tests/pipeline/LanguageZeroCheck.h"
 
 #include <gtest/gtest.h>
 
@@ -13,6 +15,10 @@ namespace {
 
 using Raster::PixelFormat;
 using RasterTools::RasterUnsharpMaskCommand;
+
+constexpr PixelFormat kFormats[] = {PixelFormat::RGBA8, PixelFormat::RGBA16, PixelFormat::RGBAUF,
+                                    PixelFormat::IA8,   PixelFormat::IA16,   PixelFormat::CMYKA8,
+                                    PixelFormat::LabA16};
 
 // The render of source in tiles of tile × tile (0: whole), on the processor or, given a device, on the
 // device for every tile; through a selection and a channel write mask when given.
@@ -100,9 +106,7 @@ TEST(UnsharpMaskPixels, TheThresholdLeavesSmallDifferencesAlone) {
 TEST(UnsharpMaskPixels, TheDeviceGivesTheProcessorsPixels) {
     REQUIRE_OPENCL(device);
     const auto mask = PipelineTest::MakeImage(PixelFormat::MaskA8, 45, 38, 4);
-    for (const PixelFormat format :
-         {PixelFormat::RGBA8, PixelFormat::RGBA16, PixelFormat::RGBAUF, PixelFormat::IA8, PixelFormat::IA16,
-          PixelFormat::CMYKA8, PixelFormat::LabA16}) {
+    for (const PixelFormat format : kFormats) {
         const auto source = PipelineTest::MakeImage(format, 45, 38, 8);
         const RasterUnsharpMaskCommand sharp(false, 3.0, 2.5, 0.0), gentle(false, 10.0, 0.8, 0.02);
         for (const auto* command : {&sharp, &gentle}) {
@@ -121,10 +125,18 @@ TEST(UnsharpMaskPixels, TheDeviceGivesTheProcessorsPixels) {
     }
 }
 
+TEST(UnsharpMaskPixels, LanguageZeroStepsCompileWithNvrtcForEveryFormat) {
+    if (!Raster::IsNvrtcAvailable())
+        GTEST_SKIP() << "NVRTC is not installed, so language-0 text cannot be compiled here ("
+                     << Raster::DescribeNvrtc() << ")";
+    for (const PixelFormat format : kFormats)
+        PipelineTest::ExpectStepsCompile(
+            RasterTools::UnsharpMaskDevice::GetKernelTexts(Raster::HardwareKernelLanguage::CudaCpp, format),
+            format);
+}
+
 TEST(UnsharpMaskPixels, WholeAndTiledRendersAgreeInEveryFormat) {
-    for (const PixelFormat format :
-         {PixelFormat::RGBA8, PixelFormat::RGBA16, PixelFormat::RGBAUF, PixelFormat::IA8, PixelFormat::IA16,
-          PixelFormat::CMYKA8, PixelFormat::LabA16}) {
+    for (const PixelFormat format : kFormats) {
         const auto source = PipelineTest::MakeImage(format, 45, 38, 8);
         const RasterUnsharpMaskCommand command(false, 10.0, 0.8, 0.02);
         const auto difference =
