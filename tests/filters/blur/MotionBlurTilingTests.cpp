@@ -162,6 +162,25 @@ TEST(MotionBlurTiling, TheDeviceGivesTheProcessorsPixels) {
         }
 }
 
+// Tiles on two threads take turns on the device (each holds the device-buffer semaphore for its three
+// steps) and share the job's mirrors; the image is the processor's. Run under TSan as well.
+TEST(MotionBlurTiling, TwoThreadsShareTheDevice) {
+    REQUIRE_OPENCL(device);
+    const auto source = PipelineTest::MakeImage(PixelFormat::RGBA16, 150, 120, 21);
+    const RasterMotionBlurCommand command(false, 11.5, 0.4);
+    const auto reference = Render(command, source, 0);
+    auto destination = PipelineTest::MakeDestination(command, *source);
+    RasterTools::RenderJobOptions options;
+    options.tileSize = 32;
+    options.threads = 2;
+    options.device = device;
+    const auto result = RasterTools::RenderImage(command, source, destination, nullptr, options);
+    ASSERT_TRUE(result.complete) << result.error;
+    EXPECT_EQ(result.processorTiles, 0);
+    const auto difference = PipelineTest::Compare(*reference, *destination);
+    EXPECT_FALSE(difference) << difference->Describe();
+}
+
 TEST(MotionBlurTiling, LanguageZeroStepsCompileWithNvrtcForEveryFormat) {
     if (!Raster::IsNvrtcAvailable())
         GTEST_SKIP() << "NVRTC is not installed, so language-0 text cannot be compiled here ("
