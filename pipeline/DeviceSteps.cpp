@@ -29,6 +29,9 @@ typedef long long rt_index;
 #define rt_fmaxf fmaxf
 )";
 
+// What Prolong hands a queued kernel: the retentions, shared with the render.
+class StepsProlongation final : public Raster::Prolongation {};
+
 } // namespace
 
 Raster::HardwareKernelDescriptor DeviceKernelText::Descriptor() const {
@@ -98,6 +101,13 @@ DeviceSteps::DeviceSteps(const RenderTarget& target, const Kernel::RectT<int>& r
 
 Kernel::Counted<Raster::HardwareBuffer> DeviceSteps::Scratch(int width, int height, int bytesPerPixel) const {
     return Raster::CreateHardwareBuffer(m_Device, nullptr, 0, width, height, bytesPerPixel);
+}
+
+Kernel::Counted<Raster::Prolongation> DeviceSteps::Prolong() const {
+    auto prolongation = Kernel::MakeCounted<StepsProlongation>();
+    for (const Raster::HardwareRetention* retention : {&m_Source, &m_Destination, &m_MaskRetention})
+        if (*retention) prolongation->Keep(*retention);
+    return prolongation;
 }
 
 bool DeviceSteps::Run(const DeviceKernelText& kernel, int width, int height,

@@ -90,6 +90,9 @@ public:
                                             int(sizeof(Value)));
     }
 
+    // Keeps this render's retained buffers until a kernel queued with it is done.
+    Kernel::Counted<Raster::Prolongation> Prolong() const;
+
     // Runs one step over at least a width × height grid (whole 16 × 16 blocks: the kernel returns early for
     // ids beyond its sizes) and waits for it; false on an abort or any device failure.
     bool Run(const DeviceKernelText& kernel, int width, int height,

@@ -1,29 +1,9 @@
 // The device half of a render and the steps around the processor half.
 #include "pipeline/Pipeline.h"
 
+#include "pipeline/DeviceSteps.h"
+
 namespace RasterTools {
-
-namespace {
-
-using Raster::HardwareCache;
-
-// Keeps the retained buffers of one execution until its device work is done.
-class PipelineProlongation final : public Raster::Prolongation {
-public:
-    Raster::HardwareRetention source;
-    Raster::HardwareRetention destination;
-    Raster::HardwareRetention mask;
-};
-
-Kernel::Counted<HardwareCache> MirrorOf(const PipelineImage& image) {
-    return image.cache ? image.cache : HardwareCache::Create(image.pixels);
-}
-
-Raster::KernelImage Bound(const Raster::HardwareRetention& retention, const Raster::DynamicBuffer& image) {
-    return {retention.buffer, image.GetWidth(), image.GetHeight()};
-}
-
-} // namespace
 
 const char* DescribeRenderPath(RenderPath path) noexcept {
     switch (path) {
@@ -43,39 +23,23 @@ const char* DescribeRenderPath(RenderPath path) noexcept {
 
 bool ExecuteOnDevice(const RenderTarget& target, const Kernel::RectT<int>& rect,
                      const Raster::HardwareKernelDescriptor& descriptor, std::span<const float> params) {
+    DeviceSteps steps(target, rect);
+    if (!steps) return false;
     const Raster::HardwareDevice* device = target.device.Get();
-    // Held from before the syncs until the kernel is queued, so that renders never interleave retention.
-    Raster::HardwareBufferSemaphoreGuard guard = Raster::GetRetainHardwareBufferSemaphoreGuard(device);
-    if (Kernel::IsAborted(target.abort)) return false;
-
-    // A job's shared mirrors, or mirrors for this rectangle alone.
-    const Kernel::Counted<HardwareCache> destination = MirrorOf(target.destination);
-    const bool distinct = target.source.pixels != target.destination.pixels;
-    const Kernel::Counted<HardwareCache> source =
-        distinct ? MirrorOf(target.source) : (target.source.cache ? target.source.cache : destination);
-    const Kernel::Counted<HardwareCache> mask = target.mask ? MirrorOf(target.mask) : nullptr;
-    if (!destination || !source) return false;
-
-    if (!destination->SyncHardwareCache(device, rect)) return false;
-    if (!source->SyncHardwareCache(device, target.source.pixels->GetBounds())) return false;
-    if (mask && !mask->SyncHardwareCache(device, target.mask.pixels->GetBounds())) return false;
-
-    auto prolongation = Kernel::MakeCounted<PipelineProlongation>();
-    prolongation->destination = Raster::RetainHardwareBuffer(device, destination, rect);
-    prolongation->source = Raster::RetainHardwareBuffer(device, source, target.source.pixels->GetBounds());
-    if (mask)
-        prolongation->mask = Raster::RetainHardwareBuffer(device, mask, target.mask.pixels->GetBounds());
-    if (!prolongation->destination || !prolongation->source || (mask && !prolongation->mask)) return false;
     const Kernel::Counted<Raster::HardwareBuffer> identity = Raster::Hardware::GetIdentityBuffer(device);
     if (!identity) return false;
+    auto bound = [](const Kernel::Counted<Raster::HardwareBuffer>& buffer,
+                    const Raster::DynamicBuffer& image) {
+        return Raster::KernelImage{buffer, image.GetWidth(), image.GetHeight()};
+    };
 
     Raster::PipelineKernelExecution execution;
     execution.language = Raster::GetKernelLanguage(device);
     execution.device = device;
     execution.descriptor = &descriptor;
-    execution.source = Bound(prolongation->source, *target.source.pixels);
-    execution.destination = Bound(prolongation->destination, *target.destination.pixels);
-    execution.mask = mask ? Bound(prolongation->mask, *target.mask.pixels) : Raster::KernelImage{identity};
+    execution.source = bound(steps.Source(), *target.source.pixels);
+    execution.destination = bound(steps.Destination(), *target.destination.pixels);
+    execution.mask = target.mask ? bound(steps.Mask(), *target.mask.pixels) : Raster::KernelImage{identity};
     execution.secondaryMask = {identity};
     execution.sampler = {identity};
     execution.processPixels = identity;
@@ -83,15 +47,8 @@ bool ExecuteOnDevice(const RenderTarget& target, const Kernel::RectT<int>& rect,
     execution.rect = rect;
     execution.abort = target.abort;
     execution.name = "pipeline";
-    execution.prolongation = std::move(prolongation);
-    const bool done = Raster::ExecuteKernel(std::move(execution));
-    guard.Release();
-    if (!done) return false;
-
-    destination->InvalidateHostCache(rect);
-    // Nobody else will read back a mirror made for this rectangle alone.
-    if (!target.destination.cache && !destination->SyncHostCache(rect)) return false;
-    return true;
+    execution.prolongation = steps.Prolong();
+    return Raster::ExecuteKernel(std::move(execution)) && steps.Finish();
 }
 
 namespace Detail {
