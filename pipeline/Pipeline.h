@@ -227,6 +227,18 @@ void SetCompleted(bool* completed) noexcept;
 // when that worked, else Aborted or Failed.
 RenderPath PrepareHostCopies(const RenderTarget& target, const Kernel::RectT<int>& rect);
 void MarkProcessorResult(const RenderTarget& target, const Kernel::RectT<int>& rect);
+
+// The processor half of a render of rect once the device is out of it: completion reported, host copies
+// brought up to date, render() (Processor or Aborted), the destination's device copy marked stale.
+template <class Processor>
+RenderPath RenderOnProcessor(const RenderTarget& target, const Kernel::RectT<int>& rect, Processor&& render) {
+    SetCompleted(target.completed);
+    if (const RenderPath ready = PrepareHostCopies(target, rect); ready != RenderPath::Processor)
+        return ready;
+    const RenderPath path = render();
+    if (path == RenderPath::Processor) MarkProcessorResult(target, rect);
+    return path;
+}
 } // namespace Detail
 
 // Renders target.rect with the stages and parameters: clip; try the device; on failure count it, report
@@ -244,12 +256,9 @@ RenderPath Render(const RenderTarget& target, const typename Stages::Params& par
     }
     if (Kernel::IsAborted(target.abort)) return RenderPath::Aborted;
     Raster::Hardware::IncrementFailedKernels(target.device.Get());
-    Detail::SetCompleted(target.completed);
-    if (const RenderPath ready = Detail::PrepareHostCopies(target, rect); ready != RenderPath::Processor)
-        return ready;
-    if (!RunProcessor<Stages>(target, rect, params)) return RenderPath::Aborted;
-    Detail::MarkProcessorResult(target, rect);
-    return RenderPath::Processor;
+    return Detail::RenderOnProcessor(target, rect, [&] {
+        return RunProcessor<Stages>(target, rect, params) ? RenderPath::Processor : RenderPath::Aborted;
+    });
 }
 
 } // namespace RasterTools

@@ -34,12 +34,7 @@ RenderPath RenderInSteps(const RenderTarget& target, OnDevice&& onDevice, OnProc
         if (Kernel::IsAborted(target.abort)) return RenderPath::Aborted;
         Raster::Hardware::IncrementFailedKernels(target.device.Get());
     }
-    Detail::SetCompleted(target.completed);
-    if (const RenderPath ready = Detail::PrepareHostCopies(target, rect); ready != RenderPath::Processor)
-        return ready;
-    const RenderPath path = onProcessor(rect);
-    if (path == RenderPath::Processor) Detail::MarkProcessorResult(target, rect);
-    return path;
+    return Detail::RenderOnProcessor(target, rect, [&] { return onProcessor(rect); });
 }
 
 } // namespace RasterTools
