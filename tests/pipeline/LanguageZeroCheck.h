@@ -12,7 +12,7 @@
 namespace PipelineTest {
 
 // Expects the language-0 text that Stages assemble for shape to compile to PTX; a failure names the formats
-// and carries the compiler's log. Callers skip when NVRTC is missing (Raster::IsNvrtcAvailable).
+// and carries the compiler's log. Callers skip with REQUIRE_NVRTC() where NVRTC is missing.
 template <class Stages>
 void ExpectLanguageZeroCompiles(const RasterTools::KernelShape& shape) {
     const auto descriptor =
@@ -37,3 +37,9 @@ inline void ExpectStepsCompile(const std::vector<RasterTools::DeviceKernelText>&
 }
 
 } // namespace PipelineTest
+
+// Skips the test, saying why, where NVRTC is missing.
+#define REQUIRE_NVRTC()                                                                                      \
+    if (!Raster::IsNvrtcAvailable())                                                                         \
+    GTEST_SKIP() << "NVRTC is not installed, so language-0 text cannot be compiled here ("                   \
+                 << Raster::DescribeNvrtc() << ")"

@@ -182,9 +182,7 @@ TEST(MotionBlurTiling, TwoThreadsShareTheDevice) {
 }
 
 TEST(MotionBlurTiling, LanguageZeroStepsCompileWithNvrtcForEveryFormat) {
-    if (!Raster::IsNvrtcAvailable())
-        GTEST_SKIP() << "NVRTC is not installed, so language-0 text cannot be compiled here ("
-                     << Raster::DescribeNvrtc() << ")";
+    REQUIRE_NVRTC();
     for (const PixelFormat format : kLayerFormats)
         PipelineTest::ExpectStepsCompile(
             RasterTools::MotionBlurDevice::GetKernelTexts(Raster::HardwareKernelLanguage::CudaCpp, format),

@@ -189,9 +189,7 @@ TEST(DistortRender, AHalfTurnNearTheCentreSwapsNeighbours) {
 }
 
 TEST(DistortKernelText, LanguageZeroCompilesWithNvrtcForEveryFormat) {
-    if (!Raster::IsNvrtcAvailable())
-        GTEST_SKIP() << "NVRTC is not installed, so language-0 text cannot be compiled here ("
-                     << Raster::DescribeNvrtc() << ")";
+    REQUIRE_NVRTC();
     const auto check = [](auto stages, const KernelShape& shape) {
         PipelineTest::ExpectLanguageZeroCompiles<decltype(stages)>(shape);
     };

@@ -242,9 +242,7 @@ TEST(EdgeCommand, IsAOneShotRasterCommandInTheCatalogue) {
 }
 
 TEST(EdgeKernelText, LanguageZeroCompilesWithNvrtcForEveryFormat) {
-    if (!Raster::IsNvrtcAvailable())
-        GTEST_SKIP() << "NVRTC is not installed, so language-0 text cannot be compiled here ("
-                     << Raster::DescribeNvrtc() << ")";
+    REQUIRE_NVRTC();
     using namespace RasterTools;
     const auto check = [](auto stages, const KernelShape& shape) {
         PipelineTest::ExpectLanguageZeroCompiles<decltype(stages)>(shape);

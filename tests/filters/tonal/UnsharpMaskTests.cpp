@@ -126,9 +126,7 @@ TEST(UnsharpMaskPixels, TheDeviceGivesTheProcessorsPixels) {
 }
 
 TEST(UnsharpMaskPixels, LanguageZeroStepsCompileWithNvrtcForEveryFormat) {
-    if (!Raster::IsNvrtcAvailable())
-        GTEST_SKIP() << "NVRTC is not installed, so language-0 text cannot be compiled here ("
-                     << Raster::DescribeNvrtc() << ")";
+    REQUIRE_NVRTC();
     for (const PixelFormat format : kFormats)
         PipelineTest::ExpectStepsCompile(
             RasterTools::UnsharpMaskDevice::GetKernelTexts(Raster::HardwareKernelLanguage::CudaCpp, format),
