@@ -144,23 +144,59 @@ struct Planar<PixelFormat::RGBAUF> {
     }
 };
 
+// CMYKA8 pixels are five bytes: the four inks are moved as one 32-bit word (little-endian, cyan lowest) and
+// alpha on its own, so that the arithmetic runs on whole words. Pixels are read and written as 64-bit words
+// at five-byte steps, each overlapping the next pixel (which is written after it); the last moves its own
+// five.
+static_assert(sizeof(cmyka8) == 5 && std::endian::native == std::endian::little);
+inline void SplitCMYKA8(const cmyka8* in, std::uint32_t* inks, uchar* alpha, int n) noexcept {
+    const auto* bytes = reinterpret_cast<const unsigned char*>(in);
+    const auto split = [&](int i, std::size_t size) {
+        std::uint64_t word = 0;
+        std::memcpy(&word, bytes + 5 * i, size);
+        inks[i] = std::uint32_t(word);
+        alpha[i] = uchar(word >> 32);
+    };
+    for (int i = 0; i + 1 < n; ++i)
+        split(i, sizeof(std::uint64_t));
+    if (n > 0) split(n - 1, 5);
+}
+inline void MergeCMYKA8(const std::uint32_t* inks, const uchar* alpha, cmyka8* out, int n) noexcept {
+    auto* bytes = reinterpret_cast<unsigned char*>(out);
+    const auto merge = [&](int i, std::size_t size) {
+        const std::uint64_t word = inks[i] | std::uint64_t(alpha[i]) << 32;
+        std::memcpy(bytes + 5 * i, &word, size);
+    };
+    for (int i = 0; i + 1 < n; ++i)
+        merge(i, sizeof(std::uint64_t));
+    if (n > 0) merge(n - 1, 5);
+}
+
 template <>
 struct Planar<PixelFormat::CMYKA8> {
+    static float Ink(std::uint32_t inks, int channel) noexcept {
+        return float((inks >> 8 * channel) & 0xffu);
+    }
     static void ToWorking(const cmyka8* in, WorkingPlanes& w, int n) noexcept {
+        alignas(64) std::uint32_t inks[SpanLength];
+        alignas(64) uchar alpha[SpanLength];
+        SplitCMYKA8(in, inks, alpha, n);
 #pragma omp simd
         for (int i = 0; i < n; ++i) {
-            const float c = in[i].cmyk[0] * 0.003921569f;
-            const float m = in[i].cmyk[1] * 0.003921569f;
-            const float y = in[i].cmyk[2] * 0.003921569f;
-            const float k = in[i].cmyk[3] * 0.003921569f;
+            const float c = Ink(inks[i], 0) * 0.003921569f;
+            const float m = Ink(inks[i], 1) * 0.003921569f;
+            const float y = Ink(inks[i], 2) * 0.003921569f;
+            const float k = Ink(inks[i], 3) * 0.003921569f;
             w.r[i] = 1.0f - Min(1.0f, c * (1.0f - k) + k);
             w.g[i] = 1.0f - Min(1.0f, m * (1.0f - k) + k);
             w.b[i] = 1.0f - Min(1.0f, y * (1.0f - k) + k);
-            w.a[i] = in[i].a / 255.0f;
+            w.a[i] = float(alpha[i]) / 255.0f;
         }
     }
     // Pure black (k = 1) divides by 1 and then selects zero inks, instead of branching.
     static void FromWorking(const WorkingPlanes& w, cmyka8* out, int n) noexcept {
+        alignas(64) std::uint32_t inks[SpanLength];
+        alignas(64) uchar alpha[SpanLength];
 #pragma omp simd
         for (int i = 0; i < n; ++i) {
             const float r = Clamp01(w.r[i]), g = Clamp01(w.g[i]), b = Clamp01(w.b[i]);
@@ -173,8 +209,11 @@ struct Planar<PixelFormat::CMYKA8> {
             const float c = inked ? cInk : 0.0f;
             const float m = inked ? mInk : 0.0f;
             const float y = inked ? yInk : 0.0f;
-            out[i] = rt_make_cmyka8(ToByte(c), ToByte(m), ToByte(y), ToByte(k), ToByte(w.a[i]));
+            inks[i] = std::uint32_t(ToByte(c)) | std::uint32_t(ToByte(m)) << 8 |
+                      std::uint32_t(ToByte(y)) << 16 | std::uint32_t(ToByte(k)) << 24;
+            alpha[i] = ToByte(w.a[i]);
         }
+        MergeCMYKA8(inks, alpha, out, n);
     }
 };
 
@@ -193,11 +232,12 @@ inline constexpr bool IsWidening = (Source == PixelFormat::RGBA8 && Dest == Pixe
 template <PixelFormat Source, PixelFormat Dest>
 inline constexpr bool IsNarrowing = IsWidening<Dest, Source>;
 
-// n (at most one span) pixels from Source to Dest through the working planes.
-template <PixelFormat Source, PixelFormat Dest>
+// n (at most one span) pixels from Source to Dest through the working planes of Kit (Planar, or a kit of
+// the same arithmetic for one instruction set).
+template <PixelFormat Source, PixelFormat Dest, template <PixelFormat> class Kit = Planar>
 requires HasPlanarPair<Source, Dest>
-inline void ConvertSpan(const Raster::StoredPixel<Source>* in, Raster::StoredPixel<Dest>* out,
-                        int n) noexcept {
+inline void ConvertSpanInline(const Raster::StoredPixel<Source>* in, Raster::StoredPixel<Dest>* out,
+                              int n) noexcept {
     constexpr int Components = Raster::GetChannelCount(Source);
     if constexpr (IsWidening<Source, Dest>) {
         const auto* from = reinterpret_cast<const uchar*>(in);
@@ -213,9 +253,14 @@ inline void ConvertSpan(const Raster::StoredPixel<Source>* in, Raster::StoredPix
             to[i] = uchar((from[i] * 255u + 32895u) >> 16); // (v + 128) / 257 without a division
     } else {
         WorkingPlanes planes;
-        Planar<Source>::ToWorking(in, planes, n);
-        Planar<Dest>::FromWorking(planes, out, n);
+        Kit<Source>::ToWorking(in, planes, n);
+        Kit<Dest>::FromWorking(planes, out, n);
     }
 }
+
+// The same, compiled once per pair (SpanConversions.cpp) with an AVX2 clone beside the baseline one.
+template <PixelFormat Source, PixelFormat Dest>
+requires HasPlanarPair<Source, Dest>
+void ConvertSpan(const Raster::StoredPixel<Source>* in, Raster::StoredPixel<Dest>* out, int n) noexcept;
 
 } // namespace RasterTools::PlanarConvert

@@ -156,20 +156,37 @@ bool ProcessBase<ProcessType>::ProcessTile(const SourceModel* source, DestModel*
     InterleavedPixelSpan<DestFormat> result;
     MaskSpan weights;
 
-    // A plain copy between equal formats has nothing to compute: a row inside the source is one block.
-    constexpr bool PlainRowCopy = SameFormat && !HasMask && std::is_same_v<ProcessStage, Copy> &&
+    // A plain copy has nothing to compute: a row inside the source is one block, converted span by span
+    // straight from the source row into the destination row when the formats differ.
+    constexpr bool PlainRowCopy = !HasMask && std::is_same_v<ProcessStage, Copy> &&
                                   IsIdentityTransform<Transform> && requires {
         requires Sampler::IsNearest;
     }
     &&!Detail::IsConstantSource<SourceModel>;
+    const auto convertSpan = [](const StoredPixel<SourceFormat>* in, DestStored* out, int n) {
+        if constexpr (requires { Conversion::ConvertSpan(in, out, n); }) {
+            Conversion::ConvertSpan(in, out, n);
+        } else {
+            for (int i = 0; i < n; ++i)
+                out[i] = Conversion::Convert(in[i]);
+        }
+    };
 
     for (int y = rect.top; y < rect.bottom; ++y) {
         if (Kernel::IsAborted(options.abort)) return false;
         DestStored* row = dest->Row(y);
         if constexpr (PlainRowCopy) {
             if (writesAll && y < source->GetHeight() && rect.right <= source->GetWidth()) {
-                std::memcpy(row + rect.left, source->Row(y) + rect.left,
-                            std::size_t(rect.Width()) * sizeof(DestStored));
+                if constexpr (SameFormat) {
+                    std::memcpy(row + rect.left, source->Row(y) + rect.left,
+                                std::size_t(rect.Width()) * sizeof(DestStored));
+                } else {
+                    for (int x0 = rect.left; x0 < rect.right;) {
+                        const int n = std::min(rect.right - x0, SpanLength);
+                        convertSpan(source->Row(y) + x0, row + x0, n);
+                        x0 += n;
+                    }
+                }
                 continue;
             }
         }
@@ -184,12 +201,7 @@ bool ProcessBase<ProcessType>::ProcessTile(const SourceModel* source, DestModel*
             } else {
                 Detail::SampleSpan<SourceModel, Sampler, Transform, Extend>(*source, transform, samplerBlock,
                                                                             x0, y, n, sampled.pixels);
-                if constexpr (requires { Conversion::ConvertSpan(sampled.pixels, converted.pixels, n); }) {
-                    Conversion::ConvertSpan(sampled.pixels, converted.pixels, n);
-                } else {
-                    for (int i = 0; i < n; ++i)
-                        converted.pixels[i] = Conversion::Convert(sampled.pixels[i]);
-                }
+                convertSpan(sampled.pixels, converted.pixels, n);
             }
             if (needsDestination) std::memcpy(current.pixels, row + x0, std::size_t(n) * sizeof(DestStored));
             if constexpr (HasMask) Mask::ReadSpan(maskImage, maskParams->block, x0, y, weights);

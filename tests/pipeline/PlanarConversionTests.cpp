@@ -66,17 +66,25 @@ void ExpectSpanMatchesBodies() {
         for (int round = 0; round < 400; ++round) {
             const int n = 1 + round % Raster::SpanLength; // every span length, the short ones included
             StoredPixel<Source> in[Raster::SpanLength];
-            StoredPixel<Dest> span[Raster::SpanLength], single[Raster::SpanLength];
+            StoredPixel<Dest> span[Raster::SpanLength], portable[Raster::SpanLength],
+                single[Raster::SpanLength];
             FillRandom<Source>(in, n, random);
             std::memset(span, 0, sizeof span);
+            std::memset(portable, 0, sizeof portable);
             std::memset(single, 0, sizeof single);
+            // The library's span (the AVX2 form where the processor has it) and the portable loops.
             Conversion::ConvertSpan(in, span, n);
+            RasterTools::PlanarConvert::ConvertSpanInline<Source, Dest>(in, portable, n);
             for (int i = 0; i < n; ++i)
                 single[i] = Conversion::Convert(in[i]);
-            for (int i = 0; i < n; ++i)
+            for (int i = 0; i < n; ++i) {
                 ASSERT_EQ(std::memcmp(&span[i], &single[i], sizeof(StoredPixel<Dest>)), 0)
                     << Raster::GetPixelFormatName(Source) << " -> " << Raster::GetPixelFormatName(Dest)
                     << ", pixel " << i << " of " << n;
+                ASSERT_EQ(std::memcmp(&portable[i], &single[i], sizeof(StoredPixel<Dest>)), 0)
+                    << "portable " << Raster::GetPixelFormatName(Source) << " -> "
+                    << Raster::GetPixelFormatName(Dest) << ", pixel " << i << " of " << n;
+            }
         }
     }
 }
