@@ -7,6 +7,7 @@
 #include "pipeline/ConvertBodies.h"
 
 #include <charconv>
+#include <mutex>
 #include <vector>
 
 namespace RasterTools {
@@ -111,6 +112,62 @@ const char* GetConversionFragment(PixelFormat source, PixelFormat dest,
     }();
     if (!Raster::IsValidPixelFormat(source) || !Raster::IsValidPixelFormat(dest)) return nullptr;
     return table[static_cast<std::size_t>(source) * N + static_cast<std::size_t>(dest)].Get(language);
+}
+
+namespace {
+
+// Texts built on first use and kept for the process: one slot per key and language.
+template <std::size_t Keys>
+class LazyTexts {
+public:
+    template <class Build>
+    const char* Get(std::size_t key, Raster::HardwareKernelLanguage language, Build&& build) {
+        if (!Raster::IsKernelTextLanguage(language) || key >= Keys) return nullptr;
+        Slot& slot = m_Slots[key * 2 + static_cast<std::size_t>(language)];
+        std::call_once(slot.once, [&] { slot.text = build(); });
+        return slot.text.empty() ? nullptr : slot.text.c_str();
+    }
+
+private:
+    struct Slot {
+        std::once_flag once;
+        std::string text;
+    };
+    std::array<Slot, Keys * 2> m_Slots;
+};
+
+constexpr std::size_t N = Raster::PixelFormatCount;
+
+std::size_t Index(PixelFormat format) {
+    return static_cast<std::size_t>(format);
+}
+
+} // namespace
+
+const char* GetSamplerConversionFragment(PixelFormat source, PixelFormat dest, PixelFormat sampler,
+                                         Raster::HardwareKernelLanguage language) {
+    static LazyTexts<N * N * N> texts;
+    if (!Raster::IsValidPixelFormat(sampler)) return nullptr;
+    return texts.Get((Index(source) * N + Index(dest)) * N + Index(sampler), language, [&]() -> std::string {
+        const char* conversion = GetConversionFragment(source, dest, language);
+        const char* traits = Raster::GetTraitsFragment(sampler, Raster::KernelTraitsRole::Sampler, language);
+        const std::string_view toWorking = GetConvertPair(sampler).toWorking;
+        if (!conversion || !traits || toWorking.empty()) return {};
+        return Raster::GetSamplerConversionFragment(language, conversion, traits, toWorking);
+    });
+}
+
+const char* GetSamplerReferenceConversionFragment(PixelFormat dest, PixelFormat sampler,
+                                                  Raster::HardwareKernelLanguage language) {
+    static LazyTexts<N * N> texts;
+    if (!Raster::IsValidPixelFormat(dest) || !Raster::IsValidPixelFormat(sampler)) return nullptr;
+    return texts.Get(Index(dest) * N + Index(sampler), language, [&]() -> std::string {
+        const char* traits = Raster::GetTraitsFragment(sampler, Raster::KernelTraitsRole::Sampler, language);
+        const std::string_view toWorking = GetConvertPair(sampler).toWorking;
+        const std::string_view fromWorking = GetConvertPair(dest).fromWorking;
+        if (!traits || toWorking.empty() || fromWorking.empty()) return {};
+        return Raster::GetSamplerReferenceConversionFragment(language, fromWorking, traits, toWorking);
+    });
 }
 
 std::optional<int> ParseChannelMask(PixelFormat format, std::string_view text) {

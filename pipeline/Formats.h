@@ -34,6 +34,15 @@ ConvertPair GetColourOnlyConvertPair();
 // pixel. Null when a format has no conversions or the language is unknown.
 const char* GetConversionFragment(Raster::PixelFormat source, Raster::PixelFormat dest,
                                   Raster::HardwareKernelLanguage language);
+// Descriptor field 4 for a kernel that also reads a secondary sampler image of format sampler: the above,
+// then the sampler's traits, ConvertSamplerToWorking and ReadSampler. Null where a format has no conversions.
+const char* GetSamplerConversionFragment(Raster::PixelFormat source, Raster::PixelFormat dest,
+                                         Raster::PixelFormat sampler,
+                                         Raster::HardwareKernelLanguage language);
+// The same for a kernel without a source that renders from the sampler image: ConvertWorkingToDest, the
+// sampler's traits, ConvertSamplerToWorking, ReadSampler and ConvertSamplerToDest.
+const char* GetSamplerReferenceConversionFragment(Raster::PixelFormat dest, Raster::PixelFormat sampler,
+                                                  Raster::HardwareKernelLanguage language);
 
 // The channel write mask for text naming channels of format: a number (the mask itself), or the format's
 // channel names: one letter each ("rgb", "cmyka", "ia"), or comma-separated names where a name is longer

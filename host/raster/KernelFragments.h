@@ -42,6 +42,21 @@ std::string GetJointConversionFragment(HardwareKernelLanguage language, std::str
                                        std::string_view fromWorking);
 // Only ConvertWorkingToDest, for kernels without a source image.
 std::string GetNoSourceConversionFragment(HardwareKernelLanguage language, std::string_view fromWorking);
+// For kernels that also read a secondary sampler image (sampler_pixels, sampler_bounds) of its own format:
+// conversion (the identity or joint fragment above) followed by samplerTraits (the sampler format's traits in
+// the sampler role), `rgbauf_type ConvertSamplerToWorking(sampler_type source)` whose body is the sampler
+// format's samplerToWorking, and `rgbauf_type ReadSampler(int2 location, uint2 sampler_bounds,
+// constant_address_space void* sampler_pixels)`, the sampler pixel at location (clamped to the image's edges)
+// in working colour. Empty for an unknown language.
+std::string GetSamplerConversionFragment(HardwareKernelLanguage language, std::string_view conversion,
+                                         std::string_view samplerTraits, std::string_view samplerToWorking);
+// For kernels without a source that render from the sampler image as their reference: ConvertWorkingToDest
+// (fromWorking), the sampler's traits, ConvertSamplerToWorking and ReadSampler as above, and
+// `dest_type ConvertSamplerToDest(sampler_type source)` through the working pixel.
+std::string GetSamplerReferenceConversionFragment(HardwareKernelLanguage language,
+                                                  std::string_view fromWorking,
+                                                  std::string_view samplerTraits,
+                                                  std::string_view samplerToWorking);
 
 enum class BlendMode { Normal };
 // The Blend fragment of a blend mode.

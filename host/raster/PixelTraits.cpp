@@ -123,6 +123,10 @@ std::string BuildTraits(PixelFormat format, KernelTraitsRole role, HardwareKerne
         if (t.convertDest)
             text += "#define convert_dest(v) " + FormatKernelText(t.convertDest, {"(v)"}) + "\n";
         break;
+    case KernelTraitsRole::Sampler:
+        text += " sampler\n";
+        text += PixelRoleText(t, "sampler", "sampler_from_accumulator");
+        break;
     case KernelTraitsRole::Mask:
         text += " mask\n";
         text += "typedef " + std::string(t.stored) + " mask_type;\n";
@@ -158,6 +162,8 @@ const char* GetTraitsFragment(PixelFormat format, KernelTraitsRole role, Hardwar
         return CachedTraits<KernelTraitsRole::Dest>(format, language);
     case KernelTraitsRole::Mask:
         return CachedTraits<KernelTraitsRole::Mask>(format, language);
+    case KernelTraitsRole::Sampler:
+        return CachedTraits<KernelTraitsRole::Sampler>(format, language);
     }
     return nullptr;
 }

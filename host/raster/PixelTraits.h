@@ -145,13 +145,14 @@ inline void WriteChannels(StoredPixel<F>& target, const StoredPixel<F>& value, i
 // ---- Kernel traits text
 
 // What the traits fragment of a format defines depends on the role the format plays in a kernel.
-enum class KernelTraitsRole { Source, Dest, Mask };
+enum class KernelTraitsRole { Source, Dest, Mask, Sampler };
 
 // The traits fragment for one format in one role: the shared kernel math, then the role's names (for the
 // source role: source_type, source_accumulator_type, source_accumulator_literal, accumulator_from_source,
 // premultiplied_accumulator_from_source, postdivide_source, source_from_accumulator,
 // source_clamp_accumulator, source_maximum(), source_minimum(), source_middle(), source_channel_maximum();
-// the destination role the same with dest_ and convert_dest; the mask role mask_type and normalise_mask).
+// the destination role the same with dest_ and convert_dest; the mask role mask_type and normalise_mask; the
+// sampler role, for a secondary sampler image, the same as the source with sampler_).
 // Null for an unknown language.
 const char* GetTraitsFragment(PixelFormat format, KernelTraitsRole role, HardwareKernelLanguage language);
 // The mask traits of a kernel without a mask (mask_type is a byte, every weight 1).

@@ -158,8 +158,8 @@ bool ProcessBase<ProcessType>::ProcessTile(const SourceModel* source, DestModel*
 
     // A plain copy has nothing to compute: a row inside the source is one block, converted span by span
     // straight from the source row into the destination row when the formats differ.
-    constexpr bool PlainRowCopy = !HasMask && std::is_same_v<ProcessStage, Copy> &&
-                                  IsIdentityTransform<Transform> && requires {
+    constexpr bool PlainRowCopy =
+        !HasMask && std::is_same_v<ProcessStage, Copy> && IsIdentityTransform<Transform> && requires {
         requires Sampler::IsNearest;
     }
     &&!Detail::IsConstantSource<SourceModel>;

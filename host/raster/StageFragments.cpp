@@ -219,6 +219,63 @@ inline dest_type ConvertWorkingToDest(rgbauf_type source)
 }
 )";
 
+// %1 the sampler's traits, %2 the body of its conversion to working colour.
+constexpr const char* SamplerOpenCL = R"(
+%1
+#define Convert ConvertSamplerToWorking
+inline rgbauf_type Convert(sampler_type source)
+{
+
+%2
+
+}
+#undef Convert
+)";
+
+constexpr const char* SamplerCuda = R"(
+%1
+struct SamplerToWorking
+{
+    static inline rgbauf_type Convert(sampler_type source)
+    {
+
+%2
+
+    }
+};
+inline rgbauf_type ConvertSamplerToWorking(sampler_type source)
+{
+    return SamplerToWorking::Convert(source);
+}
+)";
+
+// Both languages.
+constexpr const char* SamplerReader =
+    R"(inline rgbauf_type ReadSampler(int2 location, uint2 sampler_bounds, constant_address_space void* sampler_pixels)
+{
+    const int x = rt_clampi(location.x, 0, (int)sampler_bounds.x - 1);
+    const int y = rt_clampi(location.y, 0, (int)sampler_bounds.y - 1);
+    return ConvertSamplerToWorking(((constant_address_space sampler_type*)sampler_pixels)[y * (int)sampler_bounds.x + x]);
+}
+)";
+
+constexpr const char* SamplerToDest = R"(inline dest_type ConvertSamplerToDest(sampler_type source)
+{
+    return ConvertWorkingToDest(ConvertSamplerToWorking(source));
+}
+)";
+
+std::string SamplerText(Language language, std::string_view traits, std::string_view toWorking) {
+    switch (language) {
+    case Language::OpenCLC:
+        return FormatKernelText(SamplerOpenCL, {traits, toWorking}) + SamplerReader;
+    case Language::CudaCpp:
+        return FormatKernelText(SamplerCuda, {traits, toWorking}) + SamplerReader;
+    default:
+        return {};
+    }
+}
+
 } // namespace
 
 const char* GetImageAccessFragment(KernelImageRole role, HardwareKernelLanguage language) {
@@ -307,6 +364,22 @@ std::string GetNoSourceConversionFragment(HardwareKernelLanguage language, std::
     default:
         return {};
     }
+}
+
+std::string GetSamplerConversionFragment(HardwareKernelLanguage language, std::string_view conversion,
+                                         std::string_view samplerTraits, std::string_view samplerToWorking) {
+    const std::string sampler = SamplerText(language, samplerTraits, samplerToWorking);
+    if (sampler.empty()) return {};
+    return std::string(conversion) + sampler;
+}
+
+std::string GetSamplerReferenceConversionFragment(HardwareKernelLanguage language,
+                                                  std::string_view fromWorking,
+                                                  std::string_view samplerTraits,
+                                                  std::string_view samplerToWorking) {
+    const std::string sampler = SamplerText(language, samplerTraits, samplerToWorking);
+    if (sampler.empty()) return {};
+    return GetNoSourceConversionFragment(language, fromWorking) + sampler + SamplerToDest;
 }
 
 } // namespace Raster
