@@ -74,6 +74,7 @@ DeviceSteps::DeviceSteps(const RenderTarget& target, const Kernel::RectT<int>& r
     , m_Device(target.device.Get())
     , m_Guard(Raster::GetRetainHardwareBufferSemaphoreGuard(m_Device)) {
     if (!m_Device || Kernel::IsAborted(target.abort)) return;
+    m_Queue = m_Device->GetHardwareWriteQueue();
     auto mirror = [](const PipelineImage& image) {
         return image.cache ? image.cache : Raster::HardwareCache::Create(image.pixels);
     };
@@ -88,10 +89,11 @@ DeviceSteps::DeviceSteps(const RenderTarget& target, const Kernel::RectT<int>& r
     if (!m_DestinationCache->SyncHardwareCache(m_Device, rect)) return;
     if (!source->SyncHardwareCache(m_Device, sourceBounds)) return;
     if (mask && !mask->SyncHardwareCache(m_Device, target.mask.pixels->GetBounds())) return;
-    m_Destination = Raster::RetainHardwareBuffer(m_Device, m_DestinationCache, rect);
-    m_Source = Raster::RetainHardwareBuffer(m_Device, source, sourceBounds);
+    m_Destination = Raster::RetainHardwareBuffer(m_Device, m_Queue, m_DestinationCache, rect);
+    m_Source = Raster::RetainHardwareBuffer(m_Device, m_Queue, source, sourceBounds);
     if (mask) {
-        m_MaskRetention = Raster::RetainHardwareBuffer(m_Device, mask, target.mask.pixels->GetBounds());
+        m_MaskRetention =
+            Raster::RetainHardwareBuffer(m_Device, m_Queue, mask, target.mask.pixels->GetBounds());
         m_Mask = m_MaskRetention.buffer;
     } else {
         m_Mask = Raster::Hardware::GetIdentityBuffer(m_Device);

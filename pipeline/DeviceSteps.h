@@ -75,6 +75,8 @@ public:
     // False when a mirror could not be synchronised or retained: render on the processor instead.
     explicit operator bool() const noexcept { return m_Ready; }
     const Kernel::Counted<Raster::HardwareBuffer>& Source() const noexcept { return m_Source.buffer; }
+    // The device's write queue, on which the images were retained.
+    const Raster::HardwareQueue& Queue() const noexcept { return m_Queue; }
     const Kernel::Counted<Raster::HardwareBuffer>& Destination() const noexcept {
         return m_Destination.buffer;
     }
@@ -105,6 +107,7 @@ private:
     const RenderTarget& m_Target;
     Kernel::RectT<int> m_Rect;
     const Raster::HardwareDevice* m_Device;
+    Raster::HardwareQueue m_Queue;
     Raster::HardwareBufferSemaphoreGuard m_Guard;
     Kernel::Counted<Raster::HardwareCache> m_DestinationCache;
     Raster::HardwareRetention m_Source, m_Destination, m_MaskRetention;

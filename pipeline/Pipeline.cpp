@@ -36,6 +36,7 @@ bool ExecuteOnDevice(const RenderTarget& target, const Kernel::RectT<int>& rect,
     Raster::PipelineKernelExecution execution;
     execution.language = Raster::GetKernelLanguage(device);
     execution.device = device;
+    execution.queue = steps.Queue();
     execution.descriptor = &descriptor;
     execution.source = bound(steps.Source(), *target.source.pixels);
     execution.destination = bound(steps.Destination(), *target.destination.pixels);

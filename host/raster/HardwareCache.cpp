@@ -172,9 +172,9 @@ std::size_t Prolongation::GetKeptCount() const {
     return m_Kept.size();
 }
 
-HardwareRetention RetainHardwareBuffer(const HardwareDevice* device,
+HardwareRetention RetainHardwareBuffer(const HardwareDevice* device, const HardwareQueue& queue,
                                        const Kernel::Counted<HardwareCache>& cache, const Rect& rect) {
-    if (!device || !cache || cache->GetDevice() != device) return {};
+    if (!device || !queue.IsOn(device) || !cache || cache->GetDevice() != device) return {};
     HardwareRetention retention;
     retention.buffer = cache->GetHardwareBuffer();
     if (!retention.buffer) return {};

@@ -102,9 +102,10 @@ private:
     std::vector<HardwareRetention> m_Kept;
 };
 
-// The mirror's device buffer for a kernel on device over rect; the mirror must already be synchronised to
-// device (SyncHardwareCache). Empty for another device or a mirror without a buffer.
-HardwareRetention RetainHardwareBuffer(const HardwareDevice* device,
+// The mirror's device buffer for a kernel on device's queue over rect; the mirror must already be
+// synchronised to device (SyncHardwareCache). Empty for another device, a queue that is not the device's, or
+// a mirror without a buffer.
+HardwareRetention RetainHardwareBuffer(const HardwareDevice* device, const HardwareQueue& queue,
                                        const Kernel::Counted<HardwareCache>& cache,
                                        const Kernel::RectT<int>& rect);
 

@@ -21,7 +21,7 @@ bool IsKernelPendingCompilation(const HardwareKernelDescriptor& descriptor, cons
 }
 
 bool ExecuteKernel(PipelineKernelExecution execution) {
-    if (!execution.device || !execution.descriptor) return false;
+    if (!execution.device || !execution.descriptor || !execution.queue.IsOn(execution.device)) return false;
     if (execution.language != GetKernelLanguage(execution.device)) return false;
     if (execution.mode != HardwareExecutionMode::Wait) return false;
     HardwareKernelArguments arguments;

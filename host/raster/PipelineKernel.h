@@ -32,6 +32,7 @@ struct PipelineKernelExecution {
     HardwareKernelLanguage language = HardwareKernelLanguage::None;
     HardwareExecutionMode mode = HardwareExecutionMode::Wait;
     const HardwareDevice* device = nullptr;
+    HardwareQueue queue; // the device's write queue
     // Released once the device work is complete.
     Kernel::Counted<Prolongation> prolongation;
     const HardwareKernelDescriptor* descriptor = nullptr;
@@ -44,8 +45,9 @@ struct PipelineKernelExecution {
 };
 
 // Runs the descriptor's per-pixel loop over execution.rect with the arguments in the loop's order. False
-// (nothing written) for a language other than the device's, a missing buffer, more than
-// MaxHardwareKernelParams parameters, an abort, or any device failure (see GetLastHardwareError).
+// (nothing written) for a language other than the device's, a queue that is not the device's, a missing
+// buffer, more than MaxHardwareKernelParams parameters, an abort, or any device failure (see
+// GetLastHardwareError).
 bool ExecuteKernel(PipelineKernelExecution execution);
 
 } // namespace Raster

@@ -34,6 +34,24 @@ class KernelCache;
 class BufferPool;
 } // namespace Detail
 
+class HardwareDevice;
+
+// A device's in-order command queue: uploads, kernels and read-backs put on one queue run in the order they
+// were put there. Each working device has one; a default-made queue is none.
+class HardwareQueue {
+public:
+    HardwareQueue() = default;
+    explicit operator bool() const noexcept { return m_Device != nullptr; }
+    const HardwareDevice* GetDevice() const noexcept { return m_Device; }
+    bool IsOn(const HardwareDevice* device) const noexcept { return m_Device && m_Device == device; }
+
+private:
+    friend class HardwareDevice;
+    explicit HardwareQueue(const HardwareDevice* device) noexcept
+        : m_Device(device) {}
+    const HardwareDevice* m_Device = nullptr;
+};
+
 // One compute device. Devices are created once by Hardware and live for the whole process.
 class HardwareDevice : public virtual Kernel::Countable {
 public:
@@ -53,6 +71,11 @@ public:
     HardwareKernelLanguage GetLanguage() const noexcept;
     // One line for logs and `rastertools info`: identifier, name and kind.
     std::string Describe() const;
+
+    // The queue that writes to images on this device go on; none for a describing-only device.
+    HardwareQueue GetHardwareWriteQueue() const noexcept {
+        return m_Implementation ? HardwareQueue(this) : HardwareQueue();
+    }
 
     // The device layer's own machinery; null for a describing-only device.
     Detail::DeviceBackEnd* GetImplementation() const noexcept { return m_Implementation.get(); }

@@ -194,14 +194,22 @@ TEST(HardwareCache, TracksWhichSideIsNewestAndCopiesOnlyThat) {
     ASSERT_TRUE(cache->GetHardwareBuffer()->Download(fresh->RowBytes(0), std::size_t(fresh->Stride())));
     EXPECT_EQ(fresh->Row<ushort4>(30)[40], make_ushort4(1, 2, 3, 4));
 
-    // A mirror serves one device; retention marks it in use until the lease goes.
+    // A mirror serves one device; retention on its write queue marks it in use until the lease goes.
+    const HardwareQueue queue = device->GetHardwareWriteQueue();
+    ASSERT_TRUE(queue.IsOn(device.Get()));
     {
-        const auto retained = RetainHardwareBuffer(device.Get(), cache, {0, 0, 5, 5});
+        const auto retained = RetainHardwareBuffer(device.Get(), queue, cache, {0, 0, 5, 5});
         ASSERT_TRUE(retained);
         EXPECT_EQ(cache->GetRetainCount(), 1);
     }
     EXPECT_EQ(cache->GetRetainCount(), 0);
-    EXPECT_FALSE(RetainHardwareBuffer(nullptr, cache, {0, 0, 5, 5}));
+    EXPECT_FALSE(RetainHardwareBuffer(nullptr, queue, cache, {0, 0, 5, 5}));
+    EXPECT_FALSE(RetainHardwareBuffer(device.Get(), HardwareQueue(), cache, {0, 0, 5, 5}));
+    // A device that only describes itself has no queue at all.
+    const Kernel::Counted<HardwareDevice> listed(
+        new HardwareDevice("listed", "opencl:9.9", HardwareBackEnd::OpenCL, HardwareDeviceKind::Cpu));
+    EXPECT_FALSE(listed->GetHardwareWriteQueue());
+    EXPECT_FALSE(RetainHardwareBuffer(device.Get(), listed->GetHardwareWriteQueue(), cache, {0, 0, 5, 5}));
 }
 
 } // namespace
