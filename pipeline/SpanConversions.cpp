@@ -19,7 +19,7 @@ bool HasAvx2() noexcept {
     return has;
 }
 template <PixelFormat Source, PixelFormat Dest>
-RT_TARGET_AVX2 [[gnu::flatten]] void ConvertSpanAvx2(const Raster::StoredPixel<Source>* in,
+[[gnu::flatten]] RT_TARGET_AVX2 void ConvertSpanAvx2(const Raster::StoredPixel<Source>* in,
                                                      Raster::StoredPixel<Dest>* out, int n) noexcept {
     ConvertSpanInline<Source, Dest, Avx2::Kit>(in, out, n);
 }
