@@ -194,60 +194,53 @@ inline dest_type ConvertSourceToDest(source_type source)
 }
 )";
 
-constexpr const char* NoSourceOpenCL = R"(#define Convert ConvertWorkingToDest
-inline dest_type Convert(rgbauf_type source)
+// One Convert body from argument to result, reached as the free function `function`: renamed by #define for
+// language 1; for language 0 a static member of `structure`, which the free function forwards to. %1
+// function, %2 structure, %3 result type, %4 argument type, %5 the body.
+constexpr const char* ConvertFunctionOpenCL = R"(#define Convert %1
+inline %3 Convert(%4 source)
 {
 
-%1
+%5
 
 }
 #undef Convert
 )";
 
-constexpr const char* NoSourceCuda = R"(struct WorkingToDest
+constexpr const char* ConvertFunctionCuda = R"(struct %2
 {
-    static inline dest_type Convert(rgbauf_type source)
+    static inline %3 Convert(%4 source)
     {
 
-%1
+%5
 
     }
 };
-inline dest_type ConvertWorkingToDest(rgbauf_type source)
+inline %3 %1(%4 source)
 {
-    return WorkingToDest::Convert(source);
+    return %2::Convert(source);
 }
 )";
 
-// %1 the sampler's traits, %2 the body of its conversion to working colour.
-constexpr const char* SamplerOpenCL = R"(
-%1
-#define Convert ConvertSamplerToWorking
-inline rgbauf_type Convert(sampler_type source)
-{
-
-%2
-
-}
-#undef Convert
-)";
-
-constexpr const char* SamplerCuda = R"(
-%1
-struct SamplerToWorking
-{
-    static inline rgbauf_type Convert(sampler_type source)
-    {
-
-%2
-
-    }
+struct ConvertFunction {
+    std::string_view function, structure, result, argument;
 };
-inline rgbauf_type ConvertSamplerToWorking(sampler_type source)
-{
-    return SamplerToWorking::Convert(source);
+constexpr ConvertFunction WorkingToDest{"ConvertWorkingToDest", "WorkingToDest", "dest_type", "rgbauf_type"};
+constexpr ConvertFunction SamplerToWorking{"ConvertSamplerToWorking", "SamplerToWorking", "rgbauf_type",
+                                           "sampler_type"};
+
+std::string ConvertFunctionText(Language language, const ConvertFunction& f, std::string_view body) {
+    const std::initializer_list<std::string_view> arguments{f.function, f.structure, f.result, f.argument,
+                                                            body};
+    switch (language) {
+    case Language::OpenCLC:
+        return FormatKernelText(ConvertFunctionOpenCL, arguments);
+    case Language::CudaCpp:
+        return FormatKernelText(ConvertFunctionCuda, arguments);
+    default:
+        return {};
+    }
 }
-)";
 
 // Both languages.
 constexpr const char* SamplerReader =
@@ -265,15 +258,11 @@ constexpr const char* SamplerToDest = R"(inline dest_type ConvertSamplerToDest(s
 }
 )";
 
+// The sampler's traits, ConvertSamplerToWorking and ReadSampler.
 std::string SamplerText(Language language, std::string_view traits, std::string_view toWorking) {
-    switch (language) {
-    case Language::OpenCLC:
-        return FormatKernelText(SamplerOpenCL, {traits, toWorking}) + SamplerReader;
-    case Language::CudaCpp:
-        return FormatKernelText(SamplerCuda, {traits, toWorking}) + SamplerReader;
-    default:
-        return {};
-    }
+    const std::string convert = ConvertFunctionText(language, SamplerToWorking, toWorking);
+    if (convert.empty()) return {};
+    return "\n" + std::string(traits) + "\n" + convert + SamplerReader;
 }
 
 } // namespace
@@ -356,14 +345,7 @@ std::string GetJointConversionFragment(HardwareKernelLanguage language, std::str
 }
 
 std::string GetNoSourceConversionFragment(HardwareKernelLanguage language, std::string_view fromWorking) {
-    switch (language) {
-    case Language::OpenCLC:
-        return FormatKernelText(NoSourceOpenCL, {fromWorking});
-    case Language::CudaCpp:
-        return FormatKernelText(NoSourceCuda, {fromWorking});
-    default:
-        return {};
-    }
+    return ConvertFunctionText(language, WorkingToDest, fromWorking);
 }
 
 std::string GetSamplerConversionFragment(HardwareKernelLanguage language, std::string_view conversion,
