@@ -41,9 +41,13 @@ RT_TARGET_AVX2 inline __m256i Pack(__m256i b0, __m256i b1, __m256i b2, __m256i b
     return _mm256_or_si256(_mm256_or_si256(b0, _mm256_slli_epi32(b1, 8)),
                            _mm256_or_si256(_mm256_slli_epi32(b2, 16), _mm256_slli_epi32(b3, 24)));
 }
+// Eight 32-bit lanes of values up to 65535 to eight 16-bit ones.
+RT_TARGET_AVX2 inline __m128i NarrowToWords(__m256i lanes) noexcept {
+    return _mm_packus_epi32(_mm256_castsi256_si128(lanes), _mm256_extracti128_si256(lanes, 1));
+}
 // Eight 32-bit lanes of whole bytes to eight bytes.
 RT_TARGET_AVX2 inline __m128i Narrow(__m256i bytes) noexcept {
-    const __m128i words = _mm_packus_epi32(_mm256_castsi256_si128(bytes), _mm256_extracti128_si256(bytes, 1));
+    const __m128i words = NarrowToWords(bytes);
     return _mm_packus_epi16(words, words);
 }
 
@@ -119,9 +123,7 @@ struct Kit<PixelFormat::IA8> {
             const __m256i alpha =
                 RoundInRange(Clamp(_mm256_mul_ps(_mm256_load_ps(w.a + i), maximum), 255.0f));
             const __m256i pairs = _mm256_or_si256(intensity, _mm256_slli_epi32(alpha, 8));
-            const __m128i narrowed =
-                _mm_packus_epi32(_mm256_castsi256_si128(pairs), _mm256_extracti128_si256(pairs, 1));
-            Store<sizeof(uchar2)>(narrowed, out, i, n);
+            Store<sizeof(uchar2)>(NarrowToWords(pairs), out, i, n);
         }
     }
 };

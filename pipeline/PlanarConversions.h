@@ -258,7 +258,7 @@ inline void ConvertSpanInline(const Raster::StoredPixel<Source>* in, Raster::Sto
     }
 }
 
-// The same, compiled once per pair (SpanConversions.cpp) with an AVX2 clone beside the baseline one.
+// The same, compiled once per pair (SpanConversions.cpp) for AVX2 and for any x86-64, picked at run time.
 template <PixelFormat Source, PixelFormat Dest>
 requires HasPlanarPair<Source, Dest>
 void ConvertSpan(const Raster::StoredPixel<Source>* in, Raster::StoredPixel<Dest>* out, int n) noexcept;
