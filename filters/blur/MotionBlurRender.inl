@@ -63,6 +63,49 @@ private:
     double m_Base;
 };
 
+#if RT_AVX2_BUILD
+// Step 2 for one line of a format of four integer components with alpha last: the running sum of the
+// portable loop below, with eight rows resolved at once. in[r] is the line's row r; rows first..last - 1 are
+// blurred into out[r], the sum starting at row start.
+template <Raster::PixelFormat F>
+RT_TARGET_AVX2 void BlurLineAvx2(const typename Blur::Layout<F>::T* in, typename Blur::Layout<F>::T* out,
+                                 int start, int first, int last, const Plan& plan, float weight) noexcept {
+    using L = Blur::Layout<F>;
+    constexpr int N = 4;
+    const int whole = plan.whole;
+    __m128i sum = _mm_setzero_si128();
+    for (int k = start - whole; k <= start + whole; ++k)
+        sum = _mm_add_epi32(sum, Blur::Avx2::Premultiplied(in, k));
+    alignas(16) std::uint32_t sums[8][N], outers[8][N];
+    const bool fractional = plan.fraction > 0.0f;
+    int pending = 0;
+    for (int b = start; b < last; ++b) {
+        if (b > start)
+            sum = _mm_sub_epi32(_mm_add_epi32(sum, Blur::Avx2::Premultiplied(in, b + whole)),
+                                Blur::Avx2::Premultiplied(in, b - whole - 1));
+        if (b < first) continue;
+        _mm_store_si128(reinterpret_cast<__m128i*>(sums[pending]), sum);
+        if (fractional)
+            _mm_store_si128(reinterpret_cast<__m128i*>(outers[pending]),
+                            _mm_add_epi32(Blur::Avx2::Premultiplied(in, b - whole - 1),
+                                          Blur::Avx2::Premultiplied(in, b + whole + 1)));
+        if (++pending == 8) {
+            Blur::Avx2::ResolveSums8(sums, fractional ? outers : nullptr, plan.fraction, weight,
+                                     out + std::ptrdiff_t(b - 7) * N);
+            pending = 0;
+        }
+    }
+    for (int i = 0; i < pending; ++i) {
+        float total[N];
+        for (int k = 0; k < N; ++k) {
+            total[k] = float(sums[i][k]);
+            if (fractional) total[k] += plan.fraction * float(outers[i][k]);
+        }
+        L::Resolve(total, weight, out + std::ptrdiff_t(last - pending + i) * N);
+    }
+}
+#endif
+
 template <Raster::PixelFormat F>
 RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const Plan& plan) {
     using L = Blur::Layout<F>;
@@ -156,6 +199,14 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
             const T* in = rotated->Row<T>(i) + std::ptrdiff_t(lead + reach) * N;
             T* out = blurred->Row<T>(i);
             const int start = sampledRows(j).first;
+#if RT_AVX2_BUILD
+            if constexpr (!L::IsFloat && N == 4 && L::A == 3) {
+                if (HasAvx2()) {
+                    BlurLineAvx2<F>(in, out, start, range.first, range.last, plan, weight);
+                    continue;
+                }
+            }
+#endif
             Acc sum[N] = {};
             // Four-component pixels resolve four rows at a time.
             constexpr int Batch = N == 4 && L::A == 3 ? 4 : 1;

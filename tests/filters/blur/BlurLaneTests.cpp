@@ -7,6 +7,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstring>
 #include <random>
 #include <vector>
@@ -77,6 +78,47 @@ TYPED_TEST(BlurLanes, FourSamplesEqualFourSingleSamples) {
         ++compared;
     }
     EXPECT_EQ(compared, 20000);
+}
+
+// Runs of samples take eight lanes where the processor has AVX2, four otherwise, and the rest one by one;
+// both grids, every run length around the batch sizes, and locations far outside the grid.
+TYPED_TEST(BlurLanes, RunsOfSamplesEqualSingleSamples) {
+    constexpr PixelFormat F = TypeParam::Value;
+    using L = Blur::Layout<F>;
+    using T = typename L::T;
+    const auto image = Grid<F>(29, 19, 21);
+    const Blur::RowGrid<F> rows{*image, 3, -5};
+    const Blur::LineGrid<F> lines{*image, -7, 2, 17}; // 17 of the 19 rows, each a column of the frame
+    std::mt19937 random(31);
+    std::uniform_real_distribution<double> anywhere(-12.0, 40.0);
+    std::vector<double> xs(160), ys(160);
+    std::vector<T> run(160 * L::N), single(160 * L::N);
+    for (int round = 0; round < 400; ++round) {
+        const int first = int(random() % 5), last = first + round % 150;
+        for (std::size_t i = 0; i < xs.size(); ++i) {
+            const auto kind = random() % 5;
+            xs[i] = kind == 0 ? double(int(random() % 40) - 10) : anywhere(random); // pixel centres too
+            ys[i] = kind <= 1 ? double(int(random() % 30) - 8) : anywhere(random);
+        }
+        auto position = [&](int i, double& x, double& y) {
+            x = xs[std::size_t(i)];
+            y = ys[std::size_t(i)];
+        };
+        auto check = [&](const auto& grid, const char* name) {
+            std::fill(run.begin(), run.end(), T(7));
+            std::fill(single.begin(), single.end(), T(7));
+            Blur::SampleBilinearRun<F>(grid, first, last, position, run.data());
+            for (int i = first; i < last; ++i)
+                Blur::SampleBilinear<F>(grid, xs[std::size_t(i)], ys[std::size_t(i)],
+                                        single.data() + i * L::N);
+            for (int i = 0; i < 160; ++i)
+                ASSERT_EQ(std::memcmp(run.data() + i * L::N, single.data() + i * L::N, sizeof(T) * L::N), 0)
+                    << name << ", run " << first << ".." << last << ", sample " << i << " at ("
+                    << xs[std::size_t(i)] << ", " << ys[std::size_t(i)] << ")";
+        };
+        check(rows, "rows");
+        check(lines, "lines");
+    }
 }
 
 TYPED_TEST(BlurLanes, FourResolvesEqualFourSingleResolves) {

@@ -1,0 +1,306 @@
+#pragma once
+// The blurs' premultiplied bilinear samples eight at a time with AVX2, for formats of four components with
+// alpha last: SampleBilinear4's operations in the same order on eight lanes (no fused multiply-add, max and
+// min in the operand order of the selects they stand for), so every sample is bit for bit what
+// SampleBilinear gives. Corners are fetched with gathers. Called only where the processor has AVX2.
+
+#include "pipeline/Cpu.h"
+
+#include <cstddef>
+#include <cstdint>
+#include <type_traits>
+
+#if RT_AVX2_BUILD
+#include <immintrin.h>
+#endif
+
+namespace RasterTools::Blur::Avx2 {
+
+// Where a grid's pixels lie: pixel (x, y) of the grid's frame starts (x - left) × xStride + (y - top) ×
+// yStride bytes after base. A buffer holds at most 2 GiB, so every offset within it fits 32 bits.
+struct Access {
+    const std::byte* base = nullptr;
+    int xStride = 0, yStride = 0;
+    int left = 0, top = 0, lastX = 0, lastY = 0;
+};
+
+#if RT_AVX2_BUILD
+
+namespace Detail {
+
+// Eight pixels of component type T: gathered from their offsets, split into float components, and the
+// rounded results packed and stored. Raw holds eight pixels as stored, so that exact copies keep their bits.
+template <class T>
+struct Pixels;
+
+template <>
+struct Pixels<std::uint8_t> {
+    struct Raw {
+        __m256i v;
+    };
+    RT_TARGET_AVX2 static Raw Gather(const std::byte* base, __m256i offset) noexcept {
+        return {_mm256_i32gather_epi32(reinterpret_cast<const int*>(base), offset, 1)};
+    }
+    RT_TARGET_AVX2 static void Components(const Raw& raw, __m256 (&c)[4]) noexcept {
+        const __m256i byte = _mm256_set1_epi32(0xFF);
+        c[0] = _mm256_cvtepi32_ps(_mm256_and_si256(raw.v, byte));
+        c[1] = _mm256_cvtepi32_ps(_mm256_and_si256(_mm256_srli_epi32(raw.v, 8), byte));
+        c[2] = _mm256_cvtepi32_ps(_mm256_and_si256(_mm256_srli_epi32(raw.v, 16), byte));
+        c[3] = _mm256_cvtepi32_ps(_mm256_srli_epi32(raw.v, 24));
+    }
+    RT_TARGET_AVX2 static Raw Pack(const __m256i (&w)[4]) noexcept {
+        return {_mm256_or_si256(_mm256_or_si256(w[0], _mm256_slli_epi32(w[1], 8)),
+                                _mm256_or_si256(_mm256_slli_epi32(w[2], 16), _mm256_slli_epi32(w[3], 24)))};
+    }
+    RT_TARGET_AVX2 static Raw Select(const Raw& computed, const Raw& copied, __m256i copy) noexcept {
+        return {_mm256_blendv_epi8(computed.v, copied.v, copy)};
+    }
+    RT_TARGET_AVX2 static void Store(const Raw& raw, std::uint8_t* out) noexcept {
+        _mm256_storeu_si256(reinterpret_cast<__m256i*>(out), raw.v);
+    }
+};
+
+template <>
+struct Pixels<std::uint16_t> {
+    struct Raw {
+        __m256i low, high; // components 0 | 1 << 16 and 2 | 3 << 16
+    };
+    RT_TARGET_AVX2 static Raw Gather(const std::byte* base, __m256i offset) noexcept {
+        return {_mm256_i32gather_epi32(reinterpret_cast<const int*>(base), offset, 1),
+                _mm256_i32gather_epi32(reinterpret_cast<const int*>(base + 4), offset, 1)};
+    }
+    RT_TARGET_AVX2 static void Components(const Raw& raw, __m256 (&c)[4]) noexcept {
+        const __m256i word = _mm256_set1_epi32(0xFFFF);
+        c[0] = _mm256_cvtepi32_ps(_mm256_and_si256(raw.low, word));
+        c[1] = _mm256_cvtepi32_ps(_mm256_srli_epi32(raw.low, 16));
+        c[2] = _mm256_cvtepi32_ps(_mm256_and_si256(raw.high, word));
+        c[3] = _mm256_cvtepi32_ps(_mm256_srli_epi32(raw.high, 16));
+    }
+    RT_TARGET_AVX2 static Raw Pack(const __m256i (&w)[4]) noexcept {
+        return {_mm256_or_si256(w[0], _mm256_slli_epi32(w[1], 16)),
+                _mm256_or_si256(w[2], _mm256_slli_epi32(w[3], 16))};
+    }
+    RT_TARGET_AVX2 static Raw Select(const Raw& computed, const Raw& copied, __m256i copy) noexcept {
+        return {_mm256_blendv_epi8(computed.low, copied.low, copy),
+                _mm256_blendv_epi8(computed.high, copied.high, copy)};
+    }
+    RT_TARGET_AVX2 static void Store(const Raw& raw, std::uint16_t* out) noexcept {
+        // Pixel i is the pair (low[i], high[i]); the unpacks give pixels 0, 1 | 4, 5 and 2, 3 | 6, 7.
+        const __m256i even = _mm256_unpacklo_epi32(raw.low, raw.high);
+        const __m256i odd = _mm256_unpackhi_epi32(raw.low, raw.high);
+        _mm256_storeu_si256(reinterpret_cast<__m256i*>(out), _mm256_permute2x128_si256(even, odd, 0x20));
+        _mm256_storeu_si256(reinterpret_cast<__m256i*>(out + 16), _mm256_permute2x128_si256(even, odd, 0x31));
+    }
+};
+
+template <>
+struct Pixels<float> {
+    struct Raw {
+        __m256 c[4];
+    };
+    RT_TARGET_AVX2 static Raw Gather(const std::byte* base, __m256i offset) noexcept {
+        Raw raw;
+        for (int m = 0; m < 4; ++m)
+            raw.c[m] = _mm256_i32gather_ps(reinterpret_cast<const float*>(base + 4 * m), offset, 1);
+        return raw;
+    }
+    RT_TARGET_AVX2 static void Components(const Raw& raw, __m256 (&c)[4]) noexcept {
+        for (int m = 0; m < 4; ++m)
+            c[m] = raw.c[m];
+    }
+    RT_TARGET_AVX2 static Raw Select(const Raw& computed, const Raw& copied, __m256i copy) noexcept {
+        Raw raw;
+        for (int m = 0; m < 4; ++m)
+            raw.c[m] = _mm256_blendv_ps(computed.c[m], copied.c[m], _mm256_castsi256_ps(copy));
+        return raw;
+    }
+    RT_TARGET_AVX2 static void Store(const Raw& raw, float* out) noexcept {
+        // Components to pixels: pairs of components first, then pairs of pairs, then the 128-bit halves.
+        const __m256 rg0 = _mm256_unpacklo_ps(raw.c[0], raw.c[1]),
+                     rg1 = _mm256_unpackhi_ps(raw.c[0], raw.c[1]);
+        const __m256 ba0 = _mm256_unpacklo_ps(raw.c[2], raw.c[3]),
+                     ba1 = _mm256_unpackhi_ps(raw.c[2], raw.c[3]);
+        const __m256 p04 = _mm256_castpd_ps(_mm256_unpacklo_pd(_mm256_castps_pd(rg0), _mm256_castps_pd(ba0)));
+        const __m256 p15 = _mm256_castpd_ps(_mm256_unpackhi_pd(_mm256_castps_pd(rg0), _mm256_castps_pd(ba0)));
+        const __m256 p26 = _mm256_castpd_ps(_mm256_unpacklo_pd(_mm256_castps_pd(rg1), _mm256_castps_pd(ba1)));
+        const __m256 p37 = _mm256_castpd_ps(_mm256_unpackhi_pd(_mm256_castps_pd(rg1), _mm256_castps_pd(ba1)));
+        _mm256_storeu_ps(out, _mm256_permute2f128_ps(p04, p15, 0x20));
+        _mm256_storeu_ps(out + 8, _mm256_permute2f128_ps(p26, p37, 0x20));
+        _mm256_storeu_ps(out + 16, _mm256_permute2f128_ps(p04, p15, 0x31));
+        _mm256_storeu_ps(out + 24, _mm256_permute2f128_ps(p26, p37, 0x31));
+    }
+};
+
+// Four results in stored form: integers rounded as Layout::Store rounds, floats as they are.
+template <class T>
+RT_TARGET_AVX2 inline typename Pixels<T>::Raw Finish(const __m256 (&v)[4]) noexcept {
+    if constexpr (std::is_same_v<T, float>) {
+        return {{v[0], v[1], v[2], v[3]}};
+    } else {
+        const __m256 maximum = _mm256_set1_ps(sizeof(T) == 1 ? 255.0f : 65535.0f);
+        __m256i w[4];
+        for (int m = 0; m < 4; ++m) {
+            const __m256 clamped = _mm256_min_ps(_mm256_max_ps(v[m], _mm256_setzero_ps()), maximum);
+            w[m] = _mm256_cvttps_epi32(_mm256_add_ps(clamped, _mm256_set1_ps(0.5f)));
+        }
+        return Pixels<T>::Pack(w);
+    }
+}
+
+// Clamps four locations to the grid's edges as std::clamp does and splits them into whole and fractional
+// parts as SampleBilinear does.
+RT_TARGET_AVX2 inline void Split(const double* at, double low, double high, __m128i& whole,
+                                 __m128& fraction) noexcept {
+    const __m256d clamped =
+        _mm256_min_pd(_mm256_set1_pd(high), _mm256_max_pd(_mm256_set1_pd(low), _mm256_loadu_pd(at)));
+    const __m256d floor = _mm256_floor_pd(clamped);
+    whole = _mm256_cvttpd_epi32(floor);
+    fraction = _mm256_cvtpd_ps(_mm256_sub_pd(clamped, floor));
+}
+
+template <class T>
+RT_TARGET_AVX2 inline void Sample8(const Access& grid, const double* xs, const double* ys, T* out) noexcept {
+    using P = Pixels<T>;
+    __m128i x0Low, x0High, y0Low, y0High;
+    __m128 fxLow, fxHigh, fyLow, fyHigh;
+    Split(xs, grid.left, grid.lastX, x0Low, fxLow);
+    Split(xs + 4, grid.left, grid.lastX, x0High, fxHigh);
+    Split(ys, grid.top, grid.lastY, y0Low, fyLow);
+    Split(ys + 4, grid.top, grid.lastY, y0High, fyHigh);
+    const __m256i x0 = _mm256_set_m128i(x0High, x0Low), y0 = _mm256_set_m128i(y0High, y0Low);
+    const __m256 fx = _mm256_set_m128(fxHigh, fxLow), fy = _mm256_set_m128(fyHigh, fyLow);
+    const __m256i one = _mm256_set1_epi32(1);
+    const __m256i x1 = _mm256_min_epi32(_mm256_add_epi32(x0, one), _mm256_set1_epi32(grid.lastX));
+    const __m256i y1 = _mm256_min_epi32(_mm256_add_epi32(y0, one), _mm256_set1_epi32(grid.lastY));
+    const __m256i xStride = _mm256_set1_epi32(grid.xStride), yStride = _mm256_set1_epi32(grid.yStride);
+    const __m256i left = _mm256_set1_epi32(grid.left), top = _mm256_set1_epi32(grid.top);
+    const __m256i column0 = _mm256_mullo_epi32(_mm256_sub_epi32(x0, left), xStride);
+    const __m256i column1 = _mm256_mullo_epi32(_mm256_sub_epi32(x1, left), xStride);
+    const __m256i row0 = _mm256_mullo_epi32(_mm256_sub_epi32(y0, top), yStride);
+    const __m256i row1 = _mm256_mullo_epi32(_mm256_sub_epi32(y1, top), yStride);
+
+    const typename P::Raw first = P::Gather(grid.base, _mm256_add_epi32(column0, row0));
+    __m256 c[4][4]; // corner, component
+    P::Components(first, c[0]);
+    P::Components(P::Gather(grid.base, _mm256_add_epi32(column1, row0)), c[1]);
+    P::Components(P::Gather(grid.base, _mm256_add_epi32(column0, row1)), c[2]);
+    P::Components(P::Gather(grid.base, _mm256_add_epi32(column1, row1)), c[3]);
+
+    const __m256 unit = _mm256_set1_ps(1.0f);
+    const __m256 gx = _mm256_sub_ps(unit, fx), gy = _mm256_sub_ps(unit, fy);
+    const __m256 weight[4] = {_mm256_mul_ps(gx, gy), _mm256_mul_ps(fx, gy), _mm256_mul_ps(gx, fy),
+                              _mm256_mul_ps(fx, fy)};
+    __m256 alpha = _mm256_setzero_ps();
+    __m256 sum[3] = {_mm256_setzero_ps(), _mm256_setzero_ps(), _mm256_setzero_ps()};
+    for (int k = 0; k < 4; ++k) {
+        const __m256 a = _mm256_mul_ps(c[k][3], weight[k]);
+        alpha = _mm256_add_ps(alpha, a);
+        for (int m = 0; m < 3; ++m)
+            sum[m] = _mm256_add_ps(sum[m], _mm256_mul_ps(c[k][m], a));
+    }
+    // Where every neighbour is transparent the colour is the plain weighted average.
+    const __m256 weighted =
+        _mm256_cmp_ps(_mm256_andnot_ps(_mm256_set1_ps(-0.0f), alpha), _mm256_set1_ps(1e-20f), _CMP_GE_OQ);
+    if (_mm256_movemask_ps(weighted) != 0xFF) {
+        __m256 plain[3] = {_mm256_setzero_ps(), _mm256_setzero_ps(), _mm256_setzero_ps()};
+        for (int k = 0; k < 4; ++k)
+            for (int m = 0; m < 3; ++m)
+                plain[m] = _mm256_add_ps(plain[m], _mm256_mul_ps(c[k][m], weight[k]));
+        for (int m = 0; m < 3; ++m)
+            sum[m] = _mm256_blendv_ps(plain[m], sum[m], weighted);
+    }
+    const __m256 inverse = _mm256_div_ps(unit, _mm256_blendv_ps(unit, alpha, weighted));
+    const __m256 result[4] = {_mm256_mul_ps(sum[0], inverse), _mm256_mul_ps(sum[1], inverse),
+                              _mm256_mul_ps(sum[2], inverse), alpha};
+    typename P::Raw pixels = Finish<T>(result);
+    // A sample on a pixel centre copies that pixel.
+    const __m256 exact = _mm256_and_ps(_mm256_cmp_ps(fx, _mm256_setzero_ps(), _CMP_EQ_OQ),
+                                       _mm256_cmp_ps(fy, _mm256_setzero_ps(), _CMP_EQ_OQ));
+    if (_mm256_movemask_ps(exact) != 0) pixels = P::Select(pixels, first, _mm256_castps_si256(exact));
+    P::Store(pixels, out);
+}
+
+// The exact float of a 32-bit unsigned sum: both 16-bit halves convert exactly, and the one addition rounds
+// as a direct conversion would.
+RT_TARGET_AVX2 inline __m256 ExactFloat(__m256i v) noexcept {
+    const __m256 high = _mm256_mul_ps(_mm256_cvtepi32_ps(_mm256_srli_epi32(v, 16)), _mm256_set1_ps(65536.0f));
+    return _mm256_add_ps(high, _mm256_cvtepi32_ps(_mm256_and_si256(v, _mm256_set1_epi32(0xFFFF))));
+}
+
+// Eight pixels' four sums as floats, one component per register. Pixels i and i + 4 share a register, one
+// per 128-bit half, so that an in-half transpose gives the components in pixel order.
+RT_TARGET_AVX2 inline void SumComponents(const std::uint32_t (*from)[4], __m256 (&c)[4]) noexcept {
+    __m256 rows[4];
+    for (int i = 0; i < 4; ++i)
+        rows[i] = ExactFloat(_mm256_set_m128i(_mm_loadu_si128(reinterpret_cast<const __m128i*>(from[i + 4])),
+                                              _mm_loadu_si128(reinterpret_cast<const __m128i*>(from[i]))));
+    const __m256 t0 = _mm256_unpacklo_ps(rows[0], rows[1]), t1 = _mm256_unpacklo_ps(rows[2], rows[3]);
+    const __m256 t2 = _mm256_unpackhi_ps(rows[0], rows[1]), t3 = _mm256_unpackhi_ps(rows[2], rows[3]);
+    c[0] = _mm256_shuffle_ps(t0, t1, 0x44);
+    c[1] = _mm256_shuffle_ps(t0, t1, 0xEE);
+    c[2] = _mm256_shuffle_ps(t2, t3, 0x44);
+    c[3] = _mm256_shuffle_ps(t2, t3, 0xEE);
+}
+
+} // namespace Detail
+
+// The premultiplied components of row row of a line of pixels of four integer components with alpha last, as
+// Layout::Premultiplied4 gives them: colour × alpha for 8 bits, colour × alpha / 65535 for 16 bits.
+template <class T>
+RT_TARGET_AVX2 inline __m128i Premultiplied(const T* line, int row) noexcept {
+    const T* p = line + std::ptrdiff_t(row) * 4;
+    if constexpr (sizeof(T) == 1) {
+        std::int32_t word;
+        __builtin_memcpy(&word, p, sizeof word);
+        const __m128i v = _mm_cvtepu8_epi32(_mm_cvtsi32_si128(word));
+        return _mm_mullo_epi32(v, _mm_blend_epi32(_mm_shuffle_epi32(v, 0xFF), _mm_set1_epi32(1), 0x8));
+    } else {
+        const __m128i v = _mm_cvtepu16_epi32(_mm_loadl_epi64(reinterpret_cast<const __m128i*>(p)));
+        const __m128i product =
+            _mm_mullo_epi32(v, _mm_blend_epi32(_mm_shuffle_epi32(v, 0xFF), _mm_set1_epi32(65535), 0x8));
+        // floor(x / 65535) = (x + (x >> 16) + 1) >> 16 for every x up to 65535², without overflow.
+        return _mm_srli_epi32(
+            _mm_add_epi32(_mm_add_epi32(product, _mm_srli_epi32(product, 16)), _mm_set1_epi32(1)), 16);
+    }
+}
+
+// Eight pixels' premultiplied sums resolved as Layout::Resolve resolves them: each sum converted to float
+// (plus fraction × the outer rows' sum where outers is not null), the colour divided by the normalised
+// alpha unless that is exactly 1 or within 1e-20 of 0, everything over weight.
+template <class T>
+RT_TARGET_AVX2 inline void ResolveSums8(const std::uint32_t (*sums)[4], const std::uint32_t (*outers)[4],
+                                        float fraction, float weight, T* out) noexcept {
+    constexpr float Max = sizeof(T) == 1 ? 255.0f : 65535.0f;
+    constexpr float PremultipliedScale = sizeof(T) == 1 ? 255.0f : 1.0f;
+    __m256 c[4];
+    Detail::SumComponents(sums, c);
+    if (outers) {
+        __m256 outer[4];
+        Detail::SumComponents(outers, outer);
+        for (int m = 0; m < 4; ++m)
+            c[m] = _mm256_add_ps(c[m], _mm256_mul_ps(_mm256_set1_ps(fraction), outer[m]));
+    }
+    const float inverse = 1.0f / weight;
+    const float scaled = inverse / PremultipliedScale;
+    const __m256 alpha = _mm256_div_ps(_mm256_mul_ps(c[3], _mm256_set1_ps(inverse)), _mm256_set1_ps(Max));
+    const __m256 tiny = _mm256_and_ps(_mm256_cmp_ps(alpha, _mm256_set1_ps(-1e-20f), _CMP_GT_OQ),
+                                      _mm256_cmp_ps(alpha, _mm256_set1_ps(1e-20f), _CMP_LT_OQ));
+    const __m256 unit = _mm256_set1_ps(1.0f);
+    const __m256 divide = _mm256_andnot_ps(tiny, _mm256_cmp_ps(alpha, unit, _CMP_NEQ_UQ));
+    const __m256 colourScale = _mm256_div_ps(_mm256_set1_ps(scaled), _mm256_blendv_ps(unit, alpha, divide));
+    const __m256 result[4] = {_mm256_mul_ps(c[0], colourScale), _mm256_mul_ps(c[1], colourScale),
+                              _mm256_mul_ps(c[2], colourScale), _mm256_mul_ps(c[3], _mm256_set1_ps(inverse))};
+    Detail::Pixels<T>::Store(Detail::Finish<T>(result), out);
+}
+
+// Samples the count locations (xs[i], ys[i]), count a multiple of 8, into out (sample i at out + 4 × i).
+template <class T>
+RT_TARGET_AVX2 void SampleRun(const Access& grid, const double* xs, const double* ys, int count,
+                              T* out) noexcept {
+    for (int i = 0; i + 8 <= count; i += 8)
+        Detail::Sample8(grid, xs + i, ys + i, out + 4 * i);
+}
+
+#endif
+
+} // namespace RasterTools::Blur::Avx2
