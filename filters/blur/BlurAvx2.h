@@ -159,7 +159,8 @@ RT_TARGET_AVX2 inline void Split(const double* at, double low, double high, __m1
 }
 
 template <class T>
-RT_TARGET_AVX2 inline void Sample8(const Access& grid, const double* xs, const double* ys, T* out) noexcept {
+[[gnu::always_inline]] RT_TARGET_AVX2 inline void Sample8(const Access& grid, const double* xs,
+                                                          const double* ys, T* out) noexcept {
     using P = Pixels<T>;
     __m128i x0Low, x0High, y0Low, y0High;
     __m128 fxLow, fxHigh, fyLow, fyHigh;
@@ -293,12 +294,24 @@ RT_TARGET_AVX2 inline void ResolveSums8(const std::uint32_t (*sums)[4], const st
     Detail::Pixels<T>::Store(Detail::Finish<T>(result), out);
 }
 
-// Samples the count locations (xs[i], ys[i]), count a multiple of 8, into out (sample i at out + 4 × i).
-template <class T>
-RT_TARGET_AVX2 void SampleRun(const Access& grid, const double* xs, const double* ys, int count,
-                              T* out) noexcept {
-    for (int i = 0; i + 8 <= count; i += 8)
-        Detail::Sample8(grid, xs + i, ys + i, out + 4 * i);
+// Samples indices first, first + 1, ... into out (index i's pixel at out + 4 × i) while eight remain, and
+// returns the first index not sampled; position(i, x, y) gives index i's location. Locations are worked out
+// a batch at a time, in this build too, so that their loop can use the wide registers.
+template <class T, class Position>
+RT_TARGET_AVX2 int SampleRun(const Access& grid, int first, int last, const Position& position,
+                             T* out) noexcept {
+    constexpr int Batch = 64;
+    double xs[Batch], ys[Batch];
+    int i = first;
+    while (last - i >= 8) {
+        const int count = last - i >= Batch ? Batch : (last - i) & ~7;
+        for (int k = 0; k < count; ++k)
+            position(i + k, xs[k], ys[k]);
+        for (int k = 0; k < count; k += 8)
+            Detail::Sample8(grid, xs + k, ys + k, out + std::ptrdiff_t(i + k) * 4);
+        i += count;
+    }
+    return i;
 }
 
 #endif

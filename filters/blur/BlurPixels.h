@@ -360,19 +360,7 @@ inline void SampleBilinearRun(const Grid& grid, int first, int last, const Posit
     int i = first;
 #if RT_AVX2_BUILD
     if constexpr (N == 4 && Layout<F>::A == 3) {
-        if (HasAvx2()) {
-            // Locations a batch at a time, eight samples per step.
-            constexpr int Batch = 64;
-            const Avx2::Access locations = grid.Locations();
-            double xs[Batch], ys[Batch];
-            while (last - i >= 8) {
-                const int count = std::min(Batch, (last - i) & ~7);
-                for (int k = 0; k < count; ++k)
-                    position(i + k, xs[k], ys[k]);
-                Avx2::SampleRun(locations, xs, ys, count, out + std::ptrdiff_t(i) * N);
-                i += count;
-            }
-        }
+        if (HasAvx2()) i = Avx2::SampleRun(grid.Locations(), first, last, position, out);
     }
 #endif
     for (; i + 4 <= last; i += 4) {
