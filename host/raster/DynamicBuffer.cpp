@@ -16,9 +16,17 @@ std::uint64_t DynamicBuffer::ComputeStorageBytes(std::int64_t width, std::int64_
     if (width < 1 || height < 1 || width > MaxSide || height > MaxSide) return 0;
     // Both sides are at most 2^16 and a pixel at most 16 bytes, so nothing here can overflow 64 bits.
     const std::uint64_t rowBytes = std::uint64_t(width) * std::uint64_t(Raster::GetBytesPerPixel(format));
-    const std::uint64_t stride = (rowBytes + RowAlignment - 1) / RowAlignment * RowAlignment;
-    const std::uint64_t total = stride * std::uint64_t(height);
-    return total <= MaxStorageBytes ? total : 0;
+    const std::uint64_t aligned = (rowBytes + RowAlignment - 1) / RowAlignment * RowAlignment;
+    // Rows a power of two apart share cache sets, so that a walk down a column (a rotated or transposed
+    // read) keeps only a few rows cached. An odd number of cache lines per row spreads the rows over every
+    // set; where that extra line would break the size limit, the buffer keeps its plain stride.
+    const std::uint64_t spread =
+        aligned >= 1024 && aligned / RowAlignment % 2 == 0 ? aligned + RowAlignment : aligned;
+    for (const std::uint64_t stride : {spread, aligned}) {
+        const std::uint64_t total = stride * std::uint64_t(height);
+        if (total <= MaxStorageBytes) return total;
+    }
+    return 0;
 }
 
 namespace {

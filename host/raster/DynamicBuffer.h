@@ -39,8 +39,9 @@ private:
 };
 
 // Pixels stored interleaved (all components of a pixel together, in channel order), rows top to bottom. Every
-// row starts on a 64-byte boundary and the stride is a multiple of 64 bytes; the padding after a row is never
-// read as pixels. New buffers are all zero (transparent black).
+// row starts on a 64-byte boundary and the stride is a multiple of 64 bytes, an odd multiple from 1 KiB up
+// (within the size limit); the padding after a row is never read as pixels. New buffers are all zero
+// (transparent black).
 class DynamicBuffer : public DynamicBase, public virtual Kernel::Countable {
 public:
     static constexpr int MaxSide = 65536; // pixels, either side

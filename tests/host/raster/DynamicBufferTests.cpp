@@ -124,7 +124,7 @@ TEST(PixelFormatTable, DispatchReachesTheMatchingInstantiation) {
 
 TEST(DynamicBuffer, RowsAreAlignedPaddedAndZeroed) {
     for (PixelFormat format : AllFormats()) {
-        for (int width : {1, 13, 16, 64, 100}) {
+        for (int width : {1, 13, 16, 64, 100, 256}) {
             SCOPED_TRACE(std::string(GetPixelFormatName(format)) + " width " + std::to_string(width));
             const int height = 7;
             auto buffer = DynamicBuffer::Create(width, height, format);
@@ -136,7 +136,11 @@ TEST(DynamicBuffer, RowsAreAlignedPaddedAndZeroed) {
             EXPECT_EQ(buffer->GetRowBytes(), rowBytes);
             EXPECT_EQ(buffer->Stride() % 64, 0);
             EXPECT_GE(std::size_t(buffer->Stride()), rowBytes);
-            EXPECT_LT(std::size_t(buffer->Stride()), rowBytes + 64);
+            // At most one line of alignment, and one more to make a long row's line count odd.
+            EXPECT_LT(std::size_t(buffer->Stride()), rowBytes + (buffer->Stride() >= 1024 ? 128 : 64));
+            if (buffer->Stride() >= 1024) {
+                EXPECT_EQ(buffer->Stride() / 64 % 2, 1);
+            }
             for (int y = 0; y < height; ++y) {
                 EXPECT_EQ(reinterpret_cast<std::uintptr_t>(buffer->RowBytes(y)) % 64, 0u);
                 for (std::size_t i = 0; i < rowBytes; ++i)
@@ -161,6 +165,12 @@ TEST(DynamicBuffer, StrideWorkedOutByHand) {
     // MaskA8, 1 pixel: one byte still takes a whole aligned row.
     EXPECT_EQ(DynamicBuffer::Create(1, 3, PixelFormat::MaskA8)->Stride(), 64);
     EXPECT_EQ(DynamicBuffer::ComputeStorageBytes(13, 3, PixelFormat::CMYKA8), 384u);
+    // From 1 KiB up, rows are an odd number of 64-byte lines apart, so that a column's pixels fall in
+    // different cache sets: 4096 RGBA8 pixels take 257 lines, 300 take 19 as they are.
+    EXPECT_EQ(DynamicBuffer::Create(4096, 2, PixelFormat::RGBA8)->Stride(), 257 * 64);
+    EXPECT_EQ(DynamicBuffer::Create(300, 2, PixelFormat::RGBA8)->Stride(), 19 * 64);
+    EXPECT_EQ(DynamicBuffer::Create(128, 2, PixelFormat::RGBA16)->Stride(), 17 * 64);
+    EXPECT_EQ(DynamicBuffer::Create(128, 2, PixelFormat::MaskA8)->Stride(), 128);
 }
 
 TEST(DynamicBuffer, TypedRowsSeeComponentsInChannelOrder) {
@@ -190,7 +200,10 @@ TEST(DynamicBuffer, SizesOutsideTheLimitsAreRefusedWithoutAnObject) {
     EXPECT_FALSE(DynamicBuffer::Create(4, 4, static_cast<PixelFormat>(PixelFormatCount)));
     EXPECT_EQ(Kernel::Countable::GetLiveObjectCount(), before);
 
+    // Where the odd stride would break the limit, the plain one is kept.
     EXPECT_EQ(DynamicBuffer::ComputeStorageBytes(65536, 8192, PixelFormat::RGBA8), std::uint64_t(1) << 31);
+    EXPECT_EQ(DynamicBuffer::ComputeStorageBytes(65536, 8191, PixelFormat::RGBA8), 262144u * 8191u);
+    EXPECT_EQ(DynamicBuffer::ComputeStorageBytes(65536, 8000, PixelFormat::RGBA8), (262144u + 64u) * 8000u);
     EXPECT_EQ(DynamicBuffer::ComputeStorageBytes(65536, 8193, PixelFormat::RGBA8), 0u);
     // Padding counts: 1-byte rows take 64 bytes, so 65536 rows of width 1 are far below the limit ...
     EXPECT_EQ(DynamicBuffer::ComputeStorageBytes(1, 65536, PixelFormat::MaskA8), 64u * 65536u);
