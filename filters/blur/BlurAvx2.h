@@ -180,13 +180,12 @@ template <class T>
     const __m256i row0 = _mm256_mullo_epi32(_mm256_sub_epi32(y0, top), yStride);
     const __m256i row1 = _mm256_mullo_epi32(_mm256_sub_epi32(y1, top), yStride);
 
-    const typename P::Raw first = P::Gather(grid.base, _mm256_add_epi32(column0, row0));
-    __m256 c[4][4]; // corner, component
-    P::Components(first, c[0]);
-    P::Components(P::Gather(grid.base, _mm256_add_epi32(column1, row0)), c[1]);
-    P::Components(P::Gather(grid.base, _mm256_add_epi32(column0, row1)), c[2]);
-    P::Components(P::Gather(grid.base, _mm256_add_epi32(column1, row1)), c[3]);
-
+    // The corners as stored; their components are taken out where they are used, which keeps the
+    // registers free.
+    const typename P::Raw corners[4] = {P::Gather(grid.base, _mm256_add_epi32(column0, row0)),
+                                        P::Gather(grid.base, _mm256_add_epi32(column1, row0)),
+                                        P::Gather(grid.base, _mm256_add_epi32(column0, row1)),
+                                        P::Gather(grid.base, _mm256_add_epi32(column1, row1))};
     const __m256 unit = _mm256_set1_ps(1.0f);
     const __m256 gx = _mm256_sub_ps(unit, fx), gy = _mm256_sub_ps(unit, fy);
     const __m256 weight[4] = {_mm256_mul_ps(gx, gy), _mm256_mul_ps(fx, gy), _mm256_mul_ps(gx, fy),
@@ -194,19 +193,24 @@ template <class T>
     __m256 alpha = _mm256_setzero_ps();
     __m256 sum[3] = {_mm256_setzero_ps(), _mm256_setzero_ps(), _mm256_setzero_ps()};
     for (int k = 0; k < 4; ++k) {
-        const __m256 a = _mm256_mul_ps(c[k][3], weight[k]);
+        __m256 c[4];
+        P::Components(corners[k], c);
+        const __m256 a = _mm256_mul_ps(c[3], weight[k]);
         alpha = _mm256_add_ps(alpha, a);
         for (int m = 0; m < 3; ++m)
-            sum[m] = _mm256_add_ps(sum[m], _mm256_mul_ps(c[k][m], a));
+            sum[m] = _mm256_add_ps(sum[m], _mm256_mul_ps(c[m], a));
     }
     // Where every neighbour is transparent the colour is the plain weighted average.
     const __m256 weighted =
         _mm256_cmp_ps(_mm256_andnot_ps(_mm256_set1_ps(-0.0f), alpha), _mm256_set1_ps(1e-20f), _CMP_GE_OQ);
     if (_mm256_movemask_ps(weighted) != 0xFF) {
         __m256 plain[3] = {_mm256_setzero_ps(), _mm256_setzero_ps(), _mm256_setzero_ps()};
-        for (int k = 0; k < 4; ++k)
+        for (int k = 0; k < 4; ++k) {
+            __m256 c[4];
+            P::Components(corners[k], c);
             for (int m = 0; m < 3; ++m)
-                plain[m] = _mm256_add_ps(plain[m], _mm256_mul_ps(c[k][m], weight[k]));
+                plain[m] = _mm256_add_ps(plain[m], _mm256_mul_ps(c[m], weight[k]));
+        }
         for (int m = 0; m < 3; ++m)
             sum[m] = _mm256_blendv_ps(plain[m], sum[m], weighted);
     }
@@ -217,7 +221,7 @@ template <class T>
     // A sample on a pixel centre copies that pixel.
     const __m256 exact = _mm256_and_ps(_mm256_cmp_ps(fx, _mm256_setzero_ps(), _CMP_EQ_OQ),
                                        _mm256_cmp_ps(fy, _mm256_setzero_ps(), _CMP_EQ_OQ));
-    if (_mm256_movemask_ps(exact) != 0) pixels = P::Select(pixels, first, _mm256_castps_si256(exact));
+    if (_mm256_movemask_ps(exact) != 0) pixels = P::Select(pixels, corners[0], _mm256_castps_si256(exact));
     P::Store(pixels, out);
 }
 
@@ -294,24 +298,33 @@ RT_TARGET_AVX2 inline void ResolveSums8(const std::uint32_t (*sums)[4], const st
     Detail::Pixels<T>::Store(Detail::Finish<T>(result), out);
 }
 
-// Samples indices first, first + 1, ... into out (index i's pixel at out + 4 × i) while eight remain, and
-// returns the first index not sampled; position(i, x, y) gives index i's location. Locations are worked out
-// a batch at a time, in this build too, so that their loop can use the wide registers.
+// Samples indices first..last - 1 into out (index i's pixel at out + 4 × i); position(i, x, y) gives index
+// i's location. Locations are worked out a batch at a time, in this build too, so that their loop can use the
+// wide registers. A last part of fewer than eight repeats its final location and keeps what it needs.
 template <class T, class Position>
-RT_TARGET_AVX2 int SampleRun(const Access& grid, int first, int last, const Position& position,
-                             T* out) noexcept {
+RT_TARGET_AVX2 void SampleRun(const Access& grid, int first, int last, const Position& position,
+                              T* out) noexcept {
     constexpr int Batch = 64;
-    double xs[Batch], ys[Batch];
-    int i = first;
-    while (last - i >= 8) {
-        const int count = last - i >= Batch ? Batch : (last - i) & ~7;
+    double xs[Batch + 8], ys[Batch + 8];
+    for (int i = first; i < last;) {
+        const int count = last - i >= Batch ? Batch : last - i;
         for (int k = 0; k < count; ++k)
             position(i + k, xs[k], ys[k]);
-        for (int k = 0; k < count; k += 8)
+        int k = 0;
+        for (; k + 8 <= count; k += 8)
             Detail::Sample8(grid, xs + k, ys + k, out + std::ptrdiff_t(i + k) * 4);
+        if (k < count) {
+            for (int e = count; e < k + 8; ++e) {
+                xs[e] = xs[count - 1];
+                ys[e] = ys[count - 1];
+            }
+            T pixels[8 * 4];
+            Detail::Sample8(grid, xs + k, ys + k, pixels);
+            for (int e = 0; e < (count - k) * 4; ++e)
+                out[std::ptrdiff_t(i + k) * 4 + e] = pixels[e];
+        }
         i += count;
     }
-    return i;
 }
 
 #endif

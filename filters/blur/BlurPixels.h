@@ -360,7 +360,10 @@ inline void SampleBilinearRun(const Grid& grid, int first, int last, const Posit
     int i = first;
 #if RT_AVX2_BUILD
     if constexpr (N == 4 && Layout<F>::A == 3) {
-        if (HasAvx2()) i = Avx2::SampleRun(grid.Locations(), first, last, position, out);
+        if (HasAvx2()) {
+            Avx2::SampleRun(grid.Locations(), first, last, position, out);
+            return;
+        }
     }
 #endif
     for (; i + 4 <= last; i += 4) {

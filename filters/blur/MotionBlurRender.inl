@@ -10,7 +10,7 @@ namespace RasterTools::MotionBlurRender {
 
 // Lines of the intermediate image worked out at a time: a band's two scratch images stay in the caches, and
 // the resample out writes every destination pixel that the band's lines make.
-inline constexpr int Band = 32;
+inline constexpr int Band = 64;
 // Lines resampled side by side, LineChunk rows at a time, so that neighbouring lines reuse the source rows
 // they cross.
 inline constexpr int LineGroup = 8;
