@@ -181,8 +181,18 @@ bool ProcessBase<ProcessType>::ProcessTile(const SourceModel* source, DestModel*
                     std::memcpy(row + rect.left, source->Row(y) + rect.left,
                                 std::size_t(rect.Width()) * sizeof(DestStored));
                 } else {
+                    // A tile's rows are short runs, each on pages of its own, which the processor's
+                    // prefetching does not foresee: each span asks for the same span of the next row while it
+                    // converts.
+                    const bool prefetch = y + 1 < rect.bottom && y + 1 < source->GetHeight();
                     for (int x0 = rect.left; x0 < rect.right;) {
                         const int n = std::min(rect.right - x0, SpanLength);
+                        if (prefetch) {
+                            const auto* next = reinterpret_cast<const char*>(source->Row(y + 1) + x0);
+                            const std::size_t bytes = std::size_t(n) * sizeof(StoredPixel<SourceFormat>);
+                            for (std::size_t at = 0; at < bytes; at += 64) // a cache line at a time
+                                __builtin_prefetch(next + at);
+                        }
                         convertSpan(source->Row(y) + x0, row + x0, n);
                         x0 += n;
                     }
