@@ -7,12 +7,11 @@
 // Planar's own loops, built for AVX2 by their caller. SpanConversions.cpp and the tests include this, and
 // call it where the processor has AVX2.
 
+#include "pipeline/Cpu.h"
 #include "pipeline/PlanarConversions.h"
 
 #include <array>
 #include <immintrin.h>
-
-#define RT_TARGET_AVX2 __attribute__((target("avx2")))
 
 namespace RasterTools::PlanarConvert::Avx2 {
 

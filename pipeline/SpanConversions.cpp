@@ -1,8 +1,8 @@
 // The span conversions of every pair of planar formats, each built for AVX2 (with the AVX2 kit where a format
 // has one) and for any x86-64, with the arithmetic inlined into both; the processor's features pick one.
+#include "pipeline/Cpu.h"
 #include "pipeline/PlanarConversions.h"
-#if defined(__x86_64__) && (defined(__GNUC__) || defined(__clang__))
-#define RT_HAS_AVX2_KIT 1
+#if RT_AVX2_BUILD
 #include "pipeline/PlanarAvx2.h"
 #endif
 
@@ -10,23 +10,13 @@ namespace RasterTools::PlanarConvert {
 
 namespace {
 
-#ifdef RT_HAS_AVX2_KIT
-bool HasAvx2() noexcept {
-    static const bool has = [] {
-        __builtin_cpu_init();
-        return __builtin_cpu_supports("avx2") != 0;
-    }();
-    return has;
-}
+#if RT_AVX2_BUILD
 template <PixelFormat Source, PixelFormat Dest>
 [[gnu::flatten]] RT_TARGET_AVX2 void ConvertSpanAvx2(const Raster::StoredPixel<Source>* in,
                                                      Raster::StoredPixel<Dest>* out, int n) noexcept {
     ConvertSpanInline<Source, Dest, Avx2::Kit>(in, out, n);
 }
 #else
-constexpr bool HasAvx2() noexcept {
-    return false;
-}
 template <PixelFormat Source, PixelFormat Dest>
 void ConvertSpanAvx2(const Raster::StoredPixel<Source>*, Raster::StoredPixel<Dest>*, int) noexcept {}
 #endif

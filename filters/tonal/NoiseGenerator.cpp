@@ -2,7 +2,7 @@
 #include "filters/tonal/NoiseGenerator.h"
 
 #include "host/raster/KernelText.h"
-#include "pipeline/SimdClones.h"
+#include "pipeline/Cpu.h"
 
 #include <array>
 #include <bit>

@@ -4,8 +4,8 @@
 // one step at a time, where the processor has AVX2.
 
 #include "pipeline/Conversions.h"
-#if defined(__x86_64__) && (defined(__GNUC__) || defined(__clang__))
-#define RT_TEST_AVX2_KITS 1
+#include "pipeline/Cpu.h"
+#if RT_AVX2_BUILD
 #include "pipeline/PlanarAvx2.h"
 #endif
 
@@ -170,14 +170,9 @@ TEST(PlanarConversions, IntegerWideningAndNarrowingEqualTheBodiesForEveryValue) 
     ExpectEveryValueMatchesBodies<PixelFormat::IA16, PixelFormat::IA8>();
 }
 
-#ifdef RT_TEST_AVX2_KITS
+#if RT_AVX2_BUILD
 
 namespace PC = RasterTools::PlanarConvert;
-
-bool HasAvx2() {
-    __builtin_cpu_init();
-    return __builtin_cpu_supports("avx2") != 0;
-}
 
 template <PixelFormat F>
 RT_TARGET_AVX2 void KitToWorking(const StoredPixel<F>* in, PC::WorkingPlanes& w, int n) {
@@ -254,7 +249,7 @@ void ExpectKitMatchesPlanar() {
 }
 
 TEST(PlanarConversions, Avx2KitsEqualThePortableLoops) {
-    if (!HasAvx2()) GTEST_SKIP() << "no AVX2";
+    if (!RasterTools::HasAvx2()) GTEST_SKIP() << "no AVX2";
     ExpectKitMatchesPlanar<PixelFormat::RGBA8>();
     ExpectKitMatchesPlanar<PixelFormat::RGBA16>();
     ExpectKitMatchesPlanar<PixelFormat::RGBAUF>();
@@ -283,7 +278,7 @@ RT_TARGET_AVX2 std::uint32_t FirstRoundingDifference(std::uint32_t first, std::u
 // Every float from a quarter up (below it both round to 0, the sum with the near half staying under 1; a
 // sample of them is checked too).
 TEST(PlanarConversions, Avx2RoundingEqualsThePortableOneOverTheWholeRange) {
-    if (!HasAvx2()) GTEST_SKIP() << "no AVX2";
+    if (!RasterTools::HasAvx2()) GTEST_SKIP() << "no AVX2";
     constexpr std::uint32_t None = std::numeric_limits<std::uint32_t>::max();
     const std::uint32_t quarter = std::bit_cast<std::uint32_t>(0.25f);
     const std::uint32_t below = FirstRoundingDifference(0, quarter, 97);
