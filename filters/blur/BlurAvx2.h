@@ -1,9 +1,11 @@
 #pragma once
-// The blurs' premultiplied bilinear samples eight at a time with AVX2, for formats of four components with
-// alpha last: SampleBilinear4's operations in the same order on eight lanes (no fused multiply-add, max and
-// min in the operand order of the selects they stand for), so every sample is bit for bit what
-// SampleBilinear gives. Corners are fetched with gathers. Called only where the processor has AVX2.
+// The blurs' premultiplied bilinear samples eight at a time with AVX2, in every layer format:
+// SampleBilinear's operations in the same order on eight lanes (no fused multiply-add, max and min in the
+// operand order of the selects they stand for), so every sample is bit for bit what it gives. Corners are
+// fetched with gathers. Also the running sums' resolve of four-component integer formats, eight rows at once.
+// Called only where the processor has AVX2.
 
+#include "host/raster/PixelFormat.h"
 #include "pipeline/Cpu.h"
 
 #include <cstddef>
@@ -28,40 +30,53 @@ struct Access {
 
 namespace Detail {
 
-// Eight pixels of component type T: gathered from their offsets, split into float components, and the
-// rounded results packed and stored. Raw holds eight pixels as stored, so that exact copies keep their bits.
-template <class T>
+// Eight rounded results as Layout::Store rounds them: clamped to [0, maximum], plus a half, truncated.
+RT_TARGET_AVX2 inline __m256i Round(__m256 v, float maximum) noexcept {
+    const __m256 clamped = _mm256_min_ps(_mm256_max_ps(v, _mm256_setzero_ps()), _mm256_set1_ps(maximum));
+    return _mm256_cvttps_epi32(_mm256_add_ps(clamped, _mm256_set1_ps(0.5f)));
+}
+
+// Eight pixels of a format: gathered from their byte offsets, split into float components, and the results
+// rounded, packed and stored. Raw holds eight pixels as stored, so that exact copies keep their bits. N is
+// the number of components, A alpha's.
+template <class Component>
 struct Pixels;
 
 template <>
 struct Pixels<std::uint8_t> {
+    using T = std::uint8_t;
+    static constexpr int N = 4, A = 3;
     struct Raw {
         __m256i v;
     };
     RT_TARGET_AVX2 static Raw Gather(const std::byte* base, __m256i offset) noexcept {
         return {_mm256_i32gather_epi32(reinterpret_cast<const int*>(base), offset, 1)};
     }
-    RT_TARGET_AVX2 static void Components(const Raw& raw, __m256 (&c)[4]) noexcept {
+    RT_TARGET_AVX2 static void Components(const Raw& raw, __m256 (&c)[N]) noexcept {
         const __m256i byte = _mm256_set1_epi32(0xFF);
         c[0] = _mm256_cvtepi32_ps(_mm256_and_si256(raw.v, byte));
         c[1] = _mm256_cvtepi32_ps(_mm256_and_si256(_mm256_srli_epi32(raw.v, 8), byte));
         c[2] = _mm256_cvtepi32_ps(_mm256_and_si256(_mm256_srli_epi32(raw.v, 16), byte));
         c[3] = _mm256_cvtepi32_ps(_mm256_srli_epi32(raw.v, 24));
     }
-    RT_TARGET_AVX2 static Raw Pack(const __m256i (&w)[4]) noexcept {
+    RT_TARGET_AVX2 static Raw Finish(const __m256 (&v)[N]) noexcept {
+        const __m256i w[4] = {Round(v[0], 255.0f), Round(v[1], 255.0f), Round(v[2], 255.0f),
+                              Round(v[3], 255.0f)};
         return {_mm256_or_si256(_mm256_or_si256(w[0], _mm256_slli_epi32(w[1], 8)),
                                 _mm256_or_si256(_mm256_slli_epi32(w[2], 16), _mm256_slli_epi32(w[3], 24)))};
     }
     RT_TARGET_AVX2 static Raw Select(const Raw& computed, const Raw& copied, __m256i copy) noexcept {
         return {_mm256_blendv_epi8(computed.v, copied.v, copy)};
     }
-    RT_TARGET_AVX2 static void Store(const Raw& raw, std::uint8_t* out) noexcept {
+    RT_TARGET_AVX2 static void Store(const Raw& raw, T* out) noexcept {
         _mm256_storeu_si256(reinterpret_cast<__m256i*>(out), raw.v);
     }
 };
 
 template <>
 struct Pixels<std::uint16_t> {
+    using T = std::uint16_t;
+    static constexpr int N = 4, A = 3;
     struct Raw {
         __m256i low, high; // components 0 | 1 << 16 and 2 | 3 << 16
     };
@@ -69,22 +84,22 @@ struct Pixels<std::uint16_t> {
         return {_mm256_i32gather_epi32(reinterpret_cast<const int*>(base), offset, 1),
                 _mm256_i32gather_epi32(reinterpret_cast<const int*>(base + 4), offset, 1)};
     }
-    RT_TARGET_AVX2 static void Components(const Raw& raw, __m256 (&c)[4]) noexcept {
+    RT_TARGET_AVX2 static void Components(const Raw& raw, __m256 (&c)[N]) noexcept {
         const __m256i word = _mm256_set1_epi32(0xFFFF);
         c[0] = _mm256_cvtepi32_ps(_mm256_and_si256(raw.low, word));
         c[1] = _mm256_cvtepi32_ps(_mm256_srli_epi32(raw.low, 16));
         c[2] = _mm256_cvtepi32_ps(_mm256_and_si256(raw.high, word));
         c[3] = _mm256_cvtepi32_ps(_mm256_srli_epi32(raw.high, 16));
     }
-    RT_TARGET_AVX2 static Raw Pack(const __m256i (&w)[4]) noexcept {
-        return {_mm256_or_si256(w[0], _mm256_slli_epi32(w[1], 16)),
-                _mm256_or_si256(w[2], _mm256_slli_epi32(w[3], 16))};
+    RT_TARGET_AVX2 static Raw Finish(const __m256 (&v)[N]) noexcept {
+        return {_mm256_or_si256(Round(v[0], 65535.0f), _mm256_slli_epi32(Round(v[1], 65535.0f), 16)),
+                _mm256_or_si256(Round(v[2], 65535.0f), _mm256_slli_epi32(Round(v[3], 65535.0f), 16))};
     }
     RT_TARGET_AVX2 static Raw Select(const Raw& computed, const Raw& copied, __m256i copy) noexcept {
         return {_mm256_blendv_epi8(computed.low, copied.low, copy),
                 _mm256_blendv_epi8(computed.high, copied.high, copy)};
     }
-    RT_TARGET_AVX2 static void Store(const Raw& raw, std::uint16_t* out) noexcept {
+    RT_TARGET_AVX2 static void Store(const Raw& raw, T* out) noexcept {
         // Pixel i is the pair (low[i], high[i]); the unpacks give pixels 0, 1 | 4, 5 and 2, 3 | 6, 7.
         const __m256i even = _mm256_unpacklo_epi32(raw.low, raw.high);
         const __m256i odd = _mm256_unpackhi_epi32(raw.low, raw.high);
@@ -95,6 +110,8 @@ struct Pixels<std::uint16_t> {
 
 template <>
 struct Pixels<float> {
+    using T = float;
+    static constexpr int N = 4, A = 3;
     struct Raw {
         __m256 c[4];
     };
@@ -104,17 +121,18 @@ struct Pixels<float> {
             raw.c[m] = _mm256_i32gather_ps(reinterpret_cast<const float*>(base + 4 * m), offset, 1);
         return raw;
     }
-    RT_TARGET_AVX2 static void Components(const Raw& raw, __m256 (&c)[4]) noexcept {
+    RT_TARGET_AVX2 static void Components(const Raw& raw, __m256 (&c)[N]) noexcept {
         for (int m = 0; m < 4; ++m)
             c[m] = raw.c[m];
     }
+    RT_TARGET_AVX2 static Raw Finish(const __m256 (&v)[N]) noexcept { return {{v[0], v[1], v[2], v[3]}}; }
     RT_TARGET_AVX2 static Raw Select(const Raw& computed, const Raw& copied, __m256i copy) noexcept {
         Raw raw;
         for (int m = 0; m < 4; ++m)
             raw.c[m] = _mm256_blendv_ps(computed.c[m], copied.c[m], _mm256_castsi256_ps(copy));
         return raw;
     }
-    RT_TARGET_AVX2 static void Store(const Raw& raw, float* out) noexcept {
+    RT_TARGET_AVX2 static void Store(const Raw& raw, T* out) noexcept {
         // Components to pixels: pairs of components first, then pairs of pairs, then the 128-bit halves.
         const __m256 rg0 = _mm256_unpacklo_ps(raw.c[0], raw.c[1]),
                      rg1 = _mm256_unpackhi_ps(raw.c[0], raw.c[1]);
@@ -131,21 +149,107 @@ struct Pixels<float> {
     }
 };
 
-// Four results in stored form: integers rounded as Layout::Store rounds, floats as they are.
-template <class T>
-RT_TARGET_AVX2 inline typename Pixels<T>::Raw Finish(const __m256 (&v)[4]) noexcept {
-    if constexpr (std::is_same_v<T, float>) {
-        return {{v[0], v[1], v[2], v[3]}};
-    } else {
-        const __m256 maximum = _mm256_set1_ps(sizeof(T) == 1 ? 255.0f : 65535.0f);
-        __m256i w[4];
-        for (int m = 0; m < 4; ++m) {
-            const __m256 clamped = _mm256_min_ps(_mm256_max_ps(v[m], _mm256_setzero_ps()), maximum);
-            w[m] = _mm256_cvttps_epi32(_mm256_add_ps(clamped, _mm256_set1_ps(0.5f)));
+// Intensity and alpha, 8 or 16 bits each: a pixel is one 16- or 32-bit word, kept in the low bits of a lane.
+template <class Component>
+struct IntensityPixels {
+    using T = Component;
+    static constexpr int N = 2, A = 1;
+    static constexpr int Bits = 8 * int(sizeof(T));
+    static constexpr float Max = Bits == 8 ? 255.0f : 65535.0f;
+    struct Raw {
+        __m256i v;
+    };
+    RT_TARGET_AVX2 static Raw Gather(const std::byte* base, __m256i offset) noexcept {
+        if constexpr (Bits == 16) {
+            return {_mm256_i32gather_epi32(reinterpret_cast<const int*>(base), offset, 1)};
+        } else {
+            // Two-byte pixels start on even bytes: the 4-byte word on a 4-byte boundary around the pixel lies
+            // within the buffer (rows start on 64 bytes, and a last pixel on such a boundary has padding
+            // after it), and holds the pixel in its low or high half.
+            const __m256i aligned = _mm256_andnot_si256(_mm256_set1_epi32(3), offset);
+            const __m256i words = _mm256_i32gather_epi32(reinterpret_cast<const int*>(base), aligned, 1);
+            const __m256i shift = _mm256_slli_epi32(_mm256_and_si256(offset, _mm256_set1_epi32(2)), 3);
+            return {_mm256_and_si256(_mm256_srlv_epi32(words, shift), _mm256_set1_epi32(0xFFFF))};
         }
-        return Pixels<T>::Pack(w);
     }
-}
+    RT_TARGET_AVX2 static void Components(const Raw& raw, __m256 (&c)[N]) noexcept {
+        c[0] = _mm256_cvtepi32_ps(_mm256_and_si256(raw.v, _mm256_set1_epi32(Bits == 8 ? 0xFF : 0xFFFF)));
+        c[1] = _mm256_cvtepi32_ps(_mm256_srli_epi32(raw.v, Bits));
+    }
+    RT_TARGET_AVX2 static Raw Finish(const __m256 (&v)[N]) noexcept {
+        return {_mm256_or_si256(Round(v[0], Max), _mm256_slli_epi32(Round(v[1], Max), Bits))};
+    }
+    RT_TARGET_AVX2 static Raw Select(const Raw& computed, const Raw& copied, __m256i copy) noexcept {
+        return {_mm256_blendv_epi8(computed.v, copied.v, copy)};
+    }
+    RT_TARGET_AVX2 static void Store(const Raw& raw, T* out) noexcept {
+        if constexpr (Bits == 16) {
+            _mm256_storeu_si256(reinterpret_cast<__m256i*>(out), raw.v);
+        } else {
+            const __m128i words =
+                _mm_packus_epi32(_mm256_castsi256_si128(raw.v), _mm256_extracti128_si256(raw.v, 1));
+            _mm_storeu_si128(reinterpret_cast<__m128i*>(out), words);
+        }
+    }
+};
+
+// Four inks and alpha, a byte each: the inks as one 32-bit word, alpha in a lane of its own.
+struct CmykaPixels {
+    using T = std::uint8_t;
+    static constexpr int N = 5, A = 4;
+    struct Raw {
+        __m256i inks, alpha;
+    };
+    RT_TARGET_AVX2 static Raw Gather(const std::byte* base, __m256i offset) noexcept {
+        // The word from the pixel's second byte ends with its alpha, within the pixel.
+        const __m256i tail = _mm256_i32gather_epi32(reinterpret_cast<const int*>(base + 1), offset, 1);
+        return {_mm256_i32gather_epi32(reinterpret_cast<const int*>(base), offset, 1),
+                _mm256_srli_epi32(tail, 24)};
+    }
+    RT_TARGET_AVX2 static void Components(const Raw& raw, __m256 (&c)[N]) noexcept {
+        const __m256i byte = _mm256_set1_epi32(0xFF);
+        c[0] = _mm256_cvtepi32_ps(_mm256_and_si256(raw.inks, byte));
+        c[1] = _mm256_cvtepi32_ps(_mm256_and_si256(_mm256_srli_epi32(raw.inks, 8), byte));
+        c[2] = _mm256_cvtepi32_ps(_mm256_and_si256(_mm256_srli_epi32(raw.inks, 16), byte));
+        c[3] = _mm256_cvtepi32_ps(_mm256_srli_epi32(raw.inks, 24));
+        c[4] = _mm256_cvtepi32_ps(raw.alpha);
+    }
+    RT_TARGET_AVX2 static Raw Finish(const __m256 (&v)[N]) noexcept {
+        const __m256 four[4] = {v[0], v[1], v[2], v[3]};
+        return {Pixels<std::uint8_t>::Finish(four).v, Round(v[4], 255.0f)};
+    }
+    RT_TARGET_AVX2 static Raw Select(const Raw& computed, const Raw& copied, __m256i copy) noexcept {
+        return {_mm256_blendv_epi8(computed.inks, copied.inks, copy),
+                _mm256_blendv_epi8(computed.alpha, copied.alpha, copy)};
+    }
+    RT_TARGET_AVX2 static void Store(const Raw& raw, T* out) noexcept {
+        alignas(32) std::uint32_t inks[8], alpha[8];
+        _mm256_store_si256(reinterpret_cast<__m256i*>(inks), raw.inks);
+        _mm256_store_si256(reinterpret_cast<__m256i*>(alpha), raw.alpha);
+        for (int i = 0; i < 8; ++i) {
+            __builtin_memcpy(out + 5 * i, &inks[i], 4);
+            out[5 * i + 4] = T(alpha[i]);
+        }
+    }
+};
+
+// The pixels of each layer format.
+template <Raster::PixelFormat F>
+struct FormatPixels;
+template <>
+struct FormatPixels<Raster::PixelFormat::RGBA8> : Pixels<std::uint8_t> {};
+template <>
+struct FormatPixels<Raster::PixelFormat::RGBA16> : Pixels<std::uint16_t> {};
+template <>
+struct FormatPixels<Raster::PixelFormat::LabA16> : Pixels<std::uint16_t> {};
+template <>
+struct FormatPixels<Raster::PixelFormat::RGBAUF> : Pixels<float> {};
+template <>
+struct FormatPixels<Raster::PixelFormat::IA8> : IntensityPixels<std::uint8_t> {};
+template <>
+struct FormatPixels<Raster::PixelFormat::IA16> : IntensityPixels<std::uint16_t> {};
+template <>
+struct FormatPixels<Raster::PixelFormat::CMYKA8> : CmykaPixels {};
 
 // Clamps four locations to the grid's edges as std::clamp does and splits them into whole and fractional
 // parts as SampleBilinear does.
@@ -158,10 +262,11 @@ RT_TARGET_AVX2 inline void Split(const double* at, double low, double high, __m1
     fraction = _mm256_cvtpd_ps(_mm256_sub_pd(clamped, floor));
 }
 
-template <class T>
-[[gnu::always_inline]] RT_TARGET_AVX2 inline void Sample8(const Access& grid, const double* xs,
-                                                          const double* ys, T* out) noexcept {
-    using P = Pixels<T>;
+template <Raster::PixelFormat F>
+[[gnu::always_inline]] RT_TARGET_AVX2 inline void
+Sample8(const Access& grid, const double* xs, const double* ys, typename FormatPixels<F>::T* out) noexcept {
+    using P = FormatPixels<F>;
+    constexpr int N = P::N, A = P::A;
     __m128i x0Low, x0High, y0Low, y0High;
     __m128 fxLow, fxHigh, fyLow, fyHigh;
     Split(xs, grid.left, grid.lastX, x0Low, fxLow);
@@ -190,34 +295,40 @@ template <class T>
     const __m256 gx = _mm256_sub_ps(unit, fx), gy = _mm256_sub_ps(unit, fy);
     const __m256 weight[4] = {_mm256_mul_ps(gx, gy), _mm256_mul_ps(fx, gy), _mm256_mul_ps(gx, fy),
                               _mm256_mul_ps(fx, fy)};
-    __m256 alpha = _mm256_setzero_ps();
-    __m256 sum[3] = {_mm256_setzero_ps(), _mm256_setzero_ps(), _mm256_setzero_ps()};
+    // Colour sums for every component; alpha's is not used, as in SampleBilinear.
+    __m256 alpha = _mm256_setzero_ps(), sum[N];
+    for (int m = 0; m < N; ++m)
+        sum[m] = _mm256_setzero_ps();
     for (int k = 0; k < 4; ++k) {
-        __m256 c[4];
+        __m256 c[N];
         P::Components(corners[k], c);
-        const __m256 a = _mm256_mul_ps(c[3], weight[k]);
+        const __m256 a = _mm256_mul_ps(c[A], weight[k]);
         alpha = _mm256_add_ps(alpha, a);
-        for (int m = 0; m < 3; ++m)
-            sum[m] = _mm256_add_ps(sum[m], _mm256_mul_ps(c[m], a));
+        for (int m = 0; m < N; ++m)
+            if (m != A) sum[m] = _mm256_add_ps(sum[m], _mm256_mul_ps(c[m], a));
     }
     // Where every neighbour is transparent the colour is the plain weighted average.
     const __m256 weighted =
         _mm256_cmp_ps(_mm256_andnot_ps(_mm256_set1_ps(-0.0f), alpha), _mm256_set1_ps(1e-20f), _CMP_GE_OQ);
     if (_mm256_movemask_ps(weighted) != 0xFF) {
-        __m256 plain[3] = {_mm256_setzero_ps(), _mm256_setzero_ps(), _mm256_setzero_ps()};
+        __m256 plain[N];
+        for (int m = 0; m < N; ++m)
+            plain[m] = _mm256_setzero_ps();
         for (int k = 0; k < 4; ++k) {
-            __m256 c[4];
+            __m256 c[N];
             P::Components(corners[k], c);
-            for (int m = 0; m < 3; ++m)
-                plain[m] = _mm256_add_ps(plain[m], _mm256_mul_ps(c[m], weight[k]));
+            for (int m = 0; m < N; ++m)
+                if (m != A) plain[m] = _mm256_add_ps(plain[m], _mm256_mul_ps(c[m], weight[k]));
         }
-        for (int m = 0; m < 3; ++m)
+        for (int m = 0; m < N; ++m)
             sum[m] = _mm256_blendv_ps(plain[m], sum[m], weighted);
     }
+    // Alpha is the weighted sum itself, not divided.
     const __m256 inverse = _mm256_div_ps(unit, _mm256_blendv_ps(unit, alpha, weighted));
-    const __m256 result[4] = {_mm256_mul_ps(sum[0], inverse), _mm256_mul_ps(sum[1], inverse),
-                              _mm256_mul_ps(sum[2], inverse), alpha};
-    typename P::Raw pixels = Finish<T>(result);
+    __m256 result[N];
+    for (int m = 0; m < N; ++m)
+        result[m] = m == A ? alpha : _mm256_mul_ps(sum[m], inverse);
+    typename P::Raw pixels = P::Finish(result);
     // A sample on a pixel centre copies that pixel.
     const __m256 exact = _mm256_and_ps(_mm256_cmp_ps(fx, _mm256_setzero_ps(), _CMP_EQ_OQ),
                                        _mm256_cmp_ps(fy, _mm256_setzero_ps(), _CMP_EQ_OQ));
@@ -295,15 +406,17 @@ RT_TARGET_AVX2 inline void ResolveSums8(const std::uint32_t (*sums)[4], const st
     const __m256 colourScale = _mm256_div_ps(_mm256_set1_ps(scaled), _mm256_blendv_ps(unit, alpha, divide));
     const __m256 result[4] = {_mm256_mul_ps(c[0], colourScale), _mm256_mul_ps(c[1], colourScale),
                               _mm256_mul_ps(c[2], colourScale), _mm256_mul_ps(c[3], _mm256_set1_ps(inverse))};
-    Detail::Pixels<T>::Store(Detail::Finish<T>(result), out);
+    Detail::Pixels<T>::Store(Detail::Pixels<T>::Finish(result), out);
 }
 
-// Samples indices first..last - 1 into out (index i's pixel at out + 4 × i); position(i, x, y) gives index
+// Samples indices first..last - 1 into out (index i's pixel at out + N × i); position(i, x, y) gives index
 // i's location. Locations are worked out a batch at a time, in this build too, so that their loop can use the
 // wide registers. A last part of fewer than eight repeats its final location and keeps what it needs.
-template <class T, class Position>
+template <Raster::PixelFormat F, class Position>
 RT_TARGET_AVX2 void SampleRun(const Access& grid, int first, int last, const Position& position,
-                              T* out) noexcept {
+                              typename Detail::FormatPixels<F>::T* out) noexcept {
+    using T = typename Detail::FormatPixels<F>::T;
+    constexpr int N = Detail::FormatPixels<F>::N;
     constexpr int Batch = 64;
     double xs[Batch + 8], ys[Batch + 8];
     for (int i = first; i < last;) {
@@ -312,16 +425,16 @@ RT_TARGET_AVX2 void SampleRun(const Access& grid, int first, int last, const Pos
             position(i + k, xs[k], ys[k]);
         int k = 0;
         for (; k + 8 <= count; k += 8)
-            Detail::Sample8(grid, xs + k, ys + k, out + std::ptrdiff_t(i + k) * 4);
+            Detail::Sample8<F>(grid, xs + k, ys + k, out + std::ptrdiff_t(i + k) * N);
         if (k < count) {
             for (int e = count; e < k + 8; ++e) {
                 xs[e] = xs[count - 1];
                 ys[e] = ys[count - 1];
             }
-            T pixels[8 * 4];
-            Detail::Sample8(grid, xs + k, ys + k, pixels);
-            for (int e = 0; e < (count - k) * 4; ++e)
-                out[std::ptrdiff_t(i + k) * 4 + e] = pixels[e];
+            T pixels[8 * N];
+            Detail::Sample8<F>(grid, xs + k, ys + k, pixels);
+            for (int e = 0; e < (count - k) * N; ++e)
+                out[std::ptrdiff_t(i + k) * N + e] = pixels[e];
         }
         i += count;
     }

@@ -359,11 +359,9 @@ inline void SampleBilinearRun(const Grid& grid, int first, int last, const Posit
     constexpr int N = Layout<F>::N;
     int i = first;
 #if RT_AVX2_BUILD
-    if constexpr (N == 4 && Layout<F>::A == 3) {
-        if (HasAvx2()) {
-            Avx2::SampleRun(grid.Locations(), first, last, position, out);
-            return;
-        }
+    if (HasAvx2()) {
+        Avx2::SampleRun<F>(grid.Locations(), first, last, position, out);
+        return;
     }
 #endif
     for (; i + 4 <= last; i += 4) {

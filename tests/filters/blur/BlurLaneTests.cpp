@@ -1,6 +1,6 @@
-// The motion blur's four-lane routines against the one-pixel routines they stand in for, in every format of
-// four components with alpha last: bilinear samples and resolved sums equal bit for bit, over translucent
-// and transparent neighbours, pixel centres, the grid's edges and locations beyond them.
+// The motion blur's four- and eight-lane routines against the one-pixel routines they stand in for: bilinear
+// samples and resolved sums equal bit for bit, over translucent and transparent neighbours, pixel centres,
+// the grid's edges and locations beyond them.
 
 #include "filters/blur/BlurPixels.h"
 #include "host/raster/DynamicBuffer.h"
@@ -80,9 +80,17 @@ TYPED_TEST(BlurLanes, FourSamplesEqualFourSingleSamples) {
     EXPECT_EQ(compared, 20000);
 }
 
-// Runs of samples take eight lanes where the processor has AVX2, four otherwise, and the rest one by one;
-// both grids, every run length around the batch sizes, and locations far outside the grid.
-TYPED_TEST(BlurLanes, RunsOfSamplesEqualSingleSamples) {
+using LayerFormats =
+    ::testing::Types<Format<PixelFormat::RGBA8>, Format<PixelFormat::RGBA16>, Format<PixelFormat::RGBAUF>,
+                     Format<PixelFormat::IA8>, Format<PixelFormat::IA16>, Format<PixelFormat::CMYKA8>,
+                     Format<PixelFormat::LabA16>>;
+template <class P>
+class BlurRuns : public ::testing::Test {};
+TYPED_TEST_SUITE(BlurRuns, LayerFormats);
+
+// Runs of samples take eight lanes where the processor has AVX2 (in every format), four otherwise, and the
+// rest one by one; both grids, every run length around the batch sizes, and locations far outside the grid.
+TYPED_TEST(BlurRuns, RunsOfSamplesEqualSingleSamples) {
     constexpr PixelFormat F = TypeParam::Value;
     using L = Blur::Layout<F>;
     using T = typename L::T;
