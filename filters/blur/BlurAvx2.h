@@ -36,6 +36,15 @@ RT_TARGET_AVX2 inline __m256i Round(__m256 v, float maximum) noexcept {
     return _mm256_cvttps_epi32(_mm256_add_ps(clamped, _mm256_set1_ps(0.5f)));
 }
 
+// The four bytes of each lane, lowest first, as floats in c[0] to c[3].
+RT_TARGET_AVX2 inline void SplitBytes(__m256i v, __m256* c) noexcept {
+    const __m256i byte = _mm256_set1_epi32(0xFF);
+    c[0] = _mm256_cvtepi32_ps(_mm256_and_si256(v, byte));
+    c[1] = _mm256_cvtepi32_ps(_mm256_and_si256(_mm256_srli_epi32(v, 8), byte));
+    c[2] = _mm256_cvtepi32_ps(_mm256_and_si256(_mm256_srli_epi32(v, 16), byte));
+    c[3] = _mm256_cvtepi32_ps(_mm256_srli_epi32(v, 24));
+}
+
 // Eight pixels of a format: gathered from their byte offsets, split into float components, and the results
 // rounded, packed and stored. Raw holds eight pixels as stored, so that exact copies keep their bits. N is
 // the number of components, A alpha's.
@@ -52,13 +61,7 @@ struct Pixels<std::uint8_t> {
     RT_TARGET_AVX2 static Raw Gather(const std::byte* base, __m256i offset) noexcept {
         return {_mm256_i32gather_epi32(reinterpret_cast<const int*>(base), offset, 1)};
     }
-    RT_TARGET_AVX2 static void Components(const Raw& raw, __m256 (&c)[N]) noexcept {
-        const __m256i byte = _mm256_set1_epi32(0xFF);
-        c[0] = _mm256_cvtepi32_ps(_mm256_and_si256(raw.v, byte));
-        c[1] = _mm256_cvtepi32_ps(_mm256_and_si256(_mm256_srli_epi32(raw.v, 8), byte));
-        c[2] = _mm256_cvtepi32_ps(_mm256_and_si256(_mm256_srli_epi32(raw.v, 16), byte));
-        c[3] = _mm256_cvtepi32_ps(_mm256_srli_epi32(raw.v, 24));
-    }
+    RT_TARGET_AVX2 static void Components(const Raw& raw, __m256 (&c)[N]) noexcept { SplitBytes(raw.v, c); }
     RT_TARGET_AVX2 static Raw Finish(const __m256 (&v)[N]) noexcept {
         const __m256i w[4] = {Round(v[0], 255.0f), Round(v[1], 255.0f), Round(v[2], 255.0f),
                               Round(v[3], 255.0f)};
@@ -207,11 +210,7 @@ struct CmykaPixels {
                 _mm256_srli_epi32(tail, 24)};
     }
     RT_TARGET_AVX2 static void Components(const Raw& raw, __m256 (&c)[N]) noexcept {
-        const __m256i byte = _mm256_set1_epi32(0xFF);
-        c[0] = _mm256_cvtepi32_ps(_mm256_and_si256(raw.inks, byte));
-        c[1] = _mm256_cvtepi32_ps(_mm256_and_si256(_mm256_srli_epi32(raw.inks, 8), byte));
-        c[2] = _mm256_cvtepi32_ps(_mm256_and_si256(_mm256_srli_epi32(raw.inks, 16), byte));
-        c[3] = _mm256_cvtepi32_ps(_mm256_srli_epi32(raw.inks, 24));
+        SplitBytes(raw.inks, c);
         c[4] = _mm256_cvtepi32_ps(raw.alpha);
     }
     RT_TARGET_AVX2 static Raw Finish(const __m256 (&v)[N]) noexcept {
