@@ -8,13 +8,9 @@
 
 namespace RasterTools::MotionBlurRender {
 
-// Lines of the intermediate image worked out at a time: a band's two scratch images stay in the caches, and
-// the resample out writes every destination pixel that the band's lines make.
+// Lines of the intermediate image worked out at a time: the resample out writes every destination pixel that
+// the band's lines make, so a wider band gives longer runs, and its two scratch images still stay small.
 inline constexpr int Band = 64;
-// Lines resampled side by side, LineChunk rows at a time, so that neighbouring lines reuse the source rows
-// they cross.
-inline constexpr int LineGroup = 8;
-inline constexpr int LineChunk = 64;
 
 // Which line of the box the resample out of a destination row starts its sample in, as a function of x: the
 // sampler's own arithmetic (clamp, floor), monotonic in x, so that a band's pixels in a row are one run.
@@ -158,34 +154,23 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
         const int end = std::min(first + Band, width);
         const int count = std::min(end + 1, width) - first;
 
-        // 1. Resample the source into the band's rotated lines. Every sample position is worked out from its
-        // own intermediate coordinates, never stepped along the line, so a pixel does not depend on the tile.
-        for (int group = 0; group < count; group += LineGroup) {
-            const int groupEnd = std::min(group + LineGroup, count);
-            int from = 0, to = 0;
-            for (int i = group; i < groupEnd; ++i) {
-                const RowRange rows = sampledRows(first + i);
-                if (rows.first >= rows.last) continue;
-                from = from < to ? std::min(from, rows.first) : rows.first;
-                to = std::max(to, rows.last);
-            }
-            for (int chunk = from; chunk < to; chunk += LineChunk) {
-                for (int i = group; i < groupEnd; ++i) {
-                    const int j = first + i;
-                    const RowRange rows = sampledRows(j);
-                    const int begin = std::max(rows.first, chunk),
-                              stop = std::min(rows.last, chunk + LineChunk);
-                    T* line = rotated->Row<T>(i) + std::ptrdiff_t(lead) * N;
-                    const double mx = double(plan.box.left + j) + 0.5 - px;
-                    auto position = [&](int r, double& x, double& y) {
-                        const double my = double(plan.box.top - reach + r) + 0.5 - py;
-                        const double baseX = -s * my + px - 0.5, baseY = c * my + py - 0.5;
-                        x = baseX + c * mx;
-                        y = baseY + s * mx;
-                    };
-                    Blur::SampleBilinearRun<F>(sourceGrid, begin, stop, position, line);
-                }
-            }
+        // 1. Resample the source into the band's rotated lines, a line at a time (rows of the source a line
+        // crosses stay cached for the next line, since rows are an odd number of cache lines apart). Every
+        // sample position is worked out from its own intermediate coordinates, never stepped along the line,
+        // so a pixel does not depend on the tile.
+        for (int i = 0; i < count; ++i) {
+            const int j = first + i;
+            const RowRange rows = sampledRows(j);
+            if (rows.first >= rows.last) continue;
+            T* line = rotated->Row<T>(i) + std::ptrdiff_t(lead) * N;
+            const double mx = double(plan.box.left + j) + 0.5 - px;
+            auto position = [&](int r, double& x, double& y) {
+                const double my = double(plan.box.top - reach + r) + 0.5 - py;
+                const double baseX = -s * my + px - 0.5, baseY = c * my + py - 0.5;
+                x = baseX + c * mx;
+                y = baseY + s * mx;
+            };
+            Blur::SampleBilinearRun<F>(sourceGrid, rows.first, rows.last, position, line);
         }
         if (Kernel::IsAborted(target.abort)) return RenderPath::Aborted;
 
