@@ -72,8 +72,9 @@ rastertools_command() {
   copy) echo "$rastertools apply copy $common $input $2" ;;
   noise-gaussian) echo "$rastertools apply addnoise --intensity 0.3 --gaussian true $common $input $2" ;;
   noise-uniform) echo "$rastertools apply addnoise --intensity 0.3 --gaussian false $common $input $2" ;;
-  # Large tiles: each tile blurs its own rotated strip, and small tiles would repeat the radius's pad rows.
-  motionblur-*) echo "$rastertools apply motionblur --radius ${1#motionblur-} --radians 0.5235987755982988 --tile 2048 $common $input $2" ;;
+  # Tiles of 1024: each tile blurs its own rotated strip, so small tiles would repeat the radius's pad rows,
+  # and larger ones make longer lines than the caches hold.
+  motionblur-*) echo "$rastertools apply motionblur --radius ${1#motionblur-} --radians 0.5235987755982988 --tile 1024 $common $input $2" ;;
   # The whole image: a circle of half the side about the middle, as ImageMagick's swirl and implode take.
   twirl-90) echo "$rastertools apply twirl --angle 90 --radius $((size / 2)) $common $input $2" ;;
   sphere-50) echo "$rastertools apply sphere --intensity 50 --radius $((size / 2)) $common $input $2" ;;
