@@ -7,6 +7,7 @@
 // Planar's own loops, built for AVX2 by their caller. SpanConversions.cpp and the tests include this, and
 // call it where the processor has AVX2.
 
+#include "pipeline/Avx2Lanes.h"
 #include "pipeline/Cpu.h"
 #include "pipeline/PlanarConversions.h"
 
@@ -19,6 +20,12 @@ template <PixelFormat F>
 struct Kit : Planar<F> {};
 
 namespace Lanes {
+
+using Avx2Lanes::Byte;
+using Avx2Lanes::NarrowToWords;
+using Avx2Lanes::Pack;
+using Avx2Lanes::StorePairs;
+using Avx2Lanes::Transpose;
 
 // v > 0 ? v : 0, then low < maximum ? low : maximum (max and min return their second operand on NaN and on
 // equal zeros).
@@ -38,19 +45,6 @@ RT_TARGET_AVX2 inline __m256i Scale(__m256 v, float maximum) noexcept {
 }
 RT_TARGET_AVX2 inline __m256i ToByte(__m256 v) noexcept {
     return Scale(v, 255.0f);
-}
-// Byte Index of every 32-bit lane, as a float.
-template <int Index>
-RT_TARGET_AVX2 inline __m256 Byte(__m256i words) noexcept {
-    return _mm256_cvtepi32_ps(_mm256_and_si256(_mm256_srli_epi32(words, 8 * Index), _mm256_set1_epi32(0xff)));
-}
-RT_TARGET_AVX2 inline __m256i Pack(__m256i b0, __m256i b1, __m256i b2, __m256i b3) noexcept {
-    return _mm256_or_si256(_mm256_or_si256(b0, _mm256_slli_epi32(b1, 8)),
-                           _mm256_or_si256(_mm256_slli_epi32(b2, 16), _mm256_slli_epi32(b3, 24)));
-}
-// Eight 32-bit lanes of values up to 65535 to eight 16-bit ones.
-RT_TARGET_AVX2 inline __m128i NarrowToWords(__m256i lanes) noexcept {
-    return _mm_packus_epi32(_mm256_castsi256_si128(lanes), _mm256_extracti128_si256(lanes, 1));
 }
 
 // Loads of eight elements of Size bytes from i on, and stores of eight; the last step moves only what is
@@ -98,16 +92,6 @@ RT_TARGET_AVX2 inline unsigned char* Target(Element* out, int i, int n,
 template <class Element, std::size_t Bytes>
 RT_TARGET_AVX2 inline void Finish(Element* out, int i, int n, const unsigned char (&tail)[Bytes]) noexcept {
     if (i + 8 > n) std::memcpy(out + i, tail, std::size_t(n - i) * sizeof(Element));
-}
-
-// Rows of four floats to columns, in each 128-bit half on its own.
-RT_TARGET_AVX2 inline void Transpose(__m256& v0, __m256& v1, __m256& v2, __m256& v3) noexcept {
-    const __m256 low01 = _mm256_unpacklo_ps(v0, v1), high01 = _mm256_unpackhi_ps(v0, v1);
-    const __m256 low23 = _mm256_unpacklo_ps(v2, v3), high23 = _mm256_unpackhi_ps(v2, v3);
-    v0 = _mm256_shuffle_ps(low01, low23, 0x44);
-    v1 = _mm256_shuffle_ps(low01, low23, 0xee);
-    v2 = _mm256_shuffle_ps(high01, high23, 0x44);
-    v3 = _mm256_shuffle_ps(high01, high23, 0xee);
 }
 
 } // namespace Lanes
@@ -169,14 +153,8 @@ struct Kit<PixelFormat::RGBA16> {
             const __m256i a = Scale(_mm256_load_ps(w.a + i), 65535.0f);
             const __m256i rg = _mm256_or_si256(r, _mm256_slli_epi32(g, 16));
             const __m256i ba = _mm256_or_si256(b, _mm256_slli_epi32(a, 16));
-            // Pixels 0 1 | 4 5 and 2 3 | 6 7, then put in order.
-            const __m256i low = _mm256_unpacklo_epi32(rg, ba), high = _mm256_unpackhi_epi32(rg, ba);
             alignas(32) unsigned char tail[8 * sizeof(ushort4)];
-            unsigned char* bytes = Target(out, i, n, tail);
-            _mm256_storeu_si256(reinterpret_cast<__m256i*>(bytes),
-                                _mm256_permute2x128_si256(low, high, 0x20));
-            _mm256_storeu_si256(reinterpret_cast<__m256i*>(bytes + 32),
-                                _mm256_permute2x128_si256(low, high, 0x31));
+            StorePairs(rg, ba, Target(out, i, n, tail));
             Finish(out, i, n, tail);
         }
     }

@@ -6,6 +6,7 @@
 // Called only where the processor has AVX2.
 
 #include "host/raster/PixelFormat.h"
+#include "pipeline/Avx2Lanes.h"
 #include "pipeline/Cpu.h"
 
 #include <cstddef>
@@ -38,11 +39,10 @@ RT_TARGET_AVX2 inline __m256i Round(__m256 v, float maximum) noexcept {
 
 // The four bytes of each lane, lowest first, as floats in c[0] to c[3].
 RT_TARGET_AVX2 inline void SplitBytes(__m256i v, __m256* c) noexcept {
-    const __m256i byte = _mm256_set1_epi32(0xFF);
-    c[0] = _mm256_cvtepi32_ps(_mm256_and_si256(v, byte));
-    c[1] = _mm256_cvtepi32_ps(_mm256_and_si256(_mm256_srli_epi32(v, 8), byte));
-    c[2] = _mm256_cvtepi32_ps(_mm256_and_si256(_mm256_srli_epi32(v, 16), byte));
-    c[3] = _mm256_cvtepi32_ps(_mm256_srli_epi32(v, 24));
+    c[0] = Avx2Lanes::Byte<0>(v);
+    c[1] = Avx2Lanes::Byte<1>(v);
+    c[2] = Avx2Lanes::Byte<2>(v);
+    c[3] = Avx2Lanes::Byte<3>(v);
 }
 
 // Eight pixels of a format: gathered from their byte offsets, split into float components, and the results
@@ -63,10 +63,8 @@ struct Pixels<std::uint8_t> {
     }
     RT_TARGET_AVX2 static void Components(const Raw& raw, __m256 (&c)[N]) noexcept { SplitBytes(raw.v, c); }
     RT_TARGET_AVX2 static Raw Finish(const __m256 (&v)[N]) noexcept {
-        const __m256i w[4] = {Round(v[0], 255.0f), Round(v[1], 255.0f), Round(v[2], 255.0f),
-                              Round(v[3], 255.0f)};
-        return {_mm256_or_si256(_mm256_or_si256(w[0], _mm256_slli_epi32(w[1], 8)),
-                                _mm256_or_si256(_mm256_slli_epi32(w[2], 16), _mm256_slli_epi32(w[3], 24)))};
+        return {Avx2Lanes::Pack(Round(v[0], 255.0f), Round(v[1], 255.0f), Round(v[2], 255.0f),
+                                Round(v[3], 255.0f))};
     }
     RT_TARGET_AVX2 static Raw Select(const Raw& computed, const Raw& copied, __m256i copy) noexcept {
         return {_mm256_blendv_epi8(computed.v, copied.v, copy)};
@@ -103,11 +101,7 @@ struct Pixels<std::uint16_t> {
                 _mm256_blendv_epi8(computed.high, copied.high, copy)};
     }
     RT_TARGET_AVX2 static void Store(const Raw& raw, T* out) noexcept {
-        // Pixel i is the pair (low[i], high[i]); the unpacks give pixels 0, 1 | 4, 5 and 2, 3 | 6, 7.
-        const __m256i even = _mm256_unpacklo_epi32(raw.low, raw.high);
-        const __m256i odd = _mm256_unpackhi_epi32(raw.low, raw.high);
-        _mm256_storeu_si256(reinterpret_cast<__m256i*>(out), _mm256_permute2x128_si256(even, odd, 0x20));
-        _mm256_storeu_si256(reinterpret_cast<__m256i*>(out + 16), _mm256_permute2x128_si256(even, odd, 0x31));
+        Avx2Lanes::StorePairs(raw.low, raw.high, out);
     }
 };
 
@@ -136,15 +130,9 @@ struct Pixels<float> {
         return raw;
     }
     RT_TARGET_AVX2 static void Store(const Raw& raw, T* out) noexcept {
-        // Components to pixels: pairs of components first, then pairs of pairs, then the 128-bit halves.
-        const __m256 rg0 = _mm256_unpacklo_ps(raw.c[0], raw.c[1]),
-                     rg1 = _mm256_unpackhi_ps(raw.c[0], raw.c[1]);
-        const __m256 ba0 = _mm256_unpacklo_ps(raw.c[2], raw.c[3]),
-                     ba1 = _mm256_unpackhi_ps(raw.c[2], raw.c[3]);
-        const __m256 p04 = _mm256_castpd_ps(_mm256_unpacklo_pd(_mm256_castps_pd(rg0), _mm256_castps_pd(ba0)));
-        const __m256 p15 = _mm256_castpd_ps(_mm256_unpackhi_pd(_mm256_castps_pd(rg0), _mm256_castps_pd(ba0)));
-        const __m256 p26 = _mm256_castpd_ps(_mm256_unpacklo_pd(_mm256_castps_pd(rg1), _mm256_castps_pd(ba1)));
-        const __m256 p37 = _mm256_castpd_ps(_mm256_unpackhi_pd(_mm256_castps_pd(rg1), _mm256_castps_pd(ba1)));
+        // Components to pixels: the in-half transpose gives pixels 0 | 4, 1 | 5, 2 | 6 and 3 | 7.
+        __m256 p04 = raw.c[0], p15 = raw.c[1], p26 = raw.c[2], p37 = raw.c[3];
+        Avx2Lanes::Transpose(p04, p15, p26, p37);
         _mm256_storeu_ps(out, _mm256_permute2f128_ps(p04, p15, 0x20));
         _mm256_storeu_ps(out + 8, _mm256_permute2f128_ps(p26, p37, 0x20));
         _mm256_storeu_ps(out + 16, _mm256_permute2f128_ps(p04, p15, 0x31));
@@ -189,9 +177,7 @@ struct IntensityPixels {
         if constexpr (Bits == 16) {
             _mm256_storeu_si256(reinterpret_cast<__m256i*>(out), raw.v);
         } else {
-            const __m128i words =
-                _mm_packus_epi32(_mm256_castsi256_si128(raw.v), _mm256_extracti128_si256(raw.v, 1));
-            _mm_storeu_si128(reinterpret_cast<__m128i*>(out), words);
+            _mm_storeu_si128(reinterpret_cast<__m128i*>(out), Avx2Lanes::NarrowToWords(raw.v));
         }
     }
 };
@@ -345,16 +331,10 @@ RT_TARGET_AVX2 inline __m256 ExactFloat(__m256i v) noexcept {
 // Eight pixels' four sums as floats, one component per register. Pixels i and i + 4 share a register, one
 // per 128-bit half, so that an in-half transpose gives the components in pixel order.
 RT_TARGET_AVX2 inline void SumComponents(const std::uint32_t (*from)[4], __m256 (&c)[4]) noexcept {
-    __m256 rows[4];
     for (int i = 0; i < 4; ++i)
-        rows[i] = ExactFloat(_mm256_set_m128i(_mm_loadu_si128(reinterpret_cast<const __m128i*>(from[i + 4])),
-                                              _mm_loadu_si128(reinterpret_cast<const __m128i*>(from[i]))));
-    const __m256 t0 = _mm256_unpacklo_ps(rows[0], rows[1]), t1 = _mm256_unpacklo_ps(rows[2], rows[3]);
-    const __m256 t2 = _mm256_unpackhi_ps(rows[0], rows[1]), t3 = _mm256_unpackhi_ps(rows[2], rows[3]);
-    c[0] = _mm256_shuffle_ps(t0, t1, 0x44);
-    c[1] = _mm256_shuffle_ps(t0, t1, 0xEE);
-    c[2] = _mm256_shuffle_ps(t2, t3, 0x44);
-    c[3] = _mm256_shuffle_ps(t2, t3, 0xEE);
+        c[i] = ExactFloat(_mm256_set_m128i(_mm_loadu_si128(reinterpret_cast<const __m128i*>(from[i + 4])),
+                                           _mm_loadu_si128(reinterpret_cast<const __m128i*>(from[i]))));
+    Avx2Lanes::Transpose(c[0], c[1], c[2], c[3]);
 }
 
 } // namespace Detail
