@@ -17,6 +17,7 @@
 #include <iomanip>
 #include <iostream>
 #include <optional>
+#include <set>
 #include <thread>
 
 namespace App {
@@ -58,6 +59,7 @@ int DefaultTileSize(const RasterCommand& command, int width, int height, int thr
 
 ApplyOptions ParseArguments(const std::vector<std::string>& args) {
     ApplyOptions options;
+    std::set<std::string> seen;
     for (std::size_t i = 0; i < args.size(); ++i) {
         const std::string& arg = args[i];
         if (!arg.starts_with("--")) {
@@ -67,14 +69,16 @@ ApplyOptions ParseArguments(const std::vector<std::string>& args) {
                 options.files.push_back(arg);
             continue;
         }
-        if (i + 1 >= args.size()) throw UsageError(arg + " needs a value");
+        if (i + 1 >= args.size()) throw UsageError(QuoteExcerpt(arg) + " needs a value");
+        // Which of two values was meant cannot be guessed.
+        if (!seen.insert(arg).second) throw UsageError(QuoteExcerpt(arg) + " is given more than once");
         const std::string& value = args[++i];
         if (arg == "--device")
             options.device = value;
         else if (arg == "--tile")
-            options.tileSize = ParseCount(arg, value, 1);
+            options.tileSize = ParseTileSize(value);
         else if (arg == "--threads")
-            options.threads = ParseCount(arg, value, 0);
+            options.threads = ParseThreadCount(value);
         else if (arg == "--mask")
             options.mask = value;
         else if (arg == "--channels")
@@ -132,7 +136,7 @@ Kernel::Counted<Raster::DynamicBuffer> ConvertOnLoad(Kernel::Counted<Raster::Dyn
 
 } // namespace
 
-int RunApply(const std::vector<std::string>& args) {
+CheckedApply CheckApplyArguments(const std::vector<std::string>& args) {
     const ApplyOptions options = ParseArguments(args);
     const RasterTools::FilterInfo* filter = &RequireFilter(options.filter);
     // A filter without a format parameter of its own takes --format as the format to convert the input to
@@ -149,13 +153,28 @@ int RunApply(const std::vector<std::string>& args) {
         }
         loadFormat = Raster::ParsePixelFormat(text);
         if (!loadFormat || !Raster::IsLayerFormat(*loadFormat))
-            throw UsageError("--format: \"" + text + "\" is not a layer format (" + LayerFormatNames() + ")");
+            throw UsageError("--format: " + QuoteExcerpt(text) + " is not a layer format (" +
+                             LayerFormatNames() + ")");
     }
     const std::vector<RasterTools::ParameterValue> values = ParseFilterParameters(*filter, parameters);
 
-    const auto command = filter->makeCommand(false, values);
+    CheckedApply checked;
+    checked.command = filter->makeCommand(false, values);
+    if (!dynamic_cast<const RasterTools::PipelineCommand*>(checked.command.Get()))
+        throw Error(options.filter + " cannot be applied from the command line yet");
+    checked.loadFormat = loadFormat ? int(*loadFormat) : -1;
+    checked.tileSize = options.tileSize.value_or(0);
+    checked.threads = options.threads;
+    return checked;
+}
+
+int RunApply(const std::vector<std::string>& args) {
+    const CheckedApply checked = CheckApplyArguments(args);
+    const ApplyOptions options = ParseArguments(args);
+    const auto& command = checked.command;
     const auto* pipeline = dynamic_cast<const RasterTools::PipelineCommand*>(command.Get());
-    if (!pipeline) throw Error(options.filter + " cannot be applied from the command line yet");
+    const std::optional<Raster::PixelFormat> loadFormat =
+        checked.loadFormat >= 0 ? std::optional(Raster::PixelFormat(checked.loadFormat)) : std::nullopt;
 
     const std::string& input = options.files[0];
     const std::string& output = options.files[1];

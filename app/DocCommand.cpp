@@ -64,7 +64,8 @@ std::map<std::string, std::string> TakeOptions(const DocArguments& arguments, co
             throw UsageError("doc " + subcommand + " has no option " + (name == "o" ? "-o" : "--" + name) +
                              " (it takes " + (known.empty() ? std::string("none") : known) + ")");
         }
-        values[name] = value;
+        if (!values.emplace(name, value).second)
+            throw UsageError((name == "o" ? "-o" : "--" + name) + " is given more than once");
     }
     if (arguments.live) throw UsageError("--live belongs to doc filter");
     return values;
@@ -195,8 +196,8 @@ int RunRender(const DocArguments& arguments) {
     if (!type) throw UsageError(output + ": unknown file type (use .png, .jpg, .jpeg, .tif or .tiff)");
     FlattenOptions flatten;
     if (options.contains("format")) flatten.format = ParseLayerFormat(options.at("format"));
-    if (options.contains("tile")) flatten.tileSize = ParseCount("--tile", options.at("tile"), 1);
-    if (options.contains("threads")) flatten.threads = ParseCount("--threads", options.at("threads"), 0);
+    if (options.contains("tile")) flatten.tileSize = ParseTileSize(options.at("tile"));
+    if (options.contains("threads")) flatten.threads = ParseThreadCount(options.at("threads"));
 
     const DeviceSelection selection =
         ResolveDeviceSelector(options.contains("device") ? options.at("device") : std::string());

@@ -35,13 +35,41 @@ std::string LayerFormatNames() {
     return names;
 }
 
-int ParseCount(const std::string& option, const std::string& text, int minimum) {
+int ParseCount(const std::string& option, const std::string& text, int minimum, int maximum) {
     int value = 0;
     const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), value);
-    if (error != std::errc() || end != text.data() + text.size() || value < minimum)
-        throw UsageError(option + " needs a whole number of at least " + std::to_string(minimum) +
-                         ", not \"" + text + "\"");
+    if (error != std::errc() || end != text.data() + text.size() || value < minimum || value > maximum)
+        throw UsageError(option + " needs a whole number from " + std::to_string(minimum) + " to " +
+                         std::to_string(maximum) + ", not " + QuoteExcerpt(text));
     return value;
+}
+
+int ParseTileSize(const std::string& text) {
+    return ParseCount("--tile", text, kMinimumTileSize, kMaximumTileSize);
+}
+
+int ParseThreadCount(const std::string& text) {
+    return ParseCount("--threads", text, 0, kMaximumThreads);
+}
+
+std::string EscapeBytes(std::string_view text) {
+    static constexpr char kHex[] = "0123456789abcdef";
+    std::string escaped;
+    for (const char c : text) {
+        const auto byte = static_cast<unsigned char>(c);
+        if (byte >= 0x20 && byte < 0x7F) {
+            escaped += c;
+        } else {
+            escaped += "\\x";
+            escaped += kHex[byte >> 4];
+            escaped += kHex[byte & 15];
+        }
+    }
+    return escaped;
+}
+
+std::string QuoteExcerpt(std::string_view text, std::size_t limit) {
+    return "\"" + EscapeBytes(text.substr(0, limit)) + (text.size() > limit ? "\"..." : "\"");
 }
 
 const RasterTools::FilterInfo& RequireFilter(const std::string& name) {
@@ -49,7 +77,7 @@ const RasterTools::FilterInfo& RequireFilter(const std::string& name) {
     std::string known;
     for (const auto& info : RasterTools::GetFilterCatalogue())
         known += (known.empty() ? "" : ", ") + std::string(info.name);
-    throw UsageError("unknown filter \"" + name + "\" (filters: " + known + ")");
+    throw UsageError("unknown filter " + QuoteExcerpt(name) + " (filters: " + known + ")");
 }
 
 std::vector<RasterTools::ParameterValue>
@@ -58,6 +86,7 @@ ParseFilterParameters(const RasterTools::FilterInfo& filter,
     std::vector<RasterTools::ParameterValue> values;
     for (const auto& spec : filter.parameters)
         values.push_back(spec.defaultValue);
+    std::vector<bool> given(filter.parameters.size(), false);
     for (const auto& [name, text] : parameters) {
         std::size_t index = 0;
         while (index < filter.parameters.size() && filter.parameters[index].name != name)
@@ -66,30 +95,23 @@ ParseFilterParameters(const RasterTools::FilterInfo& filter,
             std::string known;
             for (const auto& spec : filter.parameters)
                 known += (known.empty() ? "--" : ", --") + std::string(spec.name);
-            throw UsageError(std::string(filter.name) + " has no parameter --" + name + " (it takes " +
-                             (known.empty() ? std::string("none") : known) + ")");
+            throw UsageError(std::string(filter.name) + " has no parameter " + QuoteExcerpt("--" + name) +
+                             " (it takes " + (known.empty() ? std::string("none") : known) + ")");
         }
+        // Which of two values was meant cannot be guessed.
+        if (given[index]) throw UsageError("--" + name + " is given more than once");
+        given[index] = true;
         const auto& spec = filter.parameters[index];
+        const bool isFormat = spec.name == "format";
         const auto value = ParseValue(spec, text);
+        if (isFormat && (!value || !RasterTools::IsAcceptedValue(spec, *value)))
+            throw UsageError("--format: " + QuoteExcerpt(text) + " is not a layer format (" +
+                             LayerFormatNames() + ")");
         if (!value)
-            throw UsageError("--" + name + ": \"" + text + "\" is not a " +
-                             std::string(RasterTools::ParameterTypeName(spec.type)) +
-                             (spec.name == "format" ? " or a format name (" + LayerFormatNames() + ")" : ""));
-        if (spec.type == RasterTools::ParameterType::Point) {
-            const auto point = std::get<Kernel::PointT<double>>(*value);
-            if (point.x < spec.minimum || point.x > spec.maximum || point.y < spec.minimum ||
-                point.y > spec.maximum)
-                throw UsageError("--" + name + " must lie within " +
-                                 RasterTools::FormatParameterValue(spec.minimum) + " .. " +
-                                 RasterTools::FormatParameterValue(spec.maximum) + " on both axes");
-        } else if (spec.type != RasterTools::ParameterType::Bool) {
-            const double number = spec.type == RasterTools::ParameterType::Int ? double(std::get<int>(*value))
-                                                                               : std::get<double>(*value);
-            if (number < spec.minimum || (number > spec.maximum && !spec.openMaximum))
-                throw UsageError("--" + name + " must lie within " +
-                                 RasterTools::FormatParameterValue(spec.minimum) + " .. " +
-                                 RasterTools::FormatParameterValue(spec.maximum));
-        }
+            throw UsageError("--" + name + ": " + QuoteExcerpt(text) + " is not a " +
+                             std::string(RasterTools::ParameterTypeName(spec.type)));
+        if (!RasterTools::IsAcceptedValue(spec, *value))
+            throw UsageError("--" + name + " " + RasterTools::DescribeAcceptedValues(spec));
         values[index] = *value;
     }
     return values;

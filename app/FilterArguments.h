@@ -4,6 +4,7 @@
 #include "filters/Catalogue.h"
 
 #include <string>
+#include <string_view>
 #include <utility>
 #include <vector>
 
@@ -22,8 +23,34 @@ ParseFilterParameters(const RasterTools::FilterInfo& filter,
 std::string DescribeParameterValues(const RasterTools::FilterInfo& filter,
                                     const std::vector<RasterTools::ParameterValue>& values);
 
-// A whole number of at least minimum for option, or a UsageError.
-int ParseCount(const std::string& option, const std::string& text, int minimum);
+// A whole number from minimum to maximum for option, or a UsageError.
+int ParseCount(const std::string& option, const std::string& text, int minimum, int maximum = 1 << 30);
+
+// The smallest tile side and the most worker threads accepted: smaller tiles or more threads only multiply
+// the work each tile repeats (its margins, its set-up) without rendering anything more.
+constexpr int kMinimumTileSize = 16;
+constexpr int kMaximumTileSize = 1 << 16;
+constexpr int kMaximumThreads = 256;
+// --tile N and --threads N, within the bounds above (threads 0: every core).
+int ParseTileSize(const std::string& text);
+int ParseThreadCount(const std::string& text);
+
+// text with every byte that is not printable ASCII written as \xNN.
+std::string EscapeBytes(std::string_view text);
+// text in double quotes for a message: at most limit characters of it (then "..."), with bytes that are
+// not printable ASCII escaped, so that a message never carries raw binary or a whole file.
+std::string QuoteExcerpt(std::string_view text, std::size_t limit = 40);
+
+// What `apply` decides from its arguments alone, before it reads a file: the command, the format to convert
+// the input to (-1: none), the tile side (0: chosen for the image) and the threads (0: every core).
+struct CheckedApply {
+    Kernel::Counted<RasterCommand> command;
+    int loadFormat = -1;
+    int tileSize = 0;
+    int threads = 0;
+};
+// Every check `apply` makes of its arguments; a UsageError (or Error) names what is wrong.
+CheckedApply CheckApplyArguments(const std::vector<std::string>& args);
 
 // The layer formats' names, comma separated.
 std::string LayerFormatNames();

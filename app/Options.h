@@ -1,6 +1,7 @@
 #pragma once
 // Small helpers shared by the rastertools subcommands: errors with exit codes, argument parsing.
 
+#include <iosfwd>
 #include <stdexcept>
 #include <string>
 #include <string_view>
@@ -29,6 +30,10 @@ public:
     explicit UsageError(std::string message)
         : Error(std::move(message), kExitUsage) {}
 };
+
+// Runs a play script read from in, writing what the host sees to out; name labels the errors. Without
+// filesAllowed the verbs that read or write files (save, load, render) are refused.
+void PlayScript(std::istream& in, std::ostream& out, const std::string& name, bool filesAllowed);
 
 int RunList(const std::vector<std::string>& args);
 int RunPlay(const std::vector<std::string>& args);

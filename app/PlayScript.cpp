@@ -1,6 +1,7 @@
 // rastertools play: drives the library's tools through the host as an editor would, one verb a line,
 // and prints what the host sees (hints, notifications, enqueued commands, merges, history, settings).
 
+#include "app/FilterArguments.h"
 #include "app/Options.h"
 #include "filters/Catalogue.h"
 #include "host/document/DocumentController.h"
@@ -31,7 +32,7 @@ constexpr std::string_view kShows = "params, hint, reflected, settings, history,
 
 Kernel::PointT<double> ParsePoint(const std::string& text) {
     auto value = RasterTools::ParseParameterValue(RasterTools::ParameterType::Point, text);
-    if (!value) throw ScriptError("\"" + text + "\" is not a point (expected X,Y)");
+    if (!value) throw ScriptError(QuoteExcerpt(text) + " is not a point (expected X,Y)");
     return std::get<Kernel::PointT<double>>(*value);
 }
 
@@ -39,14 +40,16 @@ int ParseIndex(const std::string& text, int limit, const char* what) {
     int value = -1;
     const auto result = std::from_chars(text.data(), text.data() + text.size(), value);
     if (result.ec != std::errc() || result.ptr != text.data() + text.size() || value < 0 || value >= limit)
-        throw ScriptError("\"" + text + "\" is not a " + what + " (0 to " + std::to_string(limit - 1) + ")");
+        throw ScriptError(QuoteExcerpt(text) + " is not a " + what + " (0 to " + std::to_string(limit - 1) +
+                          ")");
     return value;
 }
 
 class PlaySession {
 public:
-    explicit PlaySession(std::ostream& out)
-        : m_Out(out) {
+    PlaySession(std::ostream& out, bool filesAllowed)
+        : m_Out(out)
+        , m_FilesAllowed(filesAllowed) {
         auto document = Kernel::MakeCounted<Document>();
         const DocumentDefaults defaults;
         document->InsertLayer(
@@ -59,6 +62,8 @@ public:
 
     void Execute(const std::vector<std::string>& words) {
         const std::string& verb = words[0];
+        if (!m_FilesAllowed && (verb == "save" || verb == "load" || verb == "render"))
+            throw ScriptError(verb + " is not available here: this script may not touch files");
         const auto arguments = [&](std::size_t minimum, std::size_t maximum, const char* usage) {
             if (words.size() - 1 < minimum || words.size() - 1 > maximum)
                 throw ScriptError("usage: " + std::string(usage));
@@ -127,7 +132,7 @@ public:
             arguments(1, 1, "render OUTPUT");
             Render(words[1]);
         } else {
-            throw ScriptError("unknown verb \"" + verb + "\" (verbs: " + std::string(kVerbs) + ")");
+            throw ScriptError("unknown verb " + QuoteExcerpt(verb) + " (verbs: " + std::string(kVerbs) + ")");
         }
     }
 
@@ -147,7 +152,7 @@ private:
     void SelectTool(const std::string& name) {
         const RasterTools::FilterInfo* info = RasterTools::FindFilter(name);
         auto tool = info ? m_Controller->FindTool(info->toolID) : nullptr;
-        if (!tool) throw ScriptError("unknown tool \"" + name + "\" (tools: " + ToolNames() + ")");
+        if (!tool) throw ScriptError("unknown tool " + QuoteExcerpt(name) + " (tools: " + ToolNames() + ")");
         m_Filter = info;
         m_PreviousTool = m_Controller->SetActiveTool(tool);
         m_Tool = tool;
@@ -173,13 +178,14 @@ private:
         std::string known;
         for (auto& property : RequireTool()->EnumerateReflecteds())
             known += (known.empty() ? "" : ", ") + Kernel::FourCCToString(property->GetIdentifier());
-        throw ScriptError("the tool has no property \"" + id + "\" (properties: " + known + ")");
+        throw ScriptError("the tool has no property " + QuoteExcerpt(id) + " (properties: " + known + ")");
     }
 
     void SetReflected(const std::string& id, const std::string& value) {
         auto property = FindReflected(id);
         if (!property->SetValueText(value))
-            throw ScriptError("\"" + value + "\" is not a valid " + property->GetTypeName() + " for " + id);
+            throw ScriptError(QuoteExcerpt(value) + " is not a valid " + property->GetTypeName() + " for " +
+                              id);
         m_Out << "  " << id << "=" << property->GetValueText() << '\n';
         // A panel edit is followed by a fresh preview, as after any change.
         m_Tool->Preview(false);
@@ -193,7 +199,7 @@ private:
 
     void AddLive(const std::vector<std::string>& words) {
         const RasterTools::FilterInfo* info = RasterTools::FindFilter(words[1]);
-        if (!info) throw ScriptError("unknown filter \"" + words[1] + "\"");
+        if (!info) throw ScriptError("unknown filter " + QuoteExcerpt(words[1]));
         std::vector<RasterTools::ParameterValue> values;
         for (const auto& spec : info->parameters)
             values.push_back(spec.defaultValue);
@@ -204,10 +210,14 @@ private:
             while (index < info->parameters.size() && info->parameters[index].name != name)
                 ++index;
             if (equals == std::string::npos || index == info->parameters.size())
-                throw ScriptError("\"" + words[i] + "\" is not PARAM=VALUE for a parameter of " + words[1]);
+                throw ScriptError(QuoteExcerpt(words[i]) + " is not PARAM=VALUE for a parameter of " +
+                                  words[1]);
             auto value =
                 RasterTools::ParseParameterValue(info->parameters[index].type, words[i].substr(equals + 1));
-            if (!value) throw ScriptError("\"" + words[i] + "\" has a value that does not parse");
+            if (!value) throw ScriptError(QuoteExcerpt(words[i]) + " has a value that does not parse");
+            const auto& spec = info->parameters[index];
+            if (!RasterTools::IsAcceptedValue(spec, *value))
+                throw ScriptError(name + " " + RasterTools::DescribeAcceptedValues(spec));
             values[index] = *value;
         }
         auto command = info->makeCommand(true, values);
@@ -229,7 +239,9 @@ private:
 
     void Render(const std::string& output) {
         const auto type = IO::GetFileTypeForExtension(output);
-        if (!type) throw ScriptError(output + ": unknown file type (use .png, .jpg, .jpeg, .tif or .tiff)");
+        if (!type)
+            throw ScriptError(QuoteExcerpt(output) +
+                              ": unknown file type (use .png, .jpg, .jpeg, .tif or .tiff)");
         const auto& document = *m_Controller->GetDocument();
         FlattenOptions options;
         for (const auto& node : document.GetLayers())
@@ -292,11 +304,12 @@ private:
                 m_Out << '\n';
             }
         } else {
-            throw ScriptError("cannot show \"" + what + "\" (show " + std::string(kShows) + ")");
+            throw ScriptError("cannot show " + QuoteExcerpt(what) + " (show " + std::string(kShows) + ")");
         }
     }
 
     std::ostream& m_Out;
+    bool m_FilesAllowed;
     Kernel::Counted<DocumentController> m_Controller;
     Kernel::Counted<Tool> m_Tool;
     Kernel::Counted<Tool> m_PreviousTool;
@@ -313,6 +326,25 @@ std::vector<std::string> SplitWords(const std::string& line) {
 
 } // namespace
 
+void PlayScript(std::istream& in, std::ostream& out, const std::string& name, bool filesAllowed) {
+    PlaySession session(out, filesAllowed);
+    std::string line;
+    for (int number = 1; std::getline(in, line); ++number) {
+        const auto words = SplitWords(line);
+        if (words.empty()) continue;
+        // The echo is a transcript, not the script: control bytes are shown escaped.
+        const std::string shown = line.substr(0, line.find('#'));
+        out << "> " << EscapeBytes(shown) << '\n';
+        try {
+            session.Execute(words);
+        } catch (const ScriptError& error) {
+            out.flush();
+            throw Error(name + ":" + std::to_string(number) + ": " + error.what());
+        }
+    }
+    if (in.bad()) throw Error(name + ": cannot read the script");
+}
+
 int RunPlay(const std::vector<std::string>& args) {
     if (args.size() != 1) throw UsageError("usage: rastertools play SCRIPT (\"-\" reads standard input)");
     const std::string& name = args[0];
@@ -321,22 +353,7 @@ int RunPlay(const std::vector<std::string>& args) {
         file.open(name);
         if (!file) throw Error(name + ": cannot open the script");
     }
-    std::istream& in = name == "-" ? std::cin : file;
-
-    PlaySession session(std::cout);
-    std::string line;
-    for (int number = 1; std::getline(in, line); ++number) {
-        const auto words = SplitWords(line);
-        if (words.empty()) continue;
-        std::cout << "> " << line.substr(0, line.find('#')) << '\n';
-        try {
-            session.Execute(words);
-        } catch (const ScriptError& error) {
-            std::cout.flush();
-            throw Error(name + ":" + std::to_string(number) + ": " + error.what());
-        }
-    }
-    if (in.bad()) throw Error(name + ": cannot read the script");
+    PlayScript(name == "-" ? std::cin : file, std::cout, name, true);
     return 0;
 }
 

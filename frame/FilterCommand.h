@@ -18,7 +18,9 @@ public:
 
     FilterCommand(bool liveEffect, const Params& params)
         : RasterDevicePreviewableFilterLayerCommand(liveEffect)
-        , m_Params(params) {}
+        , m_Params(params) {
+        BoundParameters(m_Params, Filter::kParameters);
+    }
 
     const Params& GetParameters() const noexcept { return m_Params; }
 
@@ -64,6 +66,8 @@ public:
 
     bool Load(const Kernel::InSerialiser& in, Kernel::FileStore& store, unsigned short version) override {
         LoadParameters(in, m_Params, Filter::kParameters);
+        // A document may hold any value; the renderers only ever see bounded ones.
+        BoundParameters(m_Params, Filter::kParameters);
         return RasterDevicePreviewableFilterLayerCommand::Load(in, store, version);
     }
 

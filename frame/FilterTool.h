@@ -94,6 +94,7 @@ public:
 
     void Commit() override {
         EffectTool::Commit();
+        BoundParameters(m_Params, Filter::kParameters);
         WriteSettings(m_Params, Filter::kName, Filter::kParameters);
         EnqueueCommand(MakeCommand(), false);
     }
@@ -129,7 +130,10 @@ protected:
         return Kernel::Counted<Command>(new CommandClass(GetEditingLiveEffect(), m_Params));
     }
 
+    // Every change of the fields (drags, clicks, a live filter's values) ends here: the fields are brought
+    // within bounds before anyone sees them.
     void PostParametersChanged() {
+        BoundParameters(m_Params, Filter::kParameters);
         Notify(Kernel::Counted<Kernel::Notification>(
             new ToolParametersChangedNotification(GetUnsafeDocumentController(), GetToolID())));
     }

@@ -9,6 +9,7 @@
 
 #include <array>
 #include <bit>
+#include <limits>
 #include <optional>
 #include <span>
 #include <string>
@@ -38,16 +39,36 @@ struct ParameterSpec {
     Kernel::FourCC reflected;      // reflected identifier, e.g. "inte"
     std::string_view toolLabel;    // label on the tool's panel
     std::string_view commandLabel; // label on the live filter layer's panel
-    double minimum = 0.0;          // display range of numbers
-    double maximum = 0.0;
+    double minimum = 0.0;          // display range of numbers, and the lowest value accepted
+    double maximum = 0.0;          // the highest value accepted too, unless hardMaximum is larger
     ParameterValue defaultValue{}; // value when the settings store has none, and after Reset
     std::string_view image{};      // tool panel icon, if any
     Kernel::UnitKind unit = Kernel::UnitKind::None;
     bool persisted = true;           // kept under "tools.<filter>.<name>"
     std::string_view settingsName{}; // the settings-key leaf when it differs from name
     std::string_view labelContext{}; // the labels' localisation context; empty: "Reflected property"
-    bool openMaximum = false;        // maximum ends the panel's range only; larger values are accepted
+    // Where the display range's maximum ends the panel only: larger values are accepted up to this one, which
+    // keeps the work and the arithmetic of a render bounded.
+    double hardMaximum = -std::numeric_limits<double>::infinity();
 };
+
+// The lowest and highest numbers (a point's coordinates) a parameter accepts from any route: panels, drags,
+// settings, loaded commands and the command line.
+double LowestValue(const ParameterSpec& spec);
+double HighestValue(const ParameterSpec& spec);
+// Whether value lies within the accepted values (booleans always do; a point's coordinates each).
+bool IsAcceptedValue(const ParameterSpec& spec, const ParameterValue& value);
+// "must lie within 0 .. 100" and the like, for messages about a value that is not accepted.
+std::string DescribeAcceptedValues(const ParameterSpec& spec);
+// value brought within the accepted values: numbers clamped, a NaN number replaced by the default; a point
+// with a NaN coordinate is the default unset point when the default is one, else the default.
+ParameterValue BoundParameterValue(const ParameterSpec& spec, const ParameterValue& value);
+double BoundNumber(const ParameterSpec& spec, double value);
+int BoundNumber(const ParameterSpec& spec, int value);
+inline bool BoundNumber(const ParameterSpec&, bool value) {
+    return value;
+}
+Kernel::PointT<double> BoundNumber(const ParameterSpec& spec, Kernel::PointT<double> value);
 
 std::string SettingsKey(std::string_view filterName, const ParameterSpec& spec);
 
@@ -145,6 +166,14 @@ void LoadParameters(const Kernel::InSerialiser& in, Params& params,
             },
             parameter.field);
     }
+}
+
+// Brings every parameter within its accepted values; every route by which values reach a command ends here.
+template <class Params, std::size_t N>
+void BoundParameters(Params& params, const std::array<Parameter<Params>, N>& table) {
+    for (const auto& parameter : table)
+        std::visit([&](auto member) { params.*member = BoundNumber(parameter.spec, params.*member); },
+                   parameter.field);
 }
 
 #if defined(__GNUC__) && !defined(__clang__)

@@ -25,6 +25,8 @@ void ReadSettings(Params& params, std::string_view filterName,
                     value = store.GetIntForKey(key, fallback);
                 else
                     value = fallback; // points are placed by the tool, not remembered
+                // The store is a file anyone may edit: its values are taken only within bounds.
+                value = BoundNumber(spec, value);
             },
             parameter.field);
     }
@@ -65,7 +67,6 @@ Kernel::ReflectedList ReflectParameters(Kernel::Counted<Kernel::Countable> owner
         Kernel::AttributeList attributes;
         if (panel == Panel::Tool && !spec.image.empty())
             attributes.emplace_back(new Kernel::ImageAttribute(std::string(spec.image)));
-        if (spec.openMaximum) attributes.emplace_back(new Kernel::NoHardLimitAttribute());
         if (spec.unit != Kernel::UnitKind::None)
             attributes.emplace_back(new Kernel::ValueTypeAttribute(spec.unit));
         std::visit(
@@ -73,7 +74,9 @@ Kernel::ReflectedList ReflectParameters(Kernel::Counted<Kernel::Countable> owner
                 using T = std::remove_cvref_t<decltype(params->*member)>;
                 // The getter and setter keep the owner alive for as long as a panel holds the property.
                 auto get = [owner, params, member] { return params->*member; };
-                auto set = [owner, params, member](T value) { params->*member = value; };
+                auto set = [owner, params, member, &spec](T value) {
+                    params->*member = BoundNumber(spec, value);
+                };
                 if constexpr (std::is_same_v<T, double>)
                     list.emplace_back(new Kernel::ReflectedUnitRangeBinding(spec.reflected, std::move(label),
                                                                             spec.minimum, spec.maximum, get,

@@ -44,8 +44,7 @@ struct MotionBlurFilter {
           .commandLabel = "Radius",
           .minimum = 0.0,
           .maximum = 500.0,
-          .defaultValue = 0.0,
-          .unit = Kernel::UnitKind::Pixels},
+          .defaultValue = 0.0},
          &Params::radius},
         {{.name = "radians",
           .type = ParameterType::Double,
@@ -55,8 +54,7 @@ struct MotionBlurFilter {
           .commandLabel = "Angle",
           .minimum = 0.0,
           .maximum = 6.2832, // a whole turn, rounded up for display
-          .defaultValue = 0.0,
-          .unit = Kernel::UnitKind::Radians},
+          .defaultValue = 0.0},
          &Params::radians},
     }};
 };

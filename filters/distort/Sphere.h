@@ -59,7 +59,7 @@ struct SphereFilter {
           .defaultValue = 128.0,
           .unit = Kernel::UnitKind::Pixels,
           .persisted = false,
-          .openMaximum = true},
+          .hardMaximum = RadiusLimit},
          &Params::radius},
         {{.name = "centre",
           .type = ParameterType::Point,

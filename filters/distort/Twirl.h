@@ -17,6 +17,9 @@ inline constexpr Kernel::PointT<double> UnsetCentre{std::numeric_limits<double>:
                                                     std::numeric_limits<double>::quiet_NaN()};
 // How far from the origin a centre may be typed.
 inline constexpr double CentreLimit = 1e6;
+// The largest radius accepted: wider than any layer from any centre within reach, and small enough that the
+// mappings' squares stay far from the single-precision range (1e12 against 3.4e38).
+inline constexpr double RadiusLimit = 1e6;
 
 struct TwirlParameters {
     double angle = 0.0;                          // degrees of turn at the centre, falling to 0 at the radius
@@ -66,7 +69,7 @@ struct TwirlFilter {
           .maximum = 1024.0,
           .defaultValue = 128.0,
           .unit = Kernel::UnitKind::Pixels,
-          .openMaximum = true},
+          .hardMaximum = RadiusLimit},
          &Params::radius},
         {{.name = "centre",
           .type = ParameterType::Point,

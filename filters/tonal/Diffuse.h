@@ -23,6 +23,9 @@ struct DiffuseFilter {
     static constexpr std::string_view kHint = "|DRAG| to set diffusion. |CLICK| to reset.";
     static constexpr ToolID kToolID = ToolID::Diffuse;
     static constexpr double kDragScale = 1.0 / 512.0;
+    // A scatter of up to 32768 pixels, wider than any layer: a drag may go past the panel's range, but the
+    // offsets stay well inside single precision.
+    static constexpr double kIntensityLimit = 64.0;
 
     static constexpr std::array<Parameter<Params>, 1> kParameters{{
         {{.name = "intensity",
@@ -33,7 +36,8 @@ struct DiffuseFilter {
           .commandLabel = "Intensity",
           .minimum = 0.0,
           .maximum = 1.0,
-          .defaultValue = 0.0},
+          .defaultValue = 0.0,
+          .hardMaximum = kIntensityLimit},
          &Params::intensity},
     }};
 };

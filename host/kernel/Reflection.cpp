@@ -57,8 +57,6 @@ std::string_view UnitKindName(UnitKind kind) {
         return "pixels";
     case UnitKind::Degrees:
         return "degrees";
-    case UnitKind::Radians:
-        return "radians";
     case UnitKind::Percent:
         return "percent";
     }

@@ -90,8 +90,9 @@ private:
     std::string m_Name;
 };
 
-// How a unit-range value is shown: which physical unit it carries.
-enum class UnitKind { None, Pixels, Degrees, Radians, Percent };
+// How a unit-range value is shown: which physical unit it carries. The numbers are the host's unit
+// categories.
+enum class UnitKind { None = 0, Percent = 1, Degrees = 2, Pixels = 5 };
 std::string_view UnitKindName(UnitKind kind);
 
 class ValueTypeAttribute : public ReflectedAttribute {

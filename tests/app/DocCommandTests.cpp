@@ -72,7 +72,7 @@ TEST_F(DocCommand, NewFilterRenderShowAndUndoEndToEnd) {
     ASSERT_EQ(Run("apply " + kFilter + " once.png twice.png --device cpu").exitCode, 0);
     result = Run("doc filter d.rtd " + kFilter + " --live");
     ASSERT_EQ(result.exitCode, 0) << result.output;
-    result = Run("doc render d.rtd live.png --tile 3 --threads 2");
+    result = Run("doc render d.rtd live.png --tile 16 --threads 2");
     ASSERT_EQ(result.exitCode, 0) << result.output;
     EXPECT_TRUE(Contains(result.output, "live.png: 8x6 rgba8 from 2 layers")) << result.output;
     EXPECT_EQ(Pixels(m_Folder / "live.png"), Pixels(m_Folder / "twice.png"));
@@ -131,7 +131,7 @@ TEST_F(DocCommand, ErrorsAreClearAndLeaveTheDocumentAlone) {
         {"doc filter d.rtd", 2, "usage: rastertools doc filter DOC FILTER"},
         {"doc render d.rtd out.bmp", 2, "out.bmp: unknown file type"},
         {"doc render d.rtd out.png --device nonesuch", 2, "nonesuch"},
-        {"doc render d.rtd out.png --tile 0", 2, "--tile needs a whole number of at least 1"},
+        {"doc render d.rtd out.png --tile 0", 2, "--tile needs a whole number from 16 to 65536"},
         {"doc show d.rtd --live", 2, "--live belongs to doc filter"},
         {"doc frob d.rtd", 2, "unknown doc subcommand \"frob\""},
         {"doc new in.png", 2, "doc new needs the document to write: -o DOC"},
@@ -194,7 +194,7 @@ TEST_F(DocCommand, SavedNoiseRendersAsApplyingItDoes) {
     EXPECT_TRUE(Contains(result.output, "live filter \"Add Noise\": addnoise intensity=0.5 mono=false "
                                         "gaussian=false"))
         << result.output;
-    ASSERT_EQ(Run("doc render live.rtd live.png --tile 3 --threads 2").exitCode, 0);
+    ASSERT_EQ(Run("doc render live.rtd live.png --tile 16 --threads 2").exitCode, 0);
     EXPECT_EQ(Pixels(m_Folder / "live.png"), Pixels(m_Folder / "direct.png"));
 
     ASSERT_EQ(Run("doc new in.png -o destructive.rtd").exitCode, 0);

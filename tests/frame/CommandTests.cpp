@@ -83,9 +83,11 @@ TEST(CommandSerialisation, EveryFilterRoundTripsThroughTheClassRegistry) {
             case ParameterType::Int:
                 values.emplace_back(std::get<int>(spec.defaultValue) + 3);
                 break;
-            case ParameterType::Point:
-                values.emplace_back(Kernel::PointT<double>{12.5, -3.25});
+            case ParameterType::Point: {
+                const double low = LowestValue(spec), span = HighestValue(spec) - low;
+                values.emplace_back(Kernel::PointT<double>{low + 0.375 * span, low + 0.625 * span});
                 break;
+            }
             }
         }
         for (bool live : {false, true}) {

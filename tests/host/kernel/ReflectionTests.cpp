@@ -45,12 +45,16 @@ struct BoundRange {
 
 } // namespace
 
-TEST(Reflection, UnitKindNames) {
+TEST(Reflection, UnitKindsAreTheHostsCategories) {
     EXPECT_EQ(UnitKindName(UnitKind::None), "none");
     EXPECT_EQ(UnitKindName(UnitKind::Pixels), "pixels");
     EXPECT_EQ(UnitKindName(UnitKind::Degrees), "degrees");
-    EXPECT_EQ(UnitKindName(UnitKind::Radians), "radians");
     EXPECT_EQ(UnitKindName(UnitKind::Percent), "percent");
+    // The numbers are part of the contract: a host reads them, not the names.
+    EXPECT_EQ(int(UnitKind::None), 0);
+    EXPECT_EQ(int(UnitKind::Percent), 1);
+    EXPECT_EQ(int(UnitKind::Degrees), 2);
+    EXPECT_EQ(int(UnitKind::Pixels), 5);
 }
 
 TEST(Reflection, Attributes) {
