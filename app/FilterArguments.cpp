@@ -95,8 +95,9 @@ ParseFilterParameters(const RasterTools::FilterInfo& filter,
             std::string known;
             for (const auto& spec : filter.parameters)
                 known += (known.empty() ? "--" : ", --") + std::string(spec.name);
-            throw UsageError(std::string(filter.name) + " has no parameter " + QuoteExcerpt("--" + name) +
-                             " (it takes " + (known.empty() ? std::string("none") : known) + ")");
+            throw UsageError(std::string(filter.name) + " has no parameter --" +
+                             EscapeBytes(std::string_view(name).substr(0, 40)) + " (it takes " +
+                             (known.empty() ? std::string("none") : known) + ")");
         }
         // Which of two values was meant cannot be guessed.
         if (given[index]) throw UsageError("--" + name + " is given more than once");

@@ -31,9 +31,16 @@ public:
         : Error(std::move(message), kExitUsage) {}
 };
 
-// Runs a play script read from in, writing what the host sees to out; name labels the errors. Without
-// filesAllowed the verbs that read or write files (save, load, render) are refused.
-void PlayScript(std::istream& in, std::ostream& out, const std::string& name, bool filesAllowed);
+// How a play script runs: whether the verbs that read or write files (save, load, render) are allowed, and
+// the size of the document's background layer.
+struct PlayOptions {
+    bool filesAllowed = true;
+    int width = 1024;
+    int height = 768;
+};
+// Runs a play script read from in, writing what the host sees to out; name labels the errors.
+void PlayScript(std::istream& in, std::ostream& out, const std::string& name,
+                const PlayOptions& options = {});
 
 int RunList(const std::vector<std::string>& args);
 int RunPlay(const std::vector<std::string>& args);

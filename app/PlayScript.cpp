@@ -47,13 +47,12 @@ int ParseIndex(const std::string& text, int limit, const char* what) {
 
 class PlaySession {
 public:
-    PlaySession(std::ostream& out, bool filesAllowed)
+    PlaySession(std::ostream& out, const PlayOptions& options)
         : m_Out(out)
-        , m_FilesAllowed(filesAllowed) {
+        , m_FilesAllowed(options.filesAllowed) {
         auto document = Kernel::MakeCounted<Document>();
-        const DocumentDefaults defaults;
         document->InsertLayer(
-            0, Kernel::Counted<Node>(new RasterNode("Background", defaults.width, defaults.height)));
+            0, Kernel::Counted<Node>(new RasterNode("Background", options.width, options.height)));
         document->SetSelection({document->GetLayer(0)});
         m_Controller = Kernel::MakeCounted<DocumentController>(document);
         m_Controller->SetObserver([this](const std::string& event) { m_Out << "  " << event << '\n'; });
@@ -240,7 +239,7 @@ private:
     void Render(const std::string& output) {
         const auto type = IO::GetFileTypeForExtension(output);
         if (!type)
-            throw ScriptError(QuoteExcerpt(output) +
+            throw ScriptError(EscapeBytes(output) +
                               ": unknown file type (use .png, .jpg, .jpeg, .tif or .tiff)");
         const auto& document = *m_Controller->GetDocument();
         FlattenOptions options;
@@ -326,8 +325,8 @@ std::vector<std::string> SplitWords(const std::string& line) {
 
 } // namespace
 
-void PlayScript(std::istream& in, std::ostream& out, const std::string& name, bool filesAllowed) {
-    PlaySession session(out, filesAllowed);
+void PlayScript(std::istream& in, std::ostream& out, const std::string& name, const PlayOptions& options) {
+    PlaySession session(out, options);
     std::string line;
     for (int number = 1; std::getline(in, line); ++number) {
         const auto words = SplitWords(line);
@@ -353,7 +352,7 @@ int RunPlay(const std::vector<std::string>& args) {
         file.open(name);
         if (!file) throw Error(name + ": cannot open the script");
     }
-    PlayScript(name == "-" ? std::cin : file, std::cout, name, true);
+    PlayScript(name == "-" ? std::cin : file, std::cout, name);
     return 0;
 }
 

@@ -1,5 +1,6 @@
-// Feeds arbitrary bytes to the play interpreter as a script, with the verbs that touch files refused. Every
-// input must end in success or in a reported error whose message quotes no raw control bytes.
+// Feeds arbitrary bytes to the play interpreter as a script, on a small document and with the verbs that
+// touch files refused. Every input must end in success or in a reported error whose message quotes no raw
+// control bytes.
 
 #include "app/Options.h"
 #include "filters/Catalogue.h"
@@ -23,7 +24,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     std::istringstream script(std::string(reinterpret_cast<const char*>(data), size));
     std::ostringstream transcript;
     try {
-        App::PlayScript(script, transcript, "fuzz", false);
+        App::PlayScript(script, transcript, "fuzz", {.filesAllowed = false, .width = 24, .height = 16});
     } catch (const App::Error& error) {
         const std::string message = error.what();
         for (const char c : message)

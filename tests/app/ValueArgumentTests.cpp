@@ -181,10 +181,11 @@ TEST_F(Values, ExtremeAcceptedValuesRenderSanePixels) {
         const auto output = ReadPixels(m_Folder / "out.png");
         ASSERT_TRUE(output);
         EXPECT_EQ(LargestAlpha(*output), 255) << test.arguments;
-        if (test.tolerance >= 0)
+        if (test.tolerance >= 0) {
             EXPECT_LE(LargestDifference(*output, std::string(test.image) == "flat.png" ? *flat : *input),
                       test.tolerance)
                 << test.arguments;
+        }
     }
     for (const char* scale : {"8", "0.125"}) {
         ASSERT_EQ(Run(std::string("apply copy --scale ") + scale + " in.png out.png").exitCode, 0);

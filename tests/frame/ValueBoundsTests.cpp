@@ -70,8 +70,12 @@ TEST(ValueBounds, LoadedCommandsHoldOnlyAcceptedValues) {
                     ASSERT_EQ(values.size(), info.parameters.size());
                     EXPECT_TRUE(IsAcceptedValue(spec, values[index]))
                         << hostile << " loaded as " << FormatParameterValue(values[index]);
-                    if (std::isnan(hostile)) EXPECT_EQ(values[index], spec.defaultValue);
-                    if (hostile == 1e300) EXPECT_EQ(values[index], ParameterValue(HighestValue(spec)));
+                    if (std::isnan(hostile)) {
+                        EXPECT_EQ(values[index], spec.defaultValue);
+                    }
+                    if (hostile == 1e300) {
+                        EXPECT_EQ(values[index], ParameterValue(HighestValue(spec)));
+                    }
                 }
                 break;
             case ParameterType::Int:
