@@ -51,7 +51,7 @@ std::optional<ParameterValue> ParseParameterValue(ParameterType type, std::strin
 }
 
 double LowestValue(const ParameterSpec& spec) {
-    return spec.minimum;
+    return std::min(spec.minimum, spec.hardMinimum);
 }
 
 double HighestValue(const ParameterSpec& spec) {

@@ -47,9 +47,10 @@ struct ParameterSpec {
     bool persisted = true;           // kept under "tools.<filter>.<name>"
     std::string_view settingsName{}; // the settings-key leaf when it differs from name
     std::string_view labelContext{}; // the labels' localisation context; empty: "Reflected property"
-    // Where the display range's maximum ends the panel only: larger values are accepted up to this one, which
-    // keeps the work and the arithmetic of a render bounded.
+    // Where the display range ends the panel only: values beyond it are accepted down to hardMinimum and up
+    // to hardMaximum, which keep the work and the arithmetic of a render bounded.
     double hardMaximum = -std::numeric_limits<double>::infinity();
+    double hardMinimum = std::numeric_limits<double>::infinity();
 };
 
 // The lowest and highest numbers (a point's coordinates) a parameter accepts from any route: panels, drags,

@@ -54,7 +54,10 @@ struct MotionBlurFilter {
           .commandLabel = "Angle",
           .minimum = 0.0,
           .maximum = 6.2832, // a whole turn, rounded up for display
-          .defaultValue = 0.0},
+          .defaultValue = 0.0,
+          // Any direction, however written; far beyond these a double no longer tells one from the next.
+          .hardMaximum = 1e6,
+          .hardMinimum = -1e6},
          &Params::radians},
     }};
 };
