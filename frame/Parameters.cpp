@@ -80,10 +80,6 @@ Kernel::PointT<double> BoundNumber(const ParameterSpec& spec, Kernel::PointT<dou
             std::clamp(value.y, LowestValue(spec), HighestValue(spec))};
 }
 
-ParameterValue BoundParameterValue(const ParameterSpec& spec, const ParameterValue& value) {
-    return std::visit([&](const auto& v) { return ParameterValue(BoundNumber(spec, v)); }, value);
-}
-
 bool IsAcceptedValue(const ParameterSpec& spec, const ParameterValue& value) {
     const auto within = [&](double v) { return v >= LowestValue(spec) && v <= HighestValue(spec); };
     return std::visit(

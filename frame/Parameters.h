@@ -39,8 +39,8 @@ struct ParameterSpec {
     Kernel::FourCC reflected;      // reflected identifier, e.g. "inte"
     std::string_view toolLabel;    // label on the tool's panel
     std::string_view commandLabel; // label on the live filter layer's panel
-    double minimum = 0.0;          // display range of numbers, and the lowest value accepted
-    double maximum = 0.0;          // the highest value accepted too, unless hardMaximum is larger
+    double minimum = 0.0;          // display range of numbers, and the values accepted (but see hardMaximum)
+    double maximum = 0.0;
     ParameterValue defaultValue{}; // value when the settings store has none, and after Reset
     std::string_view image{};      // tool panel icon, if any
     Kernel::UnitKind unit = Kernel::UnitKind::None;
@@ -62,8 +62,7 @@ bool IsAcceptedValue(const ParameterSpec& spec, const ParameterValue& value);
 // "must lie within 0 .. 100" and the like, for messages about a value that is not accepted.
 std::string DescribeAcceptedValues(const ParameterSpec& spec);
 // value brought within the accepted values: numbers clamped, a NaN number replaced by the default; a point
-// with a NaN coordinate is the default unset point when the default is one, else the default.
-ParameterValue BoundParameterValue(const ParameterSpec& spec, const ParameterValue& value);
+// with a NaN coordinate is the default (which may be the unset point).
 double BoundNumber(const ParameterSpec& spec, double value);
 int BoundNumber(const ParameterSpec& spec, int value);
 inline bool BoundNumber(const ParameterSpec&, bool value) {
