@@ -142,9 +142,15 @@ ReadResult ReadImage(const std::filesystem::path& path, std::optional<PixelForma
     std::string name;
     try {
         name = path.string();
+        // Judged before opening: a folder has no bytes to read, and a device or pipe may never end.
         std::error_code ignored;
-        if (std::filesystem::is_directory(path, ignored)) {
-            result.error = Detail::Describe(name, "is a folder, not an image file");
+        const std::filesystem::file_status status = std::filesystem::status(path, ignored);
+        if (std::filesystem::is_directory(status)) {
+            result.error = Detail::Describe(name, "is a folder, not a file");
+            return result;
+        }
+        if (std::filesystem::exists(status) && !std::filesystem::is_regular_file(status)) {
+            result.error = Detail::Describe(name, "is not a regular file");
             return result;
         }
         std::string contents;

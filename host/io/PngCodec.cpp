@@ -9,6 +9,7 @@
 #include <csetjmp>
 #include <cstdio>
 #include <cstring>
+#include <new>
 #include <utility>
 
 namespace IO::Detail {
@@ -47,6 +48,23 @@ void WritePngData(png_structp png, png_bytep data, std::size_t length) {
 }
 
 void FlushPngData(png_structp) {}
+
+// No block libpng needs for reading exceeds this: rows are at most 65536 × 8 bytes and the ancillary chunks
+// it still buffers are capped below. Refusing larger requests turns a hostile length field into a plain
+// error.
+constexpr std::size_t MaxLibraryBlock = std::size_t(64) << 20;
+// Ancillary chunks are not used, so libpng never needs to hold one longer than this.
+constexpr std::size_t MaxChunkBytes = std::size_t(8) << 20;
+constexpr png_uint_32 MaxCachedChunks = 1000;
+
+png_voidp AllocatePng(png_structp, png_alloc_size_t size) {
+    if (size > MaxLibraryBlock) return nullptr;
+    return ::operator new(size, std::nothrow);
+}
+
+void FreePng(png_structp, png_voidp block) {
+    ::operator delete(block);
+}
 
 template <class Result>
 Result Failed(Result result, std::string_view name, std::string_view reason) {
@@ -154,14 +172,21 @@ ReadResult DecodePng(std::span<const std::byte> data, std::string_view name,
     };
 
     PngReadGuard guard;
-    guard.png = png_create_read_struct(PNG_LIBPNG_VER_STRING, &context, OnPngError, OnPngWarning);
+    guard.png = png_create_read_struct_2(PNG_LIBPNG_VER_STRING, &context, OnPngError, OnPngWarning, nullptr,
+                                         AllocatePng, FreePng);
     if (!guard.png) return Failed(std::move(result), name, "out of memory");
     guard.info = png_create_info_struct(guard.png);
     if (!guard.info) return Failed(std::move(result), name, "out of memory");
     png_set_read_fn(guard.png, &context, ReadPngData);
     // Sizes are judged below against the host's own limit, with its own message; libpng only needs to let
-    // them through. Ancillary chunks keep libpng's default per-chunk memory cap.
+    // them through.
     png_set_user_limits(guard.png, 0x7FFFFFFF, 0x7FFFFFFF);
+    // libpng only warns about an ancillary chunk longer than its cap and then allocates the claimed length
+    // anyway (2 GiB for a 44-byte file). Text, profiles, EXIF and the rest are never used here, so every
+    // chunk but the ones decoding needs is skipped unread, and the caps hold for anything libpng still keeps.
+    png_set_keep_unknown_chunks(guard.png, PNG_HANDLE_CHUNK_NEVER, nullptr, -1);
+    png_set_chunk_malloc_max(guard.png, MaxChunkBytes);
+    png_set_chunk_cache_max(guard.png, MaxCachedChunks);
 
     PngHeader header;
     if (!ReadPngHeader(guard.png, guard.info, header)) return damaged();

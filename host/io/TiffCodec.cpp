@@ -1,5 +1,6 @@
 // TIFF through libtiff, from and to memory. libtiff reports errors by return values and per-file handlers, so
-// no jump is involved; the handlers only keep the first message, which names the cause.
+// no jump is involved; the handlers keep the first error, which names the cause, and the first warning that
+// means the pixels are not what the file meant: libtiff goes on after those with made-up data.
 
 #include "host/io/Codecs.h"
 
@@ -30,7 +31,19 @@ struct TiffStream {
 
 struct TiffMessages {
     char error[256] = {};
+    char damage[256] = {}; // the first warning that means damaged data
+    bool decoding = false; // set once the directory is read: from then on every warning is about the data
 };
+
+// Directory warnings are mostly about odd metadata that libtiff corrects or ignores harmlessly. Those about
+// the tables that locate the pixel data are not: libtiff then pads the tables with zeros or guesses the byte
+// counts, and the file's own header bytes become pixels.
+bool IsDamageWarning(std::string_view text) {
+    for (std::string_view sign : {"StripOffsets", "StripByteCounts", "TileOffsets", "TileByteCounts",
+                                  "[Strip|Tile]", "calculating from imagelength", "corrupt", "Corrupt"})
+        if (text.find(sign) != std::string_view::npos) return true;
+    return false;
+}
 
 tmsize_t TiffRead(thandle_t handle, void* buffer, tmsize_t size) {
     auto* stream = static_cast<TiffStream*>(handle);
@@ -88,7 +101,22 @@ int OnTiffError(TIFF*, void* user, const char*, const char* format, va_list args
     return 1;
 }
 
-int OnTiffWarning(TIFF*, void*, const char*, const char*, va_list) {
+// libtiff's renderer notes tiles that hold more bytes than a tile needs, as libtiff itself writes them; the
+// surplus is never read. Fewer bytes than needed would fail the read itself.
+bool IsSurplusTileWarning(const char* text) {
+    unsigned long expected = 0, got = 0;
+    return std::sscanf(text, "Invalid tile byte count for tile %*u. Expected %lu, got %lu", &expected,
+                       &got) == 2 &&
+           got >= expected;
+}
+
+int OnTiffWarning(TIFF*, void* user, const char*, const char* format, va_list args) {
+    auto* messages = static_cast<TiffMessages*>(user);
+    if (!messages || messages->damage[0]) return 1;
+    char text[256];
+    std::vsnprintf(text, sizeof text, format, args);
+    if ((messages->decoding && !IsSurplusTileWarning(text)) || IsDamageWarning(text))
+        std::memcpy(messages->damage, text, sizeof text);
     return 1;
 }
 
@@ -106,7 +134,7 @@ struct TiffFile {
         TIFFOpenOptions* options = TIFFOpenOptionsAlloc();
         if (!options) return false;
         TIFFOpenOptionsSetErrorHandlerExtR(options, OnTiffError, &messages);
-        TIFFOpenOptionsSetWarningHandlerExtR(options, OnTiffWarning, nullptr);
+        TIFFOpenOptionsSetWarningHandlerExtR(options, OnTiffWarning, &messages);
         // No single allocation inside libtiff needs more than a whole image may take.
         TIFFOpenOptionsSetMaxSingleMemAlloc(options, tmsize_t(Raster::DynamicBuffer::MaxStorageBytes));
         name = std::string(fileName);
@@ -115,9 +143,12 @@ struct TiffFile {
         TIFFOpenOptionsFree(options);
         return tif != nullptr;
     }
-    // libtiff's first message, without the file name that many of its messages start with.
+    // libtiff's first error (else its first damage warning), without the file name that many of its messages
+    // start with.
     std::string Reason(const char* fallback) const {
-        std::string_view text = messages.error[0] ? messages.error : fallback;
+        std::string_view text = messages.error[0]    ? messages.error
+                                : messages.damage[0] ? messages.damage
+                                                     : fallback;
         if (text.size() > name.size() + 2 && text.substr(0, name.size()) == name &&
             text.substr(name.size(), 2) == ": ")
             text.remove_prefix(name.size() + 2);
@@ -500,6 +531,70 @@ bool ReadDirect(TIFF* tif, const Layout& layout, Raster::DynamicBuffer& image, s
     return true;
 }
 
+// Every strip or tile the image needs must lie inside the file, after its header. libtiff pads short offset
+// and byte-count tables with zeros, which would read the header as pixels; it only warns about that.
+std::string CheckChunkTable(TIFF* tif, std::uint64_t fileSize) {
+    const bool tiled = TIFFIsTiled(tif) != 0;
+    const std::uint32_t count = tiled ? TIFFNumberOfTiles(tif) : TIFFNumberOfStrips(tif);
+    const char* what = tiled ? "tile" : "strip";
+    if (count == 0) return std::string("no ") + what + "s";
+    constexpr std::uint64_t headerBytes = 8;
+    for (std::uint32_t i = 0; i < count; ++i) {
+        int failed = 0;
+        const std::uint64_t offset = TIFFGetStrileOffsetWithErr(tif, i, &failed);
+        const std::uint64_t bytes = failed ? 0 : TIFFGetStrileByteCountWithErr(tif, i, &failed);
+        auto which = [&] {
+            return std::string(what) + " " + std::to_string(i + 1) + " of " + std::to_string(count);
+        };
+        if (failed || offset < headerBytes || bytes == 0)
+            return "the " + std::string(what) + " table does not cover the image: " + which() +
+                   " has no data";
+        if (offset > fileSize || bytes > fileSize - offset) return which() + " lies outside the file";
+    }
+    return {};
+}
+
+// Orientation tells where the stored first row and first column belong; 5..8 swap rows and columns.
+int OrientationOf(TIFF* tif) {
+    std::uint16_t orientation = ORIENTATION_TOPLEFT;
+    TIFFGetFieldDefaulted(tif, TIFFTAG_ORIENTATION, &orientation);
+    return orientation >= ORIENTATION_TOPLEFT && orientation <= ORIENTATION_LEFTBOT ? orientation
+                                                                                    : ORIENTATION_TOPLEFT;
+}
+
+// The stored image turned and mirrored upright. Every decoding route reads rows as stored and ends here, so
+// that all of them agree.
+Kernel::Counted<Raster::DynamicBuffer> Upright(Kernel::Counted<Raster::DynamicBuffer> stored,
+                                               int orientation) {
+    if (orientation == ORIENTATION_TOPLEFT || !stored) return stored;
+    const int width = stored->GetWidth();
+    const int height = stored->GetHeight();
+    const bool swap = orientation >= ORIENTATION_LEFTTOP;
+    const int outWidth = swap ? height : width;
+    const int outHeight = swap ? width : height;
+    auto upright = Raster::DynamicBuffer::Create(outWidth, outHeight, stored->GetFormat());
+    if (!upright) return upright;
+    const std::size_t pixel = std::size_t(stored->GetBytesPerPixel());
+    // For each upright position, the stored row and column: whether they run backwards, and whether the
+    // upright x walks the stored rows (5..8) or the stored columns (1..4).
+    const bool mirrorX = orientation == ORIENTATION_TOPRIGHT || orientation == ORIENTATION_BOTRIGHT ||
+                         orientation == ORIENTATION_RIGHTTOP || orientation == ORIENTATION_RIGHTBOT;
+    const bool mirrorY = orientation == ORIENTATION_BOTRIGHT || orientation == ORIENTATION_BOTLEFT ||
+                         orientation == ORIENTATION_RIGHTBOT || orientation == ORIENTATION_LEFTBOT;
+    for (int y = 0; y < outHeight; ++y) {
+        std::byte* to = upright->RowBytes(y);
+        const int v = mirrorY ? outHeight - 1 - y : y;
+        for (int x = 0; x < outWidth; ++x) {
+            const int u = mirrorX ? outWidth - 1 - x : x;
+            const int row = swap ? u : v;
+            const int column = swap ? v : u;
+            std::memcpy(to + std::size_t(x) * pixel, stored->RowBytes(row) + std::size_t(column) * pixel,
+                        pixel);
+        }
+    }
+    return upright;
+}
+
 // Layouts without a host format of their own (palette, YCbCr, bilevel, ...) go through libtiff's own
 // renderer, which gives 8-bit RGBA with premultiplied alpha.
 ReadResult ReadRendered(TIFF* tif, std::string_view name, const TiffFile& file) {
@@ -514,7 +609,8 @@ ReadResult ReadRendered(TIFF* tif, std::string_view name, const TiffFile& file) 
         TIFFRGBAImage* renderer;
         ~Guard() { TIFFRGBAImageEnd(renderer); }
     } guard{&renderer};
-    renderer.req_orientation = ORIENTATION_TOPLEFT;
+    // Rows as stored, like the direct route; Upright turns the result for both.
+    renderer.req_orientation = renderer.orientation;
     const std::uint32_t width = renderer.width;
     const std::uint32_t height = renderer.height;
     result.error = CheckImageSize(name, width, height, PixelFormat::RGBA8);
@@ -602,39 +698,51 @@ ReadResult DecodeTiff(std::span<const std::byte> data, std::string_view name) {
     stream.data = data.data();
     stream.size = data.size();
     TiffFile file;
-    auto damaged = [&](const char* fallback) {
+    auto damaged = [&](const std::string& reason) {
         result.image.Reset();
-        result.error = Describe(name, "truncated or damaged TIFF data (" + file.Reason(fallback) + ")");
+        result.error = Describe(name, "truncated or damaged TIFF data (" + reason + ")");
         return result;
     };
-    if (!file.Open(name, "rm", &stream)) return damaged("cannot read the header");
+    if (!file.Open(name, "rm", &stream)) return damaged(file.Reason("cannot read the header"));
 
     Layout layout;
     std::string why;
-    switch (ReadLayout(file.tif, layout, why)) {
-    case Route::Unsupported:
+    const Route route = ReadLayout(file.tif, layout, why);
+    if (route == Route::Unsupported) {
         result.error = Describe(name, "unsupported TIFF layout (" + why + ")");
         return result;
-    case Route::Rendered:
-        return ReadRendered(file.tif, name, file);
-    case Route::Direct:
-        break;
     }
-    result.error = CheckImageSize(name, layout.width, layout.height, layout.format);
+    // The claimed size is judged first: it has the clearer message when a file is both huge and short.
+    result.error = CheckImageSize(name, layout.width, layout.height,
+                                  route == Route::Direct ? layout.format : PixelFormat::RGBA8);
     if (!result.error.empty()) return result;
-    result.image = Raster::DynamicBuffer::Create(int(layout.width), int(layout.height), layout.format);
-    if (!result.image) {
-        result.error = Describe(name, "out of memory");
-        return result;
-    }
-    if (!ReadDirect(file.tif, layout, *result.image, why)) {
-        if (!why.empty()) {
-            result.image.Reset();
-            result.error = Describe(name, "unsupported TIFF layout (" + why + ")");
+    if (file.messages.damage[0]) return damaged(file.Reason(""));
+    if (std::string table = CheckChunkTable(file.tif, stream.size); !table.empty()) return damaged(table);
+    file.messages.decoding = true;
+    const int orientation = OrientationOf(file.tif);
+
+    if (route == Route::Rendered) {
+        result = ReadRendered(file.tif, name, file);
+    } else {
+        result.image = Raster::DynamicBuffer::Create(int(layout.width), int(layout.height), layout.format);
+        if (!result.image) {
+            result.error = Describe(name, "out of memory");
             return result;
         }
-        return damaged("cannot decode");
+        if (!ReadDirect(file.tif, layout, *result.image, why)) {
+            if (!why.empty()) {
+                result.image.Reset();
+                result.error = Describe(name, "unsupported TIFF layout (" + why + ")");
+                return result;
+            }
+            return damaged(file.Reason("cannot decode"));
+        }
     }
+    if (!result.image) return result;
+    // libtiff carries on after damaged data with whatever it made of it; such an image is not the file's.
+    if (file.messages.damage[0]) return damaged(file.Reason(""));
+    result.image = Upright(std::move(result.image), orientation);
+    if (!result.image) result.error = Describe(name, "out of memory");
     return result;
 }
 

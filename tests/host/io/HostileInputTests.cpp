@@ -5,9 +5,14 @@
 
 #include <gtest/gtest.h>
 
+#include <tiffio.h>
+
 #include <csignal>
 #include <fstream>
 #include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 using namespace IOTest;
 using Raster::PixelFormat;
@@ -120,6 +125,52 @@ std::vector<std::byte> TiffClaiming(std::uint32_t width, std::uint32_t height, s
     return bytes;
 }
 
+// Where the directory entry of tag lies in a little-endian classic TIFF, or 0.
+std::size_t FindTiffEntry(const std::vector<std::byte>& bytes, std::uint16_t tag) {
+    auto u16 = [&](std::size_t at) { return std::uint32_t(bytes[at]) | std::uint32_t(bytes[at + 1]) << 8; };
+    const std::size_t directory = u16(4) | std::size_t(u16(6)) << 16;
+    for (std::size_t i = 0; i < u16(directory); ++i)
+        if (u16(directory + 2 + i * 12) == tag) return directory + 2 + i * 12;
+    return 0;
+}
+
+void Put32(std::vector<std::byte>& bytes, std::size_t at, std::uint32_t value) {
+    for (int i = 0; i < 4; ++i)
+        bytes[at + std::size_t(i)] = std::byte(value >> (8 * i));
+}
+
+std::vector<std::byte> AsBytes(const std::vector<std::uint8_t>& in) {
+    std::vector<std::byte> bytes(in.size());
+    if (!in.empty()) std::memcpy(bytes.data(), in.data(), in.size());
+    return bytes;
+}
+
+// The process's peak virtual size in KiB, from /proc: it counts every block ever mapped, touched or not.
+long PeakVirtualKiB() {
+    std::ifstream status("/proc/self/status");
+    std::string line;
+    while (std::getline(status, line))
+        if (line.rfind("VmPeak:", 0) == 0) return std::stol(line.substr(7));
+    return -1;
+}
+
+// Runs work in a child process, whose peak virtual size starts at its current size, and gives how much the
+// peak grew (KiB), or -1 when the child failed. No allocation escapes this, however the library makes it.
+long PeakGrowthKiB(const std::function<bool()>& work) {
+    const pid_t child = fork();
+    if (child == 0) {
+        const long before = PeakVirtualKiB();
+        const bool ok = work();
+        const long grown = PeakVirtualKiB() - before;
+        // Exit codes carry whole MiB, capped; 255 means the work itself failed.
+        _exit(!ok || before < 0 ? 255 : int(std::min<long>(grown >> 10, 254)));
+    }
+    int status = 0;
+    if (child < 0 || waitpid(child, &status, 0) != child || !WIFEXITED(status) || WEXITSTATUS(status) == 255)
+        return -1;
+    return long(WEXITSTATUS(status)) << 10;
+}
+
 std::vector<std::byte> Cut(const std::vector<std::byte>& bytes, std::size_t length) {
     return {bytes.begin(), bytes.begin() + std::ptrdiff_t(std::min(length, bytes.size()))};
 }
@@ -219,6 +270,76 @@ TEST(HostileInput, DamagedJpegAndTiffBytesNeverBreakTheReader) {
     }
 }
 
+TEST(HostileInput, TiffChunkTablesMustCoverTheImage) {
+    std::vector<std::uint8_t> data(4 * 6);
+    for (std::size_t i = 0; i < data.size(); ++i)
+        data[i] = std::uint8_t(100 + i);
+    const auto whole = TiffClaiming(4, 6, 1, data, 8, 2); // three strips of two rows
+    ASSERT_TRUE(IO::DecodeImage(whole, "whole.tif"));
+    auto tiled = [] {
+        TiffSpec spec{.width = 40, .height = 20, .samples = 3, .bits = 8, .tileSize = 16};
+        spec.pixels.assign(40 * 20 * 3, std::byte{77});
+        spec.setup = [](tiff* tif) { TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, PHOTOMETRIC_RGB); };
+        return WriteTiffDirectly(spec);
+    }();
+    ASSERT_TRUE(IO::DecodeImage(tiled, "tiled.tif"));
+    auto palette = [] {
+        TiffSpec spec{.width = 5, .height = 6, .samples = 1, .bits = 8};
+        spec.pixels.assign(5 * 6, std::byte{1});
+        spec.setup = [](tiff* tif) {
+            TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, PHOTOMETRIC_PALETTE);
+            static std::uint16_t map[3][256] = {{0, 65535}, {0, 65535}, {0, 0}};
+            TIFFSetField(tif, TIFFTAG_COLORMAP, map[0], map[1], map[2]);
+        };
+        return WriteTiffDirectly(spec);
+    }();
+    ASSERT_TRUE(IO::DecodeImage(palette, "palette.tif"));
+
+    // Each case damages one table; the number in a case is what replaces the count or the value.
+    struct Case {
+        const char* name;
+        const std::vector<std::byte>* source;
+        std::uint16_t tag;
+        bool value; // replace the value (or first offset of the table) rather than the count
+        std::uint32_t replacement;
+        const char* says;
+    };
+    const Case cases[] = {
+        {"few offsets.tif", &whole, 273, false, 2, "StripOffsets"},
+        {"few counts.tif", &whole, 279, false, 1, "StripByteCounts"},
+        {"few tile offsets.tif", &tiled, 324, false, 4, "TileOffsets"},
+        {"few tile counts.tif", &tiled, 325, false, 5, "TileByteCounts"},
+        {"few palette offsets.tif", &palette, 273, false, 1, "StripOffsets"},
+        {"header as pixels.tif", &whole, 273, true, 0,
+         "the strip table does not cover the image: strip 1 of 3"},
+        {"far away.tif", &whole, 273, true, 1u << 30, "strip 1 of 3 lies outside the file"},
+        {"far tile.tif", &tiled, 324, true, 1u << 30, "tile 1 of 6 lies outside the file"},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.name);
+        auto bytes = *c.source;
+        const std::size_t entry = FindTiffEntry(bytes, c.tag);
+        ASSERT_NE(entry, 0u);
+        if (!c.value) {
+            Put32(bytes, entry + 4, c.replacement);
+        } else {
+            // A table of several entries lies elsewhere; its first entry is the first strip's or tile's.
+            const std::uint32_t count = std::uint32_t(bytes[entry + 4]) | std::uint32_t(bytes[entry + 5])
+                                                                              << 8;
+            std::size_t at = entry + 8;
+            if (count > 1)
+                at = std::size_t(bytes[at]) | std::size_t(bytes[at + 1]) << 8 |
+                     std::size_t(bytes[at + 2]) << 16;
+            Put32(bytes, at, c.replacement);
+        }
+        const IO::ReadResult result = IO::DecodeImage(bytes, c.name);
+        EXPECT_FALSE(result);
+        EXPECT_TRUE(StartsWith(result.error, std::string(c.name) + ": truncated or damaged TIFF data ("))
+            << result.error;
+        EXPECT_TRUE(Contains(result.error, c.says)) << result.error;
+    }
+}
+
 TEST(HostileInput, EnormousClaimsAreRefusedBeforeAllocating) {
     const long before = Kernel::Countable::GetLiveObjectCount();
     IO::ReadResult result = IO::DecodeImage(PngClaiming(1000000, 1000000), "huge.png");
@@ -257,6 +378,47 @@ TEST(HostileInput, EnormousClaimsAreRefusedBeforeAllocating) {
     EXPECT_EQ(Kernel::Countable::GetLiveObjectCount(), before);
 }
 
+TEST(HostileInput, AncillaryPngChunkLengthsCannotMakeTheReaderAllocate) {
+    // 44 bytes: a valid header, then a chunk whose length field claims 0x7ffffff0 bytes that never come.
+    for (const char* type : {"tEXt", "zTXt", "iTXt", "iCCP", "eXIf", "sPLT", "pCAL", "prIV"}) {
+        SCOPED_TRACE(type);
+        std::vector<std::uint8_t> out = {0x89, 'P', 'N', 'G', 0x0D, 0x0A, 0x1A, 0x0A};
+        std::vector<std::uint8_t> header;
+        PutBig32(header, 1);
+        PutBig32(header, 1);
+        header.insert(header.end(), {8, 6, 0, 0, 0});
+        PngChunk(out, "IHDR", header);
+        PutBig32(out, 0x7ffffff0u);
+        out.insert(out.end(), type, type + 4);
+        out.insert(out.end(), {'a', 'b', 'c'});
+        ASSERT_EQ(out.size(), 44u);
+        const auto bytes = AsBytes(out);
+        const long grown = PeakGrowthKiB([&] {
+            const IO::ReadResult result = IO::DecodeImage(bytes, "text.png");
+            return !result && StartsWith(result.error, "text.png: truncated or damaged PNG data");
+        });
+        ASSERT_GE(grown, 0) << "not refused as damaged";
+        EXPECT_LT(grown, 64 << 10) << "KiB of address space taken for a 44-byte file";
+    }
+
+    // Sizeable but honest ancillary chunks are skipped and the image reads as before.
+    auto image = Noise(PixelFormat::RGBA8, 5, 4, 21);
+    const auto plain = IO::EncodeImage(*image, IO::FileType::PNG, "").bytes;
+    std::vector<std::uint8_t> out(reinterpret_cast<const std::uint8_t*>(plain.data()),
+                                  reinterpret_cast<const std::uint8_t*>(plain.data()) + 33);
+    std::vector<std::uint8_t> text(3 << 20, 'x');
+    text[7] = 0; // keyword "xxxxxxx"
+    PngChunk(out, "tEXt", text);
+    PngChunk(out, "iCCP", std::vector<std::uint8_t>(1 << 20, 0x41));
+    for (int i = 0; i < 2000; ++i)
+        PngChunk(out, "tEXt", {'k', 0, std::uint8_t('a' + i % 26)});
+    out.insert(out.end(), reinterpret_cast<const std::uint8_t*>(plain.data()) + 33,
+               reinterpret_cast<const std::uint8_t*>(plain.data()) + plain.size());
+    const IO::ReadResult result = IO::DecodeImage(AsBytes(out), "chatty.png");
+    ASSERT_TRUE(result) << result.error;
+    EXPECT_EQ(Difference(*result.image, *image), "");
+}
+
 TEST(HostileInput, FilesAreRecognisedByContentNotName) {
     ScratchFolder folder;
     const auto png = IO::EncodeImage(*Noise(PixelFormat::RGBA8, 3, 3, 7), IO::FileType::PNG, "").bytes;
@@ -279,6 +441,25 @@ TEST(HostileInput, FilesAreRecognisedByContentNotName) {
     EXPECT_FALSE(result);
     EXPECT_TRUE(StartsWith(result.error, (folder / "missing.png").string() + ": cannot open"))
         << result.error;
+}
+
+TEST(HostileInput, FoldersAndDevicesAreCalledWhatTheyAre) {
+    ScratchFolder folder;
+    std::filesystem::create_directory(folder / "album.png");
+    IO::ReadResult result = IO::ReadImage(folder / "album.png");
+    EXPECT_FALSE(result);
+    EXPECT_EQ(result.error, (folder / "album.png").string() + ": is a folder, not a file");
+    std::filesystem::create_directory_symlink(folder / "album.png", folder / "link.png");
+    result = IO::ReadImage(folder / "link.png");
+    EXPECT_EQ(result.error, (folder / "link.png").string() + ": is a folder, not a file");
+    EXPECT_EQ(folder.Names(), (std::vector<std::string>{"album.png", "link.png"}));
+
+    result = IO::ReadImage("/dev/null");
+    EXPECT_FALSE(result);
+    EXPECT_EQ(result.error, "/dev/null: is not a regular file");
+    ASSERT_EQ(mkfifo((folder / "pipe.tif").c_str(), 0600), 0);
+    result = IO::ReadImage(folder / "pipe.tif"); // must not wait for a writer
+    EXPECT_EQ(result.error, (folder / "pipe.tif").string() + ": is not a regular file");
 }
 
 TEST(HostileInput, OutputTypeComesFromTheExtensionAndUnknownOnesAreRefused) {

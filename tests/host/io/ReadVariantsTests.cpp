@@ -438,6 +438,80 @@ TEST(TiffVariants, PaletteAndBilevelGoThroughLibtiffsRenderer) {
     EXPECT_EQ(PixelOf<std::uint8_t>(*image, 1, 0), (V8{0, 128, 9, 255}));
 }
 
+TEST(TiffVariants, OrientationIsAppliedAlikeOnEveryRoute) {
+    // Stored 3 × 2, pixel k at row k / 3, column k % 3. Each orientation names where the stored first row and
+    // column belong; the upright images below are worked out by hand from those definitions.
+    const std::vector<std::vector<std::vector<int>>> upright = {
+        {{0, 1, 2}, {3, 4, 5}},   // 1 top-left
+        {{2, 1, 0}, {5, 4, 3}},   // 2 top-right: mirrored
+        {{5, 4, 3}, {2, 1, 0}},   // 3 bottom-right: half a turn
+        {{3, 4, 5}, {0, 1, 2}},   // 4 bottom-left: upside down
+        {{0, 3}, {1, 4}, {2, 5}}, // 5 left-top: transposed
+        {{3, 0}, {4, 1}, {5, 2}}, // 6 right-top: a quarter turn clockwise
+        {{5, 2}, {4, 1}, {3, 0}}, // 7 right-bottom: transposed the other way
+        {{2, 5}, {1, 4}, {0, 3}}, // 8 left-bottom: a quarter turn anticlockwise
+    };
+    auto colour = [](int k) {
+        return std::vector<std::uint8_t>{std::uint8_t(10 + 40 * k), std::uint8_t(200 - 30 * k),
+                                         std::uint8_t(7 * k + 1), 255};
+    };
+    struct Route {
+        const char* name;
+        bool palette;
+        bool planar;
+        int tileSize;
+        bool rowStrips; // a strip for each row rather than one for both
+    };
+    // libtiff 4.5's renderer cannot read palette tiles at all, so the rendered routes are strips only.
+    const Route routes[] = {{"strip", false, false, 0, false},
+                            {"row strips", false, false, 0, true},
+                            {"tiles", false, false, 16, false},
+                            {"planar strip", false, true, 0, false},
+                            {"planar tiles", false, true, 16, false},
+                            {"rendered strip", true, false, 0, false},
+                            {"rendered row strips", true, false, 0, true}};
+    for (int orientation = 1; orientation <= 8; ++orientation)
+        for (const Route& route : routes) {
+            SCOPED_TRACE(std::string(route.name) + ", orientation " + std::to_string(orientation));
+            TiffSpec spec{.width = 3, .height = 2, .samples = route.palette ? 1 : 3, .bits = 8};
+            spec.planar = route.planar;
+            spec.tileSize = route.tileSize;
+            for (int k = 0; k < 6; ++k) {
+                if (route.palette) {
+                    spec.pixels.push_back(std::byte(k));
+                    continue;
+                }
+                for (int c = 0; c < 3; ++c)
+                    spec.pixels.push_back(std::byte(colour(k)[std::size_t(c)]));
+            }
+            spec.setup = [&](tiff* tif) {
+                if (route.palette) {
+                    Photometric(tif, PHOTOMETRIC_PALETTE);
+                    static std::uint16_t map[3][256];
+                    for (int k = 0; k < 6; ++k)
+                        for (int c = 0; c < 3; ++c)
+                            map[c][k] = std::uint16_t(colour(k)[std::size_t(c)] * 257);
+                    TIFFSetField(tif, TIFFTAG_COLORMAP, map[0], map[1], map[2]);
+                } else {
+                    Photometric(tif, PHOTOMETRIC_RGB);
+                }
+                TIFFSetField(tif, TIFFTAG_ORIENTATION, std::uint16_t(orientation));
+                if (route.rowStrips) TIFFSetField(tif, TIFFTAG_ROWSPERSTRIP, std::uint32_t(1));
+            };
+            auto image = Decode(WriteTiffDirectly(spec)).image;
+            ASSERT_TRUE(image);
+            ASSERT_EQ(image->GetFormat(), PixelFormat::RGBA8);
+            const auto& expected = upright[std::size_t(orientation - 1)];
+            ASSERT_EQ(image->GetHeight(), int(expected.size()));
+            ASSERT_EQ(image->GetWidth(), int(expected[0].size()));
+            for (int y = 0; y < image->GetHeight(); ++y)
+                for (int x = 0; x < image->GetWidth(); ++x)
+                    EXPECT_EQ(PixelOf<std::uint8_t>(*image, x, y),
+                              colour(expected[std::size_t(y)][std::size_t(x)]))
+                        << x << "," << y;
+        }
+}
+
 TEST(TiffVariants, LayoutsWithoutAHostFormatAreRefusedByName) {
     TiffSpec wide{.width = 1, .height = 1, .samples = 1, .bits = 32};
     wide.pixels = Samples<std::uint32_t>({123456});
