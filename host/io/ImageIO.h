@@ -9,8 +9,10 @@
 //         float -> RGBAUF; CMYK 8 -> CMYKA8 (16-bit CMYK is rounded to 8 bits); CIELab / ICCLab 8, 16 bit or
 //         float -> LabA16. Other layouts libtiff can render (palette, YCbCr, bilevel, ...) -> RGBA8.
 // A missing alpha channel reads as opaque. Associated (premultiplied) alpha is divided out, so every result
-// holds straight alpha. EXIF and TIFF orientation tags are not applied. Only the first TIFF directory is
-// read.
+// holds straight alpha. A TIFF's orientation tag is applied (the image comes out upright, rows and columns
+// swapped for 5..8); JPEG's EXIF orientation is not. Only the first TIFF directory is read. Damaged data is
+// refused, never decoded into made-up pixels: a TIFF whose strip or tile tables do not cover the image, or
+// that libtiff warns about while decoding, is refused like a truncated one.
 //
 // LabA16 against TIFF Lab (see Raster::LabA16Encoding): L* 0..100 is 0..65535 (8-bit L is scaled by 257);
 // a* and b* are (value + 128) * 256, neutral at 32768. 16-bit CIELab's signed a/b (units of 1/256) map to it

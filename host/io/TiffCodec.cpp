@@ -438,6 +438,8 @@ void ConvertRow(const Layout& layout, const std::byte* in, std::byte* out, std::
         ConvertIntegerRow<std::uint16_t>(layout, in, out, width);
 }
 
+constexpr std::uint64_t MaxWholeStripBytes = std::uint64_t(16) << 20;
+
 // Strips or tiles, contiguous or planar: each band of rows (one strip or one row of tiles) is gathered into
 // interleaved file samples, then converted row by row into the image.
 bool ReadDirect(TIFF* tif, const Layout& layout, Raster::DynamicBuffer& image, std::string& why) {
@@ -480,6 +482,17 @@ bool ReadDirect(TIFF* tif, const Layout& layout, Raster::DynamicBuffer& image, s
         return false;
     }
     bandHeight = std::min(bandHeight, height);
+
+    // Large contiguous strips are read a row at a time, so that a small file cannot make the reader hold a
+    // strip it claims is gigabytes; the rows are the same as from whole strips.
+    if (!tiled && !layout.planar && chunkBytes > MaxWholeStripBytes) {
+        auto row = std::make_unique_for_overwrite<std::byte[]>(std::size_t(width) * pixelBytes);
+        for (std::uint32_t y = 0; y < height; ++y) {
+            if (TIFFReadScanline(tif, row.get(), y, 0) < 0) return false;
+            ConvertRow(layout, row.get(), image.RowBytes(int(y)), width);
+        }
+        return true;
+    }
 
     // Uninitialised on purpose: fresh large blocks cost nothing until decoded into, so a small file that
     // claims a large image fails on its missing data before memory is touched.

@@ -512,6 +512,37 @@ TEST(TiffVariants, OrientationIsAppliedAlikeOnEveryRoute) {
         }
 }
 
+TEST(TiffVariants, StripsTooLargeToHoldReadRowByRowAlike) {
+    // One strip of 2048 × 1400 RGB16 is 17 MB, above what the reader holds at once; a strip a row is not.
+    constexpr int width = 2048, height = 1400;
+    TiffSpec spec{.width = width, .height = height, .samples = 3, .bits = 16};
+    spec.pixels.resize(std::size_t(width) * height * 3 * 2);
+    for (std::size_t i = 0; i < spec.pixels.size() / 2; ++i) {
+        const auto v = std::uint16_t(i * 7 + i / 6143);
+        std::memcpy(spec.pixels.data() + i * 2, &v, 2);
+    }
+    for (int orientation : {3, 6}) {
+        SCOPED_TRACE("orientation " + std::to_string(orientation));
+        Kernel::Counted<Raster::DynamicBuffer> images[2];
+        for (std::uint32_t rows : {std::uint32_t(height), std::uint32_t(1)}) {
+            spec.setup = [&](tiff* tif) {
+                Photometric(tif, PHOTOMETRIC_RGB);
+                TIFFSetField(tif, TIFFTAG_ROWSPERSTRIP, rows);
+                TIFFSetField(tif, TIFFTAG_ORIENTATION, std::uint16_t(orientation));
+            };
+            images[rows == 1] = Decode(WriteTiffDirectly(spec)).image;
+            ASSERT_TRUE(images[rows == 1]);
+        }
+        EXPECT_EQ(Difference(*images[0], *images[1]), "");
+        const bool turned = orientation >= 5;
+        EXPECT_EQ(images[0]->GetWidth(), turned ? height : width);
+        // The stored first pixel lands in the corner its orientation names.
+        const int x = orientation == 1 || orientation == 8 ? 0 : images[0]->GetWidth() - 1;
+        const int y = orientation == 1 || orientation == 6 ? 0 : images[0]->GetHeight() - 1;
+        EXPECT_EQ(PixelOf<std::uint16_t>(*images[0], x, y), (std::vector<std::uint16_t>{0, 7, 14, 65535}));
+    }
+}
+
 TEST(TiffVariants, LayoutsWithoutAHostFormatAreRefusedByName) {
     TiffSpec wide{.width = 1, .height = 1, .samples = 1, .bits = 32};
     wide.pixels = Samples<std::uint32_t>({123456});
