@@ -19,7 +19,7 @@ namespace {
 struct Source {
     std::span<const std::uint8_t> bytes;
     std::uint64_t position = 0;
-    bool complained = false; // any error, or a warning about the tables that locate the pixel data
+    bool complained = false; // an error or warning about the tables that locate the pixel data
 };
 
 tmsize_t Read(thandle_t handle, void* buffer, tmsize_t size) {
@@ -35,7 +35,9 @@ tmsize_t Write(thandle_t, void*, tmsize_t) {
 }
 toff_t Seek(thandle_t handle, toff_t offset, int whence) {
     auto* source = static_cast<Source*>(handle);
-    const std::uint64_t base = whence == SEEK_CUR ? source->position : whence == SEEK_END ? source->bytes.size() : 0;
+    const std::uint64_t base = whence == SEEK_CUR   ? source->position
+                               : whence == SEEK_END ? source->bytes.size()
+                                                    : 0;
     source->position = base + offset;
     return source->position;
 }
@@ -50,11 +52,9 @@ int Map(thandle_t, void**, toff_t*) {
 }
 void Unmap(thandle_t, void*, toff_t) {}
 
-int OnError(TIFF*, void* user, const char*, const char*, va_list) {
-    static_cast<Source*>(user)->complained = true;
-    return 1;
-}
-int OnWarning(TIFF*, void* user, const char*, const char* format, va_list args) {
+// libtiff complains about much odd metadata that it then ignores; only complaints about the tables that
+// locate the pixel data count here.
+int OnMessage(TIFF*, void* user, const char*, const char* format, va_list args) {
     char text[256];
     std::vsnprintf(text, sizeof text, format, args);
     const std::string_view message(text);
@@ -64,13 +64,13 @@ int OnWarning(TIFF*, void* user, const char*, const char* format, va_list args) 
 }
 
 // A second look at a TIFF the decoder accepted, through libtiff alone: the first directory must open without
-// complaint about its strip or tile tables, every strip or tile must lie after the header and inside the file,
-// and each must decode.
+// complaint about its strip or tile tables, every strip or tile must lie after the header and inside the
+// file, and each must decode.
 void CheckAcceptedTiff(std::span<const std::uint8_t> bytes) {
     Source source{bytes};
     TIFFOpenOptions* options = TIFFOpenOptionsAlloc();
-    TIFFOpenOptionsSetErrorHandlerExtR(options, OnError, &source);
-    TIFFOpenOptionsSetWarningHandlerExtR(options, OnWarning, &source);
+    TIFFOpenOptionsSetErrorHandlerExtR(options, OnMessage, &source);
+    TIFFOpenOptionsSetWarningHandlerExtR(options, OnMessage, &source);
     TIFFOpenOptionsSetMaxSingleMemAlloc(options, tmsize_t(256) << 20);
     TIFF* tif = TIFFClientOpenExt("fuzz", "rm", &source, Read, Write, Seek, Close, Size, Map, Unmap, options);
     TIFFOpenOptionsFree(options);
@@ -82,7 +82,8 @@ void CheckAcceptedTiff(std::span<const std::uint8_t> bytes) {
     for (std::uint32_t i = 0; i < count; ++i) {
         const std::uint64_t offset = TIFFGetStrileOffset(tif, i);
         const std::uint64_t length = TIFFGetStrileByteCount(tif, i);
-        if (offset < 8 || length == 0 || offset > bytes.size() || length > bytes.size() - offset) std::abort();
+        if (offset < 8 || length == 0 || offset > bytes.size() || length > bytes.size() - offset)
+            std::abort();
         const tmsize_t got =
             tiled ? TIFFReadEncodedTile(tif, i, buffer, chunk) : TIFFReadEncodedStrip(tif, i, buffer, chunk);
         if (got < 0) std::abort();

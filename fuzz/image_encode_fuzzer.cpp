@@ -35,7 +35,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
         const IO::ReadResult again = IO::DecodeImage(encoded.bytes, "again");
         if (!again || again.type != type) std::abort();
         if (type == IO::FileType::JPEG) {
-            if (again.image->GetWidth() != image.GetWidth() || again.image->GetHeight() != image.GetHeight() ||
+            if (again.image->GetWidth() != image.GetWidth() ||
+                again.image->GetHeight() != image.GetHeight() ||
                 again.image->GetFormat() != image.GetFormat())
                 std::abort();
         } else if (!SamePixels(image, *again.image)) {
