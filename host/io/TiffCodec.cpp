@@ -12,6 +12,7 @@
 #include <cstdio>
 #include <cstring>
 #include <memory>
+#include <optional>
 
 namespace IO::Detail {
 
@@ -438,6 +439,40 @@ void ConvertRow(const Layout& layout, const std::byte* in, std::byte* out, std::
         ConvertIntegerRow<std::uint16_t>(layout, in, out, width);
 }
 
+// The photometric interpretation as the file states it, read from the directory at offset. libtiff quietly
+// turns a palette image without its colour map into grey or RGB, which would show indices as colours.
+std::optional<std::uint16_t> StatedPhotometric(std::span<const std::byte> data, std::uint64_t offset) {
+    if (data.size() < 8) return std::nullopt;
+    const bool big = data[0] == std::byte{'M'};
+    const bool bigTiff = std::to_integer<int>(data[big ? 3 : 2]) == 43;
+    auto read = [&](std::uint64_t at, int bytes) -> std::optional<std::uint64_t> {
+        if (at > data.size() || std::uint64_t(bytes) > data.size() - at) return std::nullopt;
+        std::uint64_t value = 0;
+        for (int i = 0; i < bytes; ++i) {
+            const auto b = std::to_integer<std::uint64_t>(data[std::size_t(at) + std::size_t(i)]);
+            value |= b << (8 * (big ? bytes - 1 - i : i));
+        }
+        return value;
+    };
+    const int countBytes = bigTiff ? 8 : 2;
+    const int entryBytes = bigTiff ? 20 : 12;
+    const std::optional<std::uint64_t> count = read(offset, countBytes);
+    if (!count) return std::nullopt;
+    for (std::uint64_t i = 0; i < std::min<std::uint64_t>(*count, 4096); ++i) {
+        const std::uint64_t entry = offset + std::uint64_t(countBytes) + i * std::uint64_t(entryBytes);
+        const std::optional<std::uint64_t> tag = read(entry, 2);
+        const std::optional<std::uint64_t> type = read(entry + 2, 2);
+        if (!tag || !type) return std::nullopt;
+        if (*tag != TIFFTAG_PHOTOMETRIC) continue;
+        // SHORT as the format says, though some writers use LONG.
+        const std::optional<std::uint64_t> value =
+            read(entry + (bigTiff ? 12 : 8), *type == TIFF_LONG ? 4 : 2);
+        if (!value) return std::nullopt;
+        return std::uint16_t(*value);
+    }
+    return std::nullopt;
+}
+
 constexpr std::uint64_t MaxWholeStripBytes = std::uint64_t(16) << 20;
 
 // Strips or tiles, contiguous or planar: each band of rows (one strip or one row of tiles) is gathered into
@@ -720,6 +755,12 @@ ReadResult DecodeTiff(std::span<const std::byte> data, std::string_view name) {
 
     Layout layout;
     std::string why;
+    std::uint16_t photometric = 0;
+    if (StatedPhotometric(data, TIFFCurrentDirOffset(file.tif)) == PHOTOMETRIC_PALETTE &&
+        (!TIFFGetField(file.tif, TIFFTAG_PHOTOMETRIC, &photometric) || photometric != PHOTOMETRIC_PALETTE)) {
+        result.error = Describe(name, "unsupported TIFF layout (a palette image without its colour map)");
+        return result;
+    }
     const Route route = ReadLayout(file.tif, layout, why);
     if (route == Route::Unsupported) {
         result.error = Describe(name, "unsupported TIFF layout (" + why + ")");

@@ -340,6 +340,34 @@ TEST(HostileInput, TiffChunkTablesMustCoverTheImage) {
     }
 }
 
+TEST(HostileInput, PaletteTiffWithoutItsColourMapIsRefused) {
+    // libtiff reads such a file as grey (one sample) or RGB (three) without a word: indices as colours.
+    for (int samples : {1, 3}) {
+        SCOPED_TRACE(std::to_string(samples) + " samples");
+        TiffSpec spec{.width = 5, .height = 3, .samples = samples, .bits = 8};
+        spec.pixels.assign(std::size_t(5 * 3 * samples), std::byte{2});
+        spec.setup = [](tiff* tif) {
+            TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, PHOTOMETRIC_PALETTE);
+            static std::uint16_t map[3][256] = {{0, 0, 65535}, {0, 0, 0}, {0, 0, 0}};
+            TIFFSetField(tif, TIFFTAG_COLORMAP, map[0], map[1], map[2]);
+        };
+        auto bytes = WriteTiffDirectly(spec);
+        if (samples == 1) {
+            const IO::ReadResult intact = IO::DecodeImage(bytes, "intact.tif");
+            ASSERT_TRUE(intact) << intact.error;
+            EXPECT_EQ(Component<std::uint8_t>(*intact.image, 4, 2, 0), 255);
+        }
+        const std::size_t entry = FindTiffEntry(bytes, 320);
+        ASSERT_NE(entry, 0u);
+        bytes[entry] = std::byte{0xE8}; // tag 65000, which no reader knows
+        bytes[entry + 1] = std::byte{0xFD};
+        const IO::ReadResult result = IO::DecodeImage(bytes, "nomap.tif");
+        EXPECT_FALSE(result);
+        EXPECT_EQ(result.error,
+                  "nomap.tif: unsupported TIFF layout (a palette image without its colour map)");
+    }
+}
+
 TEST(HostileInput, OneHugeStripIsNotHeldWhole) {
     // 4096 × 8 pixels of sixteen 16-bit samples in one deflated strip, then told it is 4096 rows high: one
     // strip of 512 MiB that holds 1 MiB. The image itself takes 128 MiB; the strip must not take more.
