@@ -340,6 +340,36 @@ TEST(HostileInput, TiffChunkTablesMustCoverTheImage) {
     }
 }
 
+TEST(HostileInput, DamagedJpegInsideTiffIsRefused) {
+    // libjpeg only warns about a cut or corrupt stream and fills in grey; inside a TIFF that warning reaches
+    // libtiff's warning handler, not the decoder's result.
+    TiffSpec spec{.width = 32, .height = 32, .samples = 1, .bits = 8, .tileSize = 32};
+    spec.pixels.resize(32 * 32);
+    for (std::size_t i = 0; i < spec.pixels.size(); ++i)
+        spec.pixels[i] = std::byte(i * 13 + i / 32 * 7);
+    spec.setup = [](tiff* tif) {
+        TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, PHOTOMETRIC_MINISBLACK);
+        TIFFSetField(tif, TIFFTAG_COMPRESSION, COMPRESSION_JPEG);
+    };
+    const auto bytes = WriteTiffDirectly(spec);
+    ASSERT_TRUE(IO::DecodeImage(bytes, "intact.tif"));
+    auto value = [&](std::uint16_t tag) {
+        const std::size_t entry = FindTiffEntry(bytes, tag) + 8;
+        return std::size_t(bytes[entry]) | std::size_t(bytes[entry + 1]) << 8 |
+               std::size_t(bytes[entry + 2]) << 16;
+    };
+    const std::size_t start = value(324), length = value(325);
+    ASSERT_GT(length, 100u);
+    for (std::size_t cut : {length / 2, length - 2}) {
+        auto damaged = bytes;
+        std::fill(damaged.begin() + std::ptrdiff_t(start + cut),
+                  damaged.begin() + std::ptrdiff_t(start + length), std::byte{0});
+        const IO::ReadResult result = IO::DecodeImage(damaged, "cut.tif");
+        EXPECT_FALSE(result) << "cut at " << cut;
+        EXPECT_TRUE(StartsWith(result.error, "cut.tif: truncated or damaged TIFF data (")) << result.error;
+    }
+}
+
 TEST(HostileInput, PaletteTiffWithoutItsColourMapIsRefused) {
     // libtiff reads such a file as grey (one sample) or RGB (three) without a word: indices as colours.
     for (int samples : {1, 3}) {
