@@ -645,7 +645,7 @@ Kernel::Counted<Raster::DynamicBuffer> Upright(Kernel::Counted<Raster::DynamicBu
 
 // Layouts without a host format of their own (palette, YCbCr, bilevel, ...) go through libtiff's own
 // renderer, which gives 8-bit RGBA with premultiplied alpha.
-ReadResult ReadRendered(TIFF* tif, std::string_view name, const TiffFile& file) {
+ReadResult ReadRendered(TIFF* tif, std::string_view name, TiffFile& file) {
     ReadResult result;
     char message[1024] = {};
     TIFFRGBAImage renderer{};
@@ -657,6 +657,8 @@ ReadResult ReadRendered(TIFF* tif, std::string_view name, const TiffFile& file) 
         TIFFRGBAImage* renderer;
         ~Guard() { TIFFRGBAImageEnd(renderer); }
     } guard{&renderer};
+    // Starting may warn about harmless things, such as a colour map of 8-bit values that old writers made.
+    file.messages.decoding = true;
     // Rows as stored, like the direct route; Upright turns the result for both.
     renderer.req_orientation = renderer.orientation;
     const std::uint32_t width = renderer.width;
@@ -772,12 +774,12 @@ ReadResult DecodeTiff(std::span<const std::byte> data, std::string_view name) {
     if (!result.error.empty()) return result;
     if (file.messages.damage[0]) return damaged(file.Reason(""));
     if (std::string table = CheckChunkTable(file.tif, stream.size); !table.empty()) return damaged(table);
-    file.messages.decoding = true;
     const int orientation = OrientationOf(file.tif);
 
     if (route == Route::Rendered) {
         result = ReadRendered(file.tif, name, file);
     } else {
+        file.messages.decoding = true;
         result.image = Raster::DynamicBuffer::Create(int(layout.width), int(layout.height), layout.format);
         if (!result.image) {
             result.error = Describe(name, "out of memory");

@@ -396,6 +396,19 @@ TEST(HostileInput, PaletteTiffWithoutItsColourMapIsRefused) {
         EXPECT_EQ(result.error,
                   "nomap.tif: unsupported TIFF layout (a palette image without its colour map)");
     }
+
+    // A colour map of 8-bit values, as old writers made, draws a warning from libtiff and still reads.
+    TiffSpec old{.width = 2, .height = 1, .samples = 1, .bits = 8};
+    old.pixels = {std::byte{1}, std::byte{2}};
+    old.setup = [](tiff* tif) {
+        TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, PHOTOMETRIC_PALETTE);
+        static std::uint16_t map[3][256] = {{0, 200, 0}, {0, 0, 100}, {0, 0, 0}};
+        TIFFSetField(tif, TIFFTAG_COLORMAP, map[0], map[1], map[2]);
+    };
+    const IO::ReadResult result = IO::DecodeImage(WriteTiffDirectly(old), "old.tif");
+    ASSERT_TRUE(result) << result.error;
+    EXPECT_EQ(Component<std::uint8_t>(*result.image, 0, 0, 0), 200);
+    EXPECT_EQ(Component<std::uint8_t>(*result.image, 1, 0, 1), 100);
 }
 
 TEST(HostileInput, OneHugeStripIsNotHeldWhole) {
