@@ -116,7 +116,10 @@ int OnTiffWarning(TIFF*, void* user, const char*, const char* format, va_list ar
     if (!messages || messages->damage[0]) return 1;
     char text[256];
     std::vsnprintf(text, sizeof text, format, args);
-    if ((messages->decoding && !IsSurplusTileWarning(text)) || IsDamageWarning(text))
+    // Old-style LZW is an early variant of the codec that libtiff still decodes exactly.
+    const bool harmless =
+        IsSurplusTileWarning(text) || std::string_view(text).find("Old-style LZW") != std::string_view::npos;
+    if ((messages->decoding && !harmless) || IsDamageWarning(text))
         std::memcpy(messages->damage, text, sizeof text);
     return 1;
 }
