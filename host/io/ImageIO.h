@@ -12,7 +12,8 @@
 // holds straight alpha. A TIFF's orientation tag is applied (the image comes out upright, rows and columns
 // swapped for 5..8); JPEG's EXIF orientation is not. Only the first TIFF directory is read. Damaged data is
 // refused, never decoded into made-up pixels: a TIFF whose strip or tile tables do not cover the image, or
-// that libtiff warns about while decoding, is refused like a truncated one.
+// whose data libtiff warns about while decoding, is refused like a truncated one; so is a palette TIFF
+// without its colour map. PNG text, profiles, EXIF and other ancillary chunks are skipped unread.
 //
 // LabA16 against TIFF Lab (see Raster::LabA16Encoding): L* 0..100 is 0..65535 (8-bit L is scaled by 257);
 // a* and b* are (value + 128) * 256, neutral at 32768. 16-bit CIELab's signed a/b (units of 1/256) map to it
