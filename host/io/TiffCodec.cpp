@@ -531,6 +531,27 @@ bool ReadDirect(TIFF* tif, const Layout& layout, Raster::DynamicBuffer& image, s
         }
         return true;
     }
+    // Large planar strips likewise, a group of rows at a time, each plane's rows read in turn. libtiff
+    // decodes a plane's strip from its start again for each group, so groups are as large as the cap allows.
+    const std::uint64_t rowBytes = std::uint64_t(width) * pixelBytes;
+    if (!tiled && layout.planar && bandHeight * rowBytes > MaxWholeStripBytes) {
+        const auto groupRows = std::uint32_t(std::max<std::uint64_t>(1, MaxWholeStripBytes / rowBytes));
+        auto group = std::make_unique_for_overwrite<std::byte[]>(std::size_t(groupRows * rowBytes));
+        auto row = std::make_unique_for_overwrite<std::byte[]>(std::size_t(width) * bytes);
+        for (std::uint32_t y0 = 0; y0 < height; y0 += groupRows) {
+            const std::uint32_t rows = std::min(groupRows, height - y0);
+            for (int plane = 0; plane < layout.samples; ++plane)
+                for (std::uint32_t r = 0; r < rows; ++r) {
+                    if (TIFFReadScanline(tif, row.get(), y0 + r, std::uint16_t(plane)) < 0) return false;
+                    std::byte* to = group.get() + r * rowBytes + std::size_t(plane) * bytes;
+                    for (std::uint32_t x = 0; x < width; ++x)
+                        std::memcpy(to + x * pixelBytes, row.get() + x * bytes, bytes);
+                }
+            for (std::uint32_t r = 0; r < rows; ++r)
+                ConvertRow(layout, group.get() + r * rowBytes, image.RowBytes(int(y0 + r)), width);
+        }
+        return true;
+    }
 
     // Uninitialised on purpose: fresh large blocks cost nothing until decoded into, so a small file that
     // claims a large image fails on its missing data before memory is touched.

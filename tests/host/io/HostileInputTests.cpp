@@ -412,28 +412,32 @@ TEST(HostileInput, PaletteTiffWithoutItsColourMapIsRefused) {
 }
 
 TEST(HostileInput, OneHugeStripIsNotHeldWhole) {
-    // 4096 × 8 pixels of sixteen 16-bit samples in one deflated strip, then told it is 4096 rows high: one
-    // strip of 512 MiB that holds 1 MiB. The image itself takes 128 MiB; the strip must not take more.
-    TiffSpec spec{.width = 4096, .height = 8, .samples = 16, .bits = 16};
-    spec.pixels.assign(std::size_t(4096) * 8 * 16 * 2, std::byte{3});
-    spec.setup = [](tiff* tif) {
-        TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, PHOTOMETRIC_RGB);
-        TIFFSetField(tif, TIFFTAG_COMPRESSION, COMPRESSION_ADOBE_DEFLATE);
-        TIFFSetField(tif, TIFFTAG_ROWSPERSTRIP, std::uint32_t(8));
-    };
-    auto bytes = WriteTiffDirectly(spec);
-    ASSERT_TRUE(IO::DecodeImage(bytes, "short.tif"));
-    for (std::uint16_t tag : {std::uint16_t(257), std::uint16_t(278)}) {
-        const std::size_t entry = FindTiffEntry(bytes, tag);
-        ASSERT_NE(entry, 0u);
-        Put32(bytes, entry + 8, 4096);
+    // 4096 × 8 pixels of sixteen 16-bit samples in one deflated strip (a strip for each plane when planar),
+    // then told it is 4096 rows high: 512 MiB of strips that hold 1 MiB. The image itself takes 128 MiB; the
+    // strips must not take more.
+    for (bool planar : {false, true}) {
+        SCOPED_TRACE(planar ? "planar" : "contiguous");
+        TiffSpec spec{.width = 4096, .height = 8, .samples = 16, .bits = 16, .planar = planar};
+        spec.pixels.assign(std::size_t(4096) * 8 * 16 * 2, std::byte{3});
+        spec.setup = [](tiff* tif) {
+            TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, PHOTOMETRIC_RGB);
+            TIFFSetField(tif, TIFFTAG_COMPRESSION, COMPRESSION_ADOBE_DEFLATE);
+            TIFFSetField(tif, TIFFTAG_ROWSPERSTRIP, std::uint32_t(8));
+        };
+        auto bytes = WriteTiffDirectly(spec);
+        ASSERT_TRUE(IO::DecodeImage(bytes, "short.tif"));
+        for (std::uint16_t tag : {std::uint16_t(257), std::uint16_t(278)}) {
+            const std::size_t entry = FindTiffEntry(bytes, tag);
+            ASSERT_NE(entry, 0u);
+            Put32(bytes, entry + 8, 4096);
+        }
+        const long grown = PeakGrowthKiB([&] {
+            const IO::ReadResult result = IO::DecodeImage(bytes, "tall.tif");
+            return !result && StartsWith(result.error, "tall.tif: truncated or damaged TIFF data");
+        });
+        ASSERT_GE(grown, 0) << "not refused as damaged";
+        EXPECT_LT(grown, 320 << 10) << "KiB of address space taken";
     }
-    const long grown = PeakGrowthKiB([&] {
-        const IO::ReadResult result = IO::DecodeImage(bytes, "tall.tif");
-        return !result && StartsWith(result.error, "tall.tif: truncated or damaged TIFF data");
-    });
-    ASSERT_GE(grown, 0) << "not refused as damaged";
-    EXPECT_LT(grown, 320 << 10) << "KiB of address space taken";
 }
 
 TEST(HostileInput, EnormousClaimsAreRefusedBeforeAllocating) {

@@ -521,8 +521,10 @@ TEST(TiffVariants, StripsTooLargeToHoldReadRowByRowAlike) {
         const auto v = std::uint16_t(i * 7 + i / 6143);
         std::memcpy(spec.pixels.data() + i * 2, &v, 2);
     }
-    for (int orientation : {3, 6}) {
+    for (int orientation : {3, 6, 0}) { // 0: planar, upright
         SCOPED_TRACE("orientation " + std::to_string(orientation));
+        spec.planar = orientation == 0;
+        if (orientation == 0) orientation = 1;
         Kernel::Counted<Raster::DynamicBuffer> images[2];
         for (std::uint32_t rows : {std::uint32_t(height), std::uint32_t(1)}) {
             spec.setup = [&](tiff* tif) {
@@ -537,8 +539,8 @@ TEST(TiffVariants, StripsTooLargeToHoldReadRowByRowAlike) {
         const bool turned = orientation >= 5;
         EXPECT_EQ(images[0]->GetWidth(), turned ? height : width);
         // The stored first pixel lands in the corner its orientation names.
-        const int x = orientation == 1 || orientation == 8 ? 0 : images[0]->GetWidth() - 1;
-        const int y = orientation == 1 || orientation == 6 ? 0 : images[0]->GetHeight() - 1;
+        const int x = orientation == 1 ? 0 : images[0]->GetWidth() - 1;
+        const int y = orientation == 3 ? images[0]->GetHeight() - 1 : 0;
         EXPECT_EQ(PixelOf<std::uint16_t>(*images[0], x, y), (std::vector<std::uint16_t>{0, 7, 14, 65535}));
     }
 }
