@@ -1,7 +1,7 @@
 // The pixel pipeline's throughput in megapixels per second: same-format copies and format conversions on the
 // processor (1 and 2 threads) and on the OpenCL device, and memcpy of the same bytes for scale.
 //
-//   pipeline_bench [--benchmark_filter=...]
+//   pipeline_bench [--benchmark_filter=...]        (the Lab pairs alone: --benchmark_filter='convert/.*Lab')
 //
 // Every render is a whole 2048 × 2048 image through RenderImage in 256-pixel tiles; device renders include
 // copying the source to the device and the result back.
@@ -38,11 +38,14 @@ void Render(benchmark::State& state, PixelFormat from, PixelFormat to, Bench::Pa
 
 void Register() {
     const std::pair<PixelFormat, PixelFormat> conversions[] = {
-        {PixelFormat::RGBA8, PixelFormat::RGBA16}, {PixelFormat::RGBA16, PixelFormat::RGBA8},
-        {PixelFormat::RGBA8, PixelFormat::RGBAUF}, {PixelFormat::RGBAUF, PixelFormat::RGBA8},
-        {PixelFormat::RGBA8, PixelFormat::IA8},    {PixelFormat::RGBA8, PixelFormat::CMYKA8},
-        {PixelFormat::CMYKA8, PixelFormat::RGBA8}, {PixelFormat::RGBA16, PixelFormat::LabA16},
-        {PixelFormat::LabA16, PixelFormat::RGBA16}};
+        {PixelFormat::RGBA8, PixelFormat::RGBA16},  {PixelFormat::RGBA16, PixelFormat::RGBA8},
+        {PixelFormat::RGBA8, PixelFormat::RGBAUF},  {PixelFormat::RGBAUF, PixelFormat::RGBA8},
+        {PixelFormat::RGBA8, PixelFormat::IA8},     {PixelFormat::RGBA8, PixelFormat::CMYKA8},
+        {PixelFormat::CMYKA8, PixelFormat::RGBA8},  {PixelFormat::RGBA16, PixelFormat::LabA16},
+        {PixelFormat::LabA16, PixelFormat::RGBA16}, {PixelFormat::RGBA8, PixelFormat::LabA16},
+        {PixelFormat::LabA16, PixelFormat::RGBA8},  {PixelFormat::RGBAUF, PixelFormat::LabA16},
+        {PixelFormat::LabA16, PixelFormat::RGBAUF}, {PixelFormat::CMYKA8, PixelFormat::LabA16},
+        {PixelFormat::LabA16, PixelFormat::CMYKA8}};
     for (PixelFormat format : Bench::LayerFormats) {
         const std::string name(Raster::GetPixelFormatName(format));
         benchmark::RegisterBenchmark(("memcpy/" + name).c_str(), Memcpy, format)

@@ -8,6 +8,7 @@
 #include <cmath>
 #include <cstdint>
 #include <cstdlib>
+#include <limits>
 #include <random>
 #include <vector>
 
@@ -80,6 +81,19 @@ inline std::vector<RGBPixel> RGBGrid() {
         grid.push_back({d(random), d(random), d(random), inside(random)});
     }
     return grid;
+}
+
+// Working colours no conversion should ever see, and does: NaN, infinities, beyond the 2^20 limit, denormal.
+inline std::vector<RGBPixel> HostileColours() {
+    const float nan = std::numeric_limits<float>::quiet_NaN();
+    const float inf = std::numeric_limits<float>::infinity();
+    const float values[] = {nan, inf, -inf, 3e38f, -3e38f, 2e6f, 1048576.0f, -1048576.0f, 1e-40f, 0.5f};
+    std::vector<RGBPixel> colours;
+    for (float r : values)
+        for (float g : values)
+            for (float b : values)
+                colours.push_back({r, g, b, g});
+    return colours;
 }
 
 // The Lab conversion in double, worked from the defining formulas independently of the code under test:

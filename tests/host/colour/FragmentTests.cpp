@@ -1,6 +1,7 @@
 // The Lab kernel text against the colour manager: language 0 compiled into this program, language 1 run on
-// the OpenCL device, language 0 compiled by NVRTC (and run where a CUDA device exists). Every stored LabA16
-// value of the grid and every working colour must convert to within one 16-bit step of the processor.
+// the OpenCL device, language 0 compiled by NVRTC (and run where a CUDA device exists). Both are made of the
+// source the processor compiles, so every stored LabA16 value of the grid and every working colour must
+// convert to exactly the processor's bits.
 
 #include "ColourTestSupport.h"
 
@@ -13,14 +14,26 @@
 #include <math.h>
 
 #include <algorithm>
+#include <bit>
+#include <cstring>
 #include <string>
 
 // The language-0 text exactly as the host hands it out (written at build time by lab_fragment_dump), over
-// the smallest float4 it needs. Built without contraction, as the kernels are.
+// what CUDA supplies and it uses: float4, make_float4 and the bit casts. Built without contraction, as the
+// kernels are.
 namespace HostText {
 struct float4 {
     float x, y, z, w;
 };
+inline float4 make_float4(float x, float y, float z, float w) {
+    return {x, y, z, w};
+}
+inline int __float_as_int(float v) {
+    return std::bit_cast<int>(v);
+}
+inline float __int_as_float(int v) {
+    return std::bit_cast<float>(v);
+}
 #include "LabFragmentCpp.inc"
 } // namespace HostText
 
@@ -42,20 +55,16 @@ LabPixel HostTextToLab(const RGBPixel& rgb) {
     return {store(out.x), store(out.y), store(out.z), store(out.w)};
 }
 
-// One 16-bit step of the working value, relative for values beyond 1 (Lab colours far outside sRGB).
+// The same bits, alpha included.
 ::testing::AssertionResult RGBAgrees(const RGBPixel& text, const RGBPixel& processor) {
-    for (int c = 0; c < 4; ++c) {
-        const float tolerance = std::max(1.0f, std::abs(processor[c])) / 65535.0f;
-        if (!(std::abs(text[c] - processor[c]) <= tolerance))
-            return ::testing::AssertionFailure()
-                   << "channel " << c << ": text " << text[c] << ", processor " << processor[c];
-    }
-    return ::testing::AssertionSuccess();
+    if (std::memcmp(text.data(), processor.data(), sizeof text) == 0) return ::testing::AssertionSuccess();
+    return ::testing::AssertionFailure()
+           << "text " << text[0] << " " << text[1] << " " << text[2] << " " << text[3] << ", processor "
+           << processor[0] << " " << processor[1] << " " << processor[2] << " " << processor[3];
 }
 
 ::testing::AssertionResult LabAgrees(const LabPixel& text, const LabPixel& processor) {
-    if (MaxStepDifference(text, processor, 3) <= 1 && text[3] == processor[3])
-        return ::testing::AssertionSuccess();
+    if (text == processor) return ::testing::AssertionSuccess();
     return ::testing::AssertionFailure()
            << "text " << text[0] << " " << text[1] << " " << text[2] << " " << text[3] << ", processor "
            << processor[0] << " " << processor[1] << " " << processor[2] << " " << processor[3];
@@ -129,7 +138,9 @@ struct AgreementKernel {
 // Runs the agreement kernel on the device over both grids and compares every pixel with the processor.
 void CheckDeviceAgainstProcessor(const HardwareDevice* device) {
     const auto labGrid = LabGrid();
-    const auto rgbGrid = RGBGrid();
+    auto rgbGrid = RGBGrid();
+    const auto hostile = HostileColours();
+    rgbGrid.insert(rgbGrid.begin(), hostile.begin(), hostile.end());
     constexpr int Width = 256;
     const int height = static_cast<int>((std::max(labGrid.size(), rgbGrid.size()) + Width - 1) / Width);
     const std::size_t total = std::size_t(Width) * height;
@@ -185,6 +196,8 @@ TEST(LabKernelText, LanguageZeroOnTheHostAgreesWithTheProcessorOverStoredLab) {
 
 TEST(LabKernelText, LanguageZeroOnTheHostAgreesWithTheProcessorOverWorkingColours) {
     for (const RGBPixel& rgb : RGBGrid())
+        ASSERT_TRUE(LabAgrees(HostTextToLab(rgb), ToLab(rgb))) << "working colour " << Describe(rgb);
+    for (const RGBPixel& rgb : HostileColours())
         ASSERT_TRUE(LabAgrees(HostTextToLab(rgb), ToLab(rgb))) << "working colour " << Describe(rgb);
     // Alpha outside 0..1 clamps as on the processor.
     EXPECT_EQ(HostTextToLab({0.5f, 0.5f, 0.5f, -0.5f})[3], 0);

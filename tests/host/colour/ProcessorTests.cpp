@@ -1,9 +1,11 @@
-// The colour manager's Lab conversions on the processor: values from the defining formulas, round trips,
-// alpha, buffers of any length and alignment, hostile values, and many threads at once.
+// The colour manager's Lab conversions on the processor: values from the defining formulas, agreement with
+// lcms2's own sRGB profile, round trips, alpha, buffers of any length and alignment, hostile values, and many
+// threads at once.
 
 #include "ColourTestSupport.h"
 
 #include <gtest/gtest.h>
+#include <lcms2.h>
 
 #include <algorithm>
 #include <cstring>
@@ -53,6 +55,80 @@ TEST(ColourProcessor, KnownColoursMatchTheLabFormulas) {
         EXPECT_NEAR(white[c], 1.0f, 2e-5f) << c;
         EXPECT_NEAR(black[c], 0.0f, 2e-5f) << c;
     }
+}
+
+TEST(ColourProcessor, HandWorkedPointsStoreAsTheFormulasRound) {
+    // Rounded to nearest, stored values lie within half a step of the exact ones; float arithmetic may add a
+    // few hundredths of a step.
+    const auto expectStored = [](const RGBPixel& rgb, double l, double a, double b) {
+        const LabPixel lab = ToLab(rgb);
+        const double exact[3] = {l * 655.35, (a + 128.0) * 256.0, (b + 128.0) * 256.0};
+        for (int c = 0; c < 3; ++c)
+            EXPECT_LE(std::abs(double(lab[c]) - exact[c]), 0.55)
+                << rgb[0] << " " << rgb[1] << " " << rgb[2] << " channel " << c << ": stored " << lab[c]
+                << ", exact " << exact[c];
+    };
+    // White and black are the ends of the neutral axis, exactly.
+    EXPECT_EQ(ToLab({1, 1, 1, 1}), (LabPixel{65535, 32768, 32768, 65535}));
+    EXPECT_EQ(ToLab({0, 0, 0, 1}), (LabPixel{0, 32768, 32768, 65535}));
+    // Mid grey: linear ((0.5 + 0.055) / 1.055)^2.4 = 0.2140411, L* = 116 * 0.2140411^(1/3) - 16 = 53.388965,
+    // stored 34988.458 -> 34988; grey has no chroma.
+    expectStored({0.5f, 0.5f, 0.5f, 1}, 53.388965, 0.0, 0.0);
+    EXPECT_EQ(ToLab({0.5f, 0.5f, 0.5f, 1})[0], 34988);
+    // The primaries: linear (1, 0, 0) is the first column of the adapted matrix, XYZ(D50) = (0.4360413,
+    // 0.2224845, 0.0139202); over the white (0.9642, 1, 0.8249) and through f, L* = 54.289632,
+    // a* = 80.814356, b* = 69.889742. Green, XYZ (0.3851129, 0.7169051, 0.0970672): L* = 87.819406,
+    // a* = -79.274942, b* = 80.992723. Blue, XYZ (0.1430458, 0.0606104, 0.7139126): L* = 29.565939,
+    // a* = 68.286208, b* = -112.032919.
+    expectStored({1, 0, 0, 1}, 54.289632, 80.814356, 69.889742);
+    expectStored({0, 1, 0, 1}, 87.819406, -79.274942, 80.992723);
+    expectStored({0, 0, 1, 1}, 29.565939, 68.286208, -112.032919);
+    // The secondaries, from the reference's double arithmetic.
+    const LabReference reference;
+    for (const RGBPixel& primary : {RGBPixel{1, 1, 0, 1}, RGBPixel{0, 1, 1, 1}, RGBPixel{1, 0, 1, 1}}) {
+        const auto lab = reference.Lab(primary[0], primary[1], primary[2]);
+        expectStored(primary, lab[0], lab[1], lab[2]);
+    }
+
+    // Back from Lab: black is exactly zero, with no residue for a CMYK split to divide by 1 - k, and white is
+    // 1 to within a float step.
+    const RGBPixel black = ToRGB({0, 32768, 32768, 65535});
+    const RGBPixel white = ToRGB({65535, 32768, 32768, 65535});
+    for (int c = 0; c < 3; ++c) {
+        EXPECT_EQ(black[c], 0.0f) << c;
+        EXPECT_NEAR(white[c], 1.0f, 2.4e-7f) << c;
+    }
+}
+
+TEST(ColourProcessor, ClosedFormMatchesLcms2sOwnSRGBProfile) {
+    // lcms2's built-in sRGB profile (its own primaries, white and curve) to its D50 Lab, in float, over a
+    // grid of in-gamut colours: the stored values lie within 0.55 of a step of lcms2's unrounded ones (half a
+    // step of rounding, the rest float arithmetic on either side).
+    cmsHPROFILE srgb = cmsCreate_sRGBProfile();
+    cmsHPROFILE lab = cmsCreateLab4Profile(nullptr);
+    ASSERT_TRUE(srgb && lab);
+    cmsHTRANSFORM transform = cmsCreateTransform(srgb, TYPE_RGB_FLT, lab, TYPE_Lab_FLT,
+                                                 INTENT_RELATIVE_COLORIMETRIC, cmsFLAGS_NOOPTIMIZE);
+    cmsCloseProfile(srgb);
+    cmsCloseProfile(lab);
+    ASSERT_NE(transform, nullptr);
+    double worst = 0.0;
+    constexpr int Steps = 40;
+    for (int r = 0; r <= Steps; ++r)
+        for (int g = 0; g <= Steps; ++g)
+            for (int b = 0; b <= Steps; ++b) {
+                const float rgb[3] = {float(r) / Steps, float(g) / Steps, float(b) / Steps};
+                float reference[3];
+                cmsDoTransform(transform, rgb, reference, 1);
+                const double unrounded[3] = {reference[0] * 655.35, (reference[1] + 128.0) * 256.0,
+                                             (reference[2] + 128.0) * 256.0};
+                const LabPixel stored = ToLab({rgb[0], rgb[1], rgb[2], 1.0f});
+                for (int c = 0; c < 3; ++c)
+                    worst = std::max(worst, std::abs(double(stored[c]) - unrounded[c]));
+            }
+    cmsDeleteTransform(transform);
+    EXPECT_LE(worst, 0.55);
+    std::cout << "[ info     ] largest distance from lcms2: " << worst << " of a stored step\n";
 }
 
 TEST(ColourProcessor, AgreesWithTheReferenceOverWorkingColours) {
@@ -165,12 +241,13 @@ TEST(ColourProcessor, HostileValuesStoreInsideTheRange) {
     EXPECT_EQ(nanAlpha[3], 0) << "a NaN alpha stores as 0";
     EXPECT_EQ(MaxStepDifference(nanAlpha, ToLab({0.5f, 0.5f, 0.5f, 1}), 3), 0)
         << "and leaves the colour alone";
-    // Whatever lcms2 makes of these, the result is a stored value, the call returns, and a neighbour in the
-    // same call is unaffected.
+    // A NaN colour counts as 0 and infinities as the 2^20 limit; a neighbour in the same call is unaffected.
     std::array<RGBPixel, 3> pixels{{{nan, 0.5f, 0.5f, 1}, {inf, -inf, 1e30f, 1}, {0.25f, 0.5f, 0.75f, 1}}};
     std::array<LabPixel, 3> stored{};
     ICCManager::GetInstance().DoRGBAFToLABA16Transform(reinterpret_cast<unsigned char*>(pixels.data()),
                                                        reinterpret_cast<unsigned char*>(stored.data()), 3);
+    EXPECT_EQ(stored[0], ToLab({0.0f, 0.5f, 0.5f, 1}));
+    EXPECT_EQ(stored[1], ToLab({1048576.0f, -1048576.0f, 1048576.0f, 1}));
     EXPECT_EQ(stored[2], ToLab(pixels[2]));
 }
 
