@@ -51,14 +51,16 @@
                           1.0f - rt_fmin(1.0f, m * (1.0f - k) + k),                                          \
                           1.0f - rt_fmin(1.0f, y * (1.0f - k) + k), source.a / 255.0f);
 
-// Clamped first; black takes what the three inks share; pure black (k = 1) needs no division.
+// Clamped first; black takes what the three inks share. Where black stores as full (k * 255 rounds to 255)
+// the inks could change the colour by less than half a step, and dividing by 1 - k would blow a float
+// residue near black up into full inks: they are left at 0, and pure black needs no division.
 #define RT_CMYKA8_FROM_WORKING                                                                               \
     source = saturate(source);                                                                               \
     const float k = rt_fmin(1.0f - source.x, rt_fmin(1.0f - source.y, 1.0f - source.z));                     \
     float c = 0.0f;                                                                                          \
     float m = 0.0f;                                                                                          \
     float y = 0.0f;                                                                                          \
-    if (k < 1.0f) {                                                                                          \
+    if (k * 255.0f < 254.5f) {                                                                               \
         c = (1.0f - source.x - k) / (1.0f - k);                                                              \
         m = (1.0f - source.y - k) / (1.0f - k);                                                              \
         y = (1.0f - source.z - k) / (1.0f - k);                                                              \

@@ -276,11 +276,10 @@ struct Kit<PixelFormat::CMYKA8> {
                              _mm256_min_ps(one, _mm256_add_ps(_mm256_mul_ps(ink, _mm256_sub_ps(one, k)), k)));
     }
     // ToByte((1 - colour - k) / divisor): 1 - colour is at least k, and at most 1, so the quotient is within
-    // [+0, 1] and needs no clamp. Where not inked all three of 1 - colour are 1 and the quotient is 0 / 1,
-    // the zero Planar selects.
-    RT_TARGET_AVX2 static __m256i InkByte(__m256 colour, __m256 k, __m256 divisor) noexcept {
-        const __m256 ink =
-            _mm256_div_ps(_mm256_sub_ps(_mm256_sub_ps(_mm256_set1_ps(1.0f), colour), k), divisor);
+    // [+0, 1] and needs no clamp. Where not inked it is masked to the zero Planar selects.
+    RT_TARGET_AVX2 static __m256i InkByte(__m256 colour, __m256 k, __m256 divisor, __m256 inked) noexcept {
+        const __m256 ink = _mm256_and_ps(
+            _mm256_div_ps(_mm256_sub_ps(_mm256_sub_ps(_mm256_set1_ps(1.0f), colour), k), divisor), inked);
         return Lanes::RoundInRange(_mm256_mul_ps(ink, _mm256_set1_ps(255.0f)));
     }
     RT_TARGET_AVX2 static void ToWorking(const cmyka8* in, WorkingPlanes& w, int n) noexcept {
@@ -315,11 +314,13 @@ struct Kit<PixelFormat::CMYKA8> {
             const __m256 b = Clamp(_mm256_load_ps(w.b + i), 1.0f);
             const __m256 k = _mm256_min_ps(_mm256_sub_ps(one, r),
                                            _mm256_min_ps(_mm256_sub_ps(one, g), _mm256_sub_ps(one, b)));
-            const __m256 inked = _mm256_cmp_ps(k, one, _CMP_LT_OQ);
+            const __m256 inked =
+                _mm256_cmp_ps(_mm256_mul_ps(k, _mm256_set1_ps(255.0f)), _mm256_set1_ps(254.5f), _CMP_LT_OQ);
             const __m256 divisor = _mm256_blendv_ps(one, _mm256_sub_ps(one, k), inked);
             // k is within [+0, 1] too.
-            const __m256i words = Pack(InkByte(r, k, divisor), InkByte(g, k, divisor), InkByte(b, k, divisor),
-                                       RoundInRange(_mm256_mul_ps(k, _mm256_set1_ps(255.0f))));
+            const __m256i words =
+                Pack(InkByte(r, k, divisor, inked), InkByte(g, k, divisor, inked),
+                     InkByte(b, k, divisor, inked), RoundInRange(_mm256_mul_ps(k, _mm256_set1_ps(255.0f))));
             const __m256i alpha = ToByte(_mm256_load_ps(w.a + i));
             alignas(32) unsigned char tail[8 * sizeof(cmyka8)];
             unsigned char* bytes = Target(out, i, n, tail);

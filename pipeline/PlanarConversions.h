@@ -193,7 +193,7 @@ struct Planar<PixelFormat::CMYKA8> {
             w.a[i] = float(alpha[i]) / 255.0f;
         }
     }
-    // Pure black (k = 1) divides by 1 and then selects zero inks, instead of branching.
+    // Where black stores as full, divides by 1 and then selects zero inks, instead of branching.
     static void FromWorking(const WorkingPlanes& w, cmyka8* out, int n) noexcept {
         alignas(64) std::uint32_t inks[SpanLength];
         alignas(64) uchar alpha[SpanLength];
@@ -201,7 +201,7 @@ struct Planar<PixelFormat::CMYKA8> {
         for (int i = 0; i < n; ++i) {
             const float r = Clamp01(w.r[i]), g = Clamp01(w.g[i]), b = Clamp01(w.b[i]);
             const float k = Min(1.0f - r, Min(1.0f - g, 1.0f - b));
-            const bool inked = k < 1.0f;
+            const bool inked = k * 255.0f < 254.5f;
             const float divisor = inked ? 1.0f - k : 1.0f;
             const float cInk = (1.0f - r - k) / divisor;
             const float mInk = (1.0f - g - k) / divisor;

@@ -1,52 +1,22 @@
 #include "host/raster/ICCManager.h"
 
-#include "host/raster/PixelFormat.h"
+#include "host/raster/LabMath.h"
 
-#include <lcms2.h>
-
-#include <algorithm>
-#include <cstdint>
 #include <cstring>
 
 namespace Raster {
 
 namespace {
 
-namespace Space = WorkingColourSpace;
+using namespace KernelMath;
 
-// Pixels go through lcms2 in chunks held on the stack, so that a call of any length allocates nothing.
-constexpr int ChunkPixels = 64;
-
-// The working RGB profile, built from the shared constants rather than taken ready-made, so that the kernel
-// text and this profile provably describe the same space. In memory, lcms2 keeps the colorants in double.
-cmsHPROFILE CreateWorkingRGBProfile() {
-    const cmsCIExyY white{Space::WhiteX, Space::WhiteY, 1.0};
-    const cmsCIExyYTRIPLE primaries{{Space::RedX, Space::RedY, 1.0},
-                                    {Space::GreenX, Space::GreenY, 1.0},
-                                    {Space::BlueX, Space::BlueY, 1.0}};
-    // lcms2's parametric type 4: Y = (a X + b)^g for X >= d, Y = c X below. Evaluated analytically in float
-    // transforms, which is what keeps values outside 0..1 intact in both directions.
-    const cmsFloat64Number curve[5] = {Space::Gamma, 1.0 / (1.0 + Space::Offset),
-                                       Space::Offset / (1.0 + Space::Offset), 1.0 / Space::LinearSlope,
-                                       Space::Break};
-    cmsToneCurve* transfer = cmsBuildParametricToneCurve(nullptr, 4, curve);
-    if (!transfer) return nullptr;
-    cmsToneCurve* curves[3] = {transfer, transfer, transfer};
-    cmsHPROFILE profile = cmsCreateRGBProfile(&white, &primaries, curves);
-    cmsFreeToneCurve(transfer);
-    return profile;
+// The LabA16 Convert bodies' expressions, so that the colour manager gives the kernels' values: stored /
+// 65535 in, and scaled, 0.5 added and truncated (saturating) out.
+float4 FromStored(ushort4 lab) noexcept {
+    return labaf_to_rgbauf(convert_float4(lab) / 65535.0f);
 }
-
-std::uint16_t StoreComponent(double value) {
-    if (!(value > 0.0)) return 0; // NaN too
-    if (value >= 65535.0) return 65535;
-    return static_cast<std::uint16_t>(value + 0.5);
-}
-
-// Float arithmetic, exactly as the kernel text writes alpha.
-std::uint16_t StoreAlpha(float alpha) {
-    const float clamped = alpha > 0.0f ? (alpha < 1.0f ? alpha : 1.0f) : 0.0f;
-    return static_cast<std::uint16_t>(clamped * 65535.0f + 0.5f);
+ushort4 ToStored(float4 rgb) noexcept {
+    return convert_ushort4(rgbauf_to_labaf(rgb) * 65535.0f + 0.5f);
 }
 
 } // namespace
@@ -57,74 +27,21 @@ ICCManager& ICCManager::GetInstance() {
     return *instance;
 }
 
-ICCManager::ICCManager() {
-    cmsHPROFILE rgb = CreateWorkingRGBProfile();
-    cmsHPROFILE lab = cmsCreateLab4Profile(nullptr); // D50
-    if (rgb && lab) {
-        // Without the one-pixel cache a transform is documented as safe to share between threads, so one
-        // pair serves every rendering thread. Without optimisation no sampled table can ever stand in for the
-        // exact curves and matrices.
-        constexpr cmsUInt32Number flags = cmsFLAGS_NOCACHE | cmsFLAGS_NOOPTIMIZE;
-        m_ToLab =
-            cmsCreateTransform(rgb, TYPE_RGBA_FLT, lab, TYPE_Lab_FLT, INTENT_RELATIVE_COLORIMETRIC, flags);
-        m_FromLab =
-            cmsCreateTransform(lab, TYPE_Lab_FLT, rgb, TYPE_RGBA_FLT, INTENT_RELATIVE_COLORIMETRIC, flags);
-    }
-    if (rgb) cmsCloseProfile(rgb);
-    if (lab) cmsCloseProfile(lab);
-}
-
 void ICCManager::DoRGBAFToLABA16Transform(unsigned char* in, unsigned char* out, int count) {
-    float rgba[ChunkPixels * 4];
-    float lab[ChunkPixels * 3];
-    std::uint16_t stored[ChunkPixels * 4];
-    for (int done = 0; done < count;) {
-        const int n = std::min(ChunkPixels, count - done);
-        std::memcpy(rgba, in + std::size_t(done) * sizeof(float) * 4, std::size_t(n) * sizeof(float) * 4);
-        if (m_ToLab)
-            cmsDoTransform(static_cast<cmsHTRANSFORM>(m_ToLab), rgba, lab, static_cast<cmsUInt32Number>(n));
-        else
-            std::fill_n(lab, n * 3, 0.0f);
-        for (int i = 0; i < n; ++i) {
-            stored[i * 4 + 0] = StoreComponent(double(lab[i * 3 + 0]) * LabA16Encoding::LightnessScale);
-            stored[i * 4 + 1] = StoreComponent(double(lab[i * 3 + 1]) * LabA16Encoding::OpponentScale +
-                                               LabA16Encoding::OpponentNeutral);
-            stored[i * 4 + 2] = StoreComponent(double(lab[i * 3 + 2]) * LabA16Encoding::OpponentScale +
-                                               LabA16Encoding::OpponentNeutral);
-            stored[i * 4 + 3] = StoreAlpha(rgba[i * 4 + 3]);
-        }
-        std::memcpy(out + std::size_t(done) * sizeof(std::uint16_t) * 4, stored,
-                    std::size_t(n) * sizeof(std::uint16_t) * 4);
-        done += n;
+    for (int i = 0; i < count; ++i) {
+        float4 rgb;
+        std::memcpy(&rgb, in + std::size_t(i) * sizeof rgb, sizeof rgb);
+        const ushort4 lab = ToStored(rgb);
+        std::memcpy(out + std::size_t(i) * sizeof lab, &lab, sizeof lab);
     }
 }
 
 void ICCManager::DoLABA16ToRGBAFTransform(unsigned char* in, unsigned char* out, int count) {
-    std::uint16_t stored[ChunkPixels * 4];
-    float lab[ChunkPixels * 3];
-    float rgba[ChunkPixels * 4];
-    for (int done = 0; done < count;) {
-        const int n = std::min(ChunkPixels, count - done);
-        std::memcpy(stored, in + std::size_t(done) * sizeof(std::uint16_t) * 4,
-                    std::size_t(n) * sizeof(std::uint16_t) * 4);
-        for (int i = 0; i < n; ++i) {
-            lab[i * 3 + 0] = static_cast<float>(stored[i * 4 + 0] / LabA16Encoding::LightnessScale);
-            lab[i * 3 + 1] =
-                static_cast<float>((stored[i * 4 + 1] - double(LabA16Encoding::OpponentNeutral)) /
-                                   LabA16Encoding::OpponentScale);
-            lab[i * 3 + 2] =
-                static_cast<float>((stored[i * 4 + 2] - double(LabA16Encoding::OpponentNeutral)) /
-                                   LabA16Encoding::OpponentScale);
-        }
-        if (m_FromLab)
-            cmsDoTransform(static_cast<cmsHTRANSFORM>(m_FromLab), lab, rgba, static_cast<cmsUInt32Number>(n));
-        else
-            std::fill_n(rgba, n * 4, 0.0f);
-        // lcms2 leaves the extra channel alone; alpha is ours, as the kernel text computes it.
-        for (int i = 0; i < n; ++i)
-            rgba[i * 4 + 3] = static_cast<float>(stored[i * 4 + 3]) / 65535.0f;
-        std::memcpy(out + std::size_t(done) * sizeof(float) * 4, rgba, std::size_t(n) * sizeof(float) * 4);
-        done += n;
+    for (int i = 0; i < count; ++i) {
+        ushort4 lab;
+        std::memcpy(&lab, in + std::size_t(i) * sizeof lab, sizeof lab);
+        const float4 rgb = FromStored(lab);
+        std::memcpy(out + std::size_t(i) * sizeof rgb, &rgb, sizeof rgb);
     }
 }
 

@@ -3,7 +3,8 @@
 
 namespace Raster {
 
-// The two colour spaces, shared with the kernel text (LabFragments.h) so that both paths use one definition.
+// The two colour spaces: the defining constants, from which the literals of LabMath.h are derived (and
+// checked, in LabFragments.cpp).
 //
 // Working RGB (rgbauf, and what 8- and 16-bit RGB layers hold): sRGB-encoded values, sRGB primaries, D65
 // white. The transfer curve is the sRGB one, continued beyond 0..1 rather than clipped: below the break
@@ -39,15 +40,17 @@ inline constexpr double Bradford[3][3] = {
 
 // Lab conversions for the processor path. Pixels are packed: rgbauf as four 32-bit floats (red, green,
 // blue, alpha), LabA16 as four unsigned 16-bit values (L, a, b, alpha) encoded as LabA16Encoding says
-// (PixelFormat.h). Both calls may run on any number of threads at once; they allocate nothing. in and out
-// must not overlap; neither needs any alignment.
+// (PixelFormat.h). The built-in pair (working RGB <-> Lab) is the closed form of LabMath.h, the very source
+// the kernels' Lab text is made of, with the LabA16 Convert bodies' scaling and rounding: a call gives what a
+// kernel gives, bit for bit. ICC profiles other than these two belong to lcms2. Both calls may run on any
+// number of threads at once; they allocate nothing. in and out must not overlap; neither needs any alignment.
 class ICCManager {
 public:
     static ICCManager& GetInstance();
 
-    // Working RGB to LabA16. Lab values beyond what LabA16 stores (L above 100 or below 0, a or b outside
-    // -128 .. 127.996) are clamped to its range; alpha is clamped to 0..1, scaled by 65535, and 0.5 is
-    // added before truncation. A NaN component stores as 0.
+    // Working RGB to LabA16: as rgbauf_to_labaf (LabMath.h) describes, Lab values beyond what LabA16 stores
+    // clamp to its range and a NaN colour component counts as 0; alpha is clamped to 0..1 (NaN to 0); each
+    // component is then scaled by 65535 and 0.5 is added before truncation.
     void DoRGBAFToLABA16Transform(unsigned char* in, unsigned char* out, int count);
     // LabA16 to working RGB, unbounded: colours outside sRGB come back with components below 0 or above 1.
     // Alpha is the stored value divided by 65535.
@@ -57,11 +60,8 @@ public:
     ICCManager& operator=(const ICCManager&) = delete;
 
 private:
-    ICCManager();
+    ICCManager() = default;
     ~ICCManager() = default; // the instance lives until the process ends; rendering threads may outlast main
-
-    void* m_ToLab = nullptr; // lcms2 transforms, created once; null only when memory ran out
-    void* m_FromLab = nullptr;
 };
 
 } // namespace Raster
