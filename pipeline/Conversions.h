@@ -27,7 +27,8 @@ using Raster::KernelMath::rt_round;
 using Raster::KernelMath::saturate;
 using Raster::KernelMath::ushort2_literal;
 
-// Stored <-> working for format F; the LabA16 pair goes through the colour manager, one pixel at a time.
+// Stored <-> working for format F; the LabA16 pair goes through the colour manager (for a run of pixels, see
+// ConvertLabSpan).
 template <Raster::PixelFormat F>
 struct Convert;
 
@@ -140,6 +141,30 @@ inline Raster::StoredPixel<F> FromWorking(Raster::KernelMath::float4 p) noexcept
     return ConvertCode::Convert<F>::FromWorking(p);
 }
 
+// n pixels to or from LabA16 through the working pixel, the Lab side a run at a time through the colour
+// manager, which converts a run in vector lanes: the bits of ToWorking and FromWorking one pixel at a time.
+template <Raster::PixelFormat Source, Raster::PixelFormat Dest>
+void ConvertLabSpan(const Raster::StoredPixel<Source>* in, Raster::StoredPixel<Dest>* out, int n) noexcept {
+    constexpr int Run = Raster::SpanLength;
+    Raster::KernelMath::float4 working[Run];
+    auto& manager = Raster::ICCManager::GetInstance();
+    for (int done = 0; done < n; done += Run) {
+        const int count = n - done < Run ? n - done : Run;
+        if constexpr (Source == Raster::PixelFormat::LabA16) {
+            manager.DoLABA16ToRGBAFTransform(
+                reinterpret_cast<unsigned char*>(const_cast<Raster::StoredPixel<Source>*>(in + done)),
+                reinterpret_cast<unsigned char*>(working), count);
+            for (int i = 0; i < count; ++i)
+                out[done + i] = FromWorking<Dest>(working[i]);
+        } else {
+            for (int i = 0; i < count; ++i)
+                working[i] = ToWorking<Source>(in[done + i]);
+            manager.DoRGBAFToLABA16Transform(reinterpret_cast<unsigned char*>(working),
+                                             reinterpret_cast<unsigned char*>(out + done), count);
+        }
+    }
+}
+
 // CMYKA8 pixels straight to LabA16, one 32-pixel span at a time: the CMYK arithmetic of ToWorking, alpha by
 // the reciprocal of 255, Lab alpha scaled with 0.5 added and truncated, colour through the colour manager.
 // Interleaved spans hold 5-byte pixels; planar ones a plane of 32 components per channel.
@@ -163,6 +188,10 @@ requires(Source != Dest) struct Raster::PixelConversion<Source, Dest> {
     static void ConvertSpan(const StoredPixel<Source>* in, StoredPixel<Dest>* out,
                             int n) noexcept requires RasterTools::PlanarConvert::HasPlanarPair<Source, Dest> {
         RasterTools::PlanarConvert::ConvertSpan<Source, Dest>(in, out, n);
+    }
+    static void ConvertSpan(const StoredPixel<Source>* in, StoredPixel<Dest>* out, int n) noexcept
+        requires(Source == PixelFormat::LabA16 || Dest == PixelFormat::LabA16) {
+        RasterTools::ConvertLabSpan<Source, Dest>(in, out, n);
     }
 };
 
