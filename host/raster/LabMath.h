@@ -19,7 +19,7 @@
 // take and give components scaled as the LabA16 traits use them: L / 100 and (a or b + 128) * 256 / 65535.
 //
 // rgbauf_to_labaf: a NaN colour component counts as 0 and every colour component is limited to
-// +-RT_LAB_LIMIT (2^20) first, so infinities act as that and nothing downstream overflows; the results are
+// -2^20 .. 2^20 first, so infinities act as that and nothing downstream overflows; the results are
 // clamped to 0..1 (what LabA16 stores), alpha too (NaN alpha to 0). labaf_to_rgbauf: alpha passes through.
 //
 // The constants are the closed-form values rounded to float, each checked against its derivation
