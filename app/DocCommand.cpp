@@ -1,5 +1,6 @@
-// rastertools doc: layered documents from the command line. Every subcommand that changes a document loads
-// it, changes it in memory and writes it back atomically, so an error leaves the file as it was.
+// rastertools doc: layered documents from the command line. Every subcommand that changes a document locks
+// it, loads it, changes it in memory and writes it back atomically before letting go, so an error leaves the
+// file as it was and concurrent commands on one document each see the others' changes.
 
 #include "app/FilterArguments.h"
 #include "app/Options.h"
@@ -10,9 +11,12 @@
 #include "host/document/PixelEffect.h"
 #include "host/document/TileRenderer.h"
 #include "host/io/ImageIO.h"
+#include "host/kernel/AtomicFile.h"
 #include "host/raster/device/Hardware.h"
 #include "pipeline/RenderJob.h"
 
+#include <chrono>
+#include <cmath>
 #include <cstdlib>
 #include <filesystem>
 #include <iostream>
@@ -23,7 +27,7 @@ namespace App {
 namespace {
 
 constexpr std::string_view kDocUsage =
-    "usage: rastertools doc new IMAGE -o DOC [--format F]\n"
+    "usage: rastertools doc new IMAGE -o DOC [--format F] [--force]\n"
     "       rastertools doc filter DOC FILTER [--PARAM VALUE]... [--live]\n"
     "       rastertools doc render DOC OUTPUT [--format F] [--device D] [--tile N] [--threads N]\n"
     "       rastertools doc show DOC\n"
@@ -33,15 +37,18 @@ struct DocArguments {
     std::vector<std::string> positional;
     std::vector<std::pair<std::string, std::string>> options; // --name value, in order
     bool live = false;
+    bool force = false;
 };
 
-// Splits arguments into positional ones and `--name value` pairs; only `--live` stands alone.
+// Splits arguments into positional ones and `--name value` pairs; only `--live` and `--force` stand alone.
 DocArguments SplitArguments(const std::vector<std::string>& args) {
     DocArguments result;
     for (std::size_t i = 0; i < args.size(); ++i) {
         const std::string& arg = args[i];
         if (arg == "--live") {
             result.live = true;
+        } else if (arg == "--force") {
+            result.force = true;
         } else if (arg.starts_with("--") || arg == "-o") {
             if (i + 1 >= args.size()) throw UsageError(arg + " needs a value");
             result.options.emplace_back(arg == "-o" ? "o" : arg.substr(2), args[++i]);
@@ -68,6 +75,7 @@ std::map<std::string, std::string> TakeOptions(const DocArguments& arguments, co
             throw UsageError((name == "o" ? "-o" : "--" + name) + " is given more than once");
     }
     if (arguments.live) throw UsageError("--live belongs to doc filter");
+    if (arguments.force && subcommand != "new") throw UsageError("--force belongs to doc new");
     return values;
 }
 
@@ -92,6 +100,26 @@ void SaveDocument(const Document& document, const std::string& path) {
     if (auto error = DocumentFile::Save(document, path)) throw Error(*error);
 }
 
+// How long a command waits for another one working on the same document: RASTERTOOLS_LOCK_TIMEOUT seconds,
+// else 10.
+std::chrono::milliseconds LockTimeout() {
+    const char* text = std::getenv("RASTERTOOLS_LOCK_TIMEOUT");
+    if (!text || !*text) return std::chrono::seconds(10);
+    char* end = nullptr;
+    const double seconds = std::strtod(text, &end);
+    if (*end != '\0' || !std::isfinite(seconds) || seconds < 0 || seconds > 86400)
+        throw UsageError(std::string("RASTERTOOLS_LOCK_TIMEOUT: \"") + text +
+                         "\" is not a number of seconds (0 .. 86400)");
+    return std::chrono::milliseconds(std::llround(seconds * 1000));
+}
+
+// Holds the document against other commands from before it is read until it has been written back.
+Kernel::FileLock LockDocument(const std::string& path) {
+    Kernel::FileLock lock;
+    if (auto busy = lock.Acquire(path, LockTimeout(), false)) throw Error(*busy);
+    return lock;
+}
+
 // "copy format=-1 scale=1,1", or the command's description for commands the library does not know.
 std::string DescribeFilterCommand(const Command& command) {
     const RasterTools::FilterInfo* info = RasterTools::FindFilterOf(command);
@@ -107,10 +135,17 @@ std::string DescribeSize(const Raster::DynamicBuffer& image) {
 
 int RunNew(const DocArguments& arguments) {
     const auto options = TakeOptions(arguments, "new", {"o", "format"});
-    RequirePositional(arguments, 1, "new IMAGE -o DOC [--format F]");
+    RequirePositional(arguments, 1, "new IMAGE -o DOC [--format F] [--force]");
     if (!options.contains("o")) throw UsageError("doc new needs the document to write: -o DOC");
     const std::string& input = arguments.positional[0];
     const std::string& output = options.at("o");
+    const Kernel::FileLock lock = LockDocument(output);
+    // Replacing a document is what new is for; replacing anything else (the picture itself, say) is asked
+    // for.
+    std::error_code error;
+    if (std::filesystem::exists(output, error) && !arguments.force && !DocumentFile::IsDocument(output))
+        throw Error(output +
+                    ": exists and is not a RasterTools document; not replaced (--force replaces it)");
 
     IO::ReadResult read = IO::ReadImage(input);
     if (!read) throw Error(read.error);
@@ -149,8 +184,10 @@ int RunFilter(const DocArguments& arguments) {
     const auto values = ParseFilterParameters(filter, arguments.options);
     const auto command = filter.makeCommand(arguments.live, values);
     if (!command) throw Error(std::string(filter.name) + ": the command could not be made");
+    const Kernel::FileLock lock = LockDocument(path);
     auto document = LoadDocument(path);
 
+    if (arguments.force) throw UsageError("--force belongs to doc new");
     if (arguments.live) {
         auto live = Kernel::CountedCast<RasterDevicePreviewableFilterLayerCommand>(command);
         if (!live) throw Error(std::string(filter.name) + " cannot be the filter of a live filter layer");
@@ -173,6 +210,7 @@ int RunFilter(const DocArguments& arguments) {
     ProgressBar progress(std::string(filter.name));
     PixelEffectOptions options;
     options.progress = progress.Callback();
+    const std::size_t droppedBefore = document->GetDroppedHistoryCount();
     const auto error = ApplyPixelCommand(*document, command, options);
     progress.Finish();
     if (error) throw Error(path + ": " + *error);
@@ -183,6 +221,9 @@ int RunFilter(const DocArguments& arguments) {
     for (const auto& patch : entry.patches)
         std::cout << "; layer \"" << patch.layer->GetName() << "\" " << patch.rect.Width() << "x"
                   << patch.rect.Height() << " at " << patch.rect.left << "," << patch.rect.top;
+    if (const std::size_t dropped = document->GetDroppedHistoryCount() - droppedBefore)
+        std::cout << "; history reached its memory budget: " << dropped << " oldest "
+                  << (dropped == 1 ? "entry" : "entries") << " dropped";
     std::cout << '\n';
     return 0;
 }
@@ -270,7 +311,11 @@ int RunShow(const DocArguments& arguments) {
     }
     const auto& history = document->GetHistory();
     std::cout << "history: " << history.size() << " entries, "
-              << history.size() - document->GetHistoryCursor() << " undone\n";
+              << history.size() - document->GetHistoryCursor() << " undone";
+    if (const std::size_t dropped = document->GetDroppedHistoryCount())
+        std::cout << "; " << dropped << " older " << (dropped == 1 ? "entry was" : "entries were")
+                  << " dropped to keep history within its memory budget";
+    std::cout << '\n';
     for (std::size_t i = 0; i < history.size(); ++i) {
         const auto& entry = history[i];
         std::cout << "  " << i + 1 << ". " << (i < document->GetHistoryCursor() ? "" : "(undone) ")
@@ -300,6 +345,7 @@ int RunUndoRedo(const DocArguments& arguments, bool undo) {
     TakeOptions(arguments, verb, {});
     RequirePositional(arguments, 1, verb + " DOC");
     const std::string& path = arguments.positional[0];
+    const Kernel::FileLock lock = LockDocument(path);
     auto document = LoadDocument(path);
     if (!(undo ? document->Undo() : document->Redo())) throw Error(path + ": nothing to " + verb);
     SaveDocument(*document, path);

@@ -113,11 +113,58 @@ void Document::PushHistory(HistoryEntry entry) {
     Apply(*this, entry, true);
     m_History.push_back(std::move(entry));
     m_Cursor = m_History.size();
+    TrimHistory();
 }
 
-void Document::RestoreHistory(std::vector<HistoryEntry> entries, std::size_t cursor) {
+void Document::RestoreHistory(std::vector<HistoryEntry> entries, std::size_t cursor, std::size_t dropped) {
     m_History = std::move(entries);
     m_Cursor = std::min(cursor, m_History.size());
+    m_DroppedHistory = dropped;
+    TrimHistory();
+}
+
+namespace {
+std::atomic<std::size_t> g_DefaultHistoryBudget{Document::kDefaultHistoryBudget};
+
+std::size_t EntryBytes(const HistoryEntry& entry) {
+    std::size_t bytes = 0;
+    for (const auto& patch : entry.patches)
+        if (patch.pixels) bytes += patch.pixels->GetStorageBytes();
+    return bytes;
+}
+} // namespace
+
+void Document::SetDefaultHistoryBudget(std::size_t bytes) noexcept {
+    g_DefaultHistoryBudget = bytes;
+}
+
+std::size_t Document::GetDefaultHistoryBudget() noexcept {
+    return g_DefaultHistoryBudget;
+}
+
+void Document::SetHistoryBudget(std::size_t bytes) {
+    m_HistoryBudget = bytes;
+    TrimHistory();
+}
+
+std::size_t Document::GetHistoryBytes() const noexcept {
+    std::size_t bytes = 0;
+    for (const auto& entry : m_History)
+        bytes += EntryBytes(entry);
+    return bytes;
+}
+
+void Document::TrimHistory() {
+    std::size_t bytes = GetHistoryBytes();
+    std::size_t drop = 0;
+    // Only done entries go, oldest first: what is left still undoes back to the state after the last one
+    // dropped, and redoes as before.
+    while (bytes > m_HistoryBudget && drop < m_Cursor && m_History.size() - drop > 1)
+        bytes -= EntryBytes(m_History[drop++]);
+    if (drop == 0) return;
+    m_History.erase(m_History.begin(), m_History.begin() + std::ptrdiff_t(drop));
+    m_Cursor -= drop;
+    m_DroppedHistory += drop;
 }
 
 bool Document::Undo() {

@@ -120,11 +120,25 @@ public:
     // Drops the undone entries, applies entry and appends it. A PixelChange's patches must hold the new
     // pixels: applying swaps them with the layer's.
     void PushHistory(HistoryEntry entry);
-    // Replaces the whole history, entries before cursor counted as done (used when loading; nothing is
-    // applied).
-    void RestoreHistory(std::vector<HistoryEntry> entries, std::size_t cursor);
+    // Replaces the whole history, entries before cursor counted as done, dropped the number of older entries
+    // that were dropped before it (used when loading; nothing is applied).
+    void RestoreHistory(std::vector<HistoryEntry> entries, std::size_t cursor, std::size_t dropped = 0);
     bool Undo();
     bool Redo();
+
+    // History keeps the pixels that undo needs within a memory budget: once the pixels of its entries take
+    // more bytes than the budget, the oldest done entries are dropped (the newest entry always stays).
+    static constexpr std::size_t kDefaultHistoryBudget = std::size_t(256) << 20;
+    // The budget of documents made from now on.
+    static void SetDefaultHistoryBudget(std::size_t bytes) noexcept;
+    static std::size_t GetDefaultHistoryBudget() noexcept;
+    // Sets this document's budget and drops entries at once if history is over it.
+    void SetHistoryBudget(std::size_t bytes);
+    std::size_t GetHistoryBudget() const noexcept { return m_HistoryBudget; }
+    // The bytes of pixels the history entries hold.
+    std::size_t GetHistoryBytes() const noexcept;
+    // How many of the oldest entries were dropped to stay within the budget, over the document's life.
+    std::size_t GetDroppedHistoryCount() const noexcept { return m_DroppedHistory; }
 
     // The transient command shown over the document, not kept in history.
     const Kernel::Counted<Command>& GetPreview() const noexcept { return m_Preview; }
@@ -139,10 +153,14 @@ public:
     }
 
 private:
+    void TrimHistory();
+
     NodeList m_Layers;
     NodeList m_Selection;
     std::vector<HistoryEntry> m_History;
     std::size_t m_Cursor = 0;
+    std::size_t m_HistoryBudget = GetDefaultHistoryBudget();
+    std::size_t m_DroppedHistory = 0;
     Kernel::Counted<Command> m_Preview;
     Kernel::Counted<SelectionRasterNode> m_PixelSelection;
 };

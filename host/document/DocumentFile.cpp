@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <array>
 #include <cstring>
+#include <fstream>
 #include <limits>
 
 namespace DocumentFile {
@@ -16,7 +17,9 @@ namespace {
 
 constexpr std::array<char, 8> kMagic = {'R', 'T', 'D', 'O', 'C', '\r', '\n', '\x1a'};
 // 2: raster layers with their pixels and placement, pixel patches in history, the pixel selection.
-constexpr std::uint32_t kVersion = 2;
+// 3: the number of history entries dropped to keep history within its memory budget. Version 2 is still read.
+constexpr std::uint32_t kVersion = 3;
+constexpr std::uint32_t kOldestReadableVersion = 2;
 constexpr int kCompressionLevel = 3;
 constexpr std::uint32_t kNoLayer = std::numeric_limits<std::uint32_t>::max();
 
@@ -251,6 +254,7 @@ std::vector<std::byte> Encode(const Document& document, std::string* error) {
 
     out.Value(std::uint32_t(document.GetHistory().size()));
     out.Value(std::uint32_t(document.GetHistoryCursor()));
+    out.Value(std::uint64_t(document.GetDroppedHistoryCount()));
     for (const auto& entry : document.GetHistory()) {
         const auto* serialisable = dynamic_cast<const Kernel::Serialisable*>(entry.command.Get());
         if (!serialisable) return fail("a history entry holds a command that cannot be saved");
@@ -288,14 +292,14 @@ std::optional<std::string> Decode(std::span<const std::byte> bytes, Kernel::Coun
     Reader in(body.subspan(kMagic.size()));
     std::uint32_t version = 0;
     in.Value(version);
-    if (version < kVersion)
+    const std::string readable = " (this program reads versions " + std::to_string(kOldestReadableVersion) +
+                                 " to " + std::to_string(kVersion) + ")";
+    if (version < kOldestReadableVersion)
         return "document version " + std::to_string(version) +
-               " is from an older rastertools and cannot be read (this program reads version " +
-               std::to_string(kVersion) + ")";
+               " is from an older rastertools and cannot be read" + readable;
     if (version > kVersion)
         return "document version " + std::to_string(version) +
-               " is from a newer rastertools and cannot be read (this program reads version " +
-               std::to_string(kVersion) + ")";
+               " is from a newer rastertools and cannot be read" + readable;
     if (Checksum(body) != stored) return "the document is damaged (checksum mismatch)";
 
     const auto damaged = [](const std::string& what) { return "the document is damaged (" + what + ")"; };
@@ -354,8 +358,9 @@ std::optional<std::string> Decode(std::span<const std::byte> bytes, Kernel::Coun
     }
 
     std::uint32_t historyCount = 0, cursor = 0;
+    std::uint64_t dropped = 0;
     if (!in.Value(historyCount) || !in.Value(cursor) || cursor > historyCount ||
-        !in.CanHold(historyCount, 21))
+        (version >= 3 && !in.Value(dropped)) || !in.CanHold(historyCount, 21))
         return damaged("history");
     std::vector<HistoryEntry> history;
     for (std::uint32_t i = 0; i < historyCount; ++i) {
@@ -416,9 +421,17 @@ std::optional<std::string> Decode(std::span<const std::byte> bytes, Kernel::Coun
         history.push_back(std::move(entry));
     }
     if (!in.AtEnd()) return damaged("unexpected data at the end");
-    document->RestoreHistory(std::move(history), cursor);
+    document->RestoreHistory(std::move(history), cursor, std::size_t(dropped));
     result = std::move(document);
     return std::nullopt;
+}
+
+bool IsDocument(const std::filesystem::path& path) {
+    std::error_code error;
+    if (!std::filesystem::is_regular_file(path, error)) return false;
+    std::ifstream in(path, std::ios::binary);
+    std::array<char, kMagic.size()> start{};
+    return in.read(start.data(), std::streamsize(start.size())) && start == kMagic;
 }
 
 std::optional<std::string> Save(const Document& document, const std::filesystem::path& path) {

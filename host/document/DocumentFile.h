@@ -20,6 +20,9 @@ std::optional<std::string> Save(const Document& document, const std::filesystem:
 // allocated beyond what the file's own size can hold.
 std::optional<std::string> Load(const std::filesystem::path& path, Kernel::Counted<Document>& document);
 
+// Whether path is a regular file that starts as a document does (it may still be damaged).
+bool IsDocument(const std::filesystem::path& path);
+
 // The same from and to memory, for tests and fuzzing.
 std::vector<std::byte> Encode(const Document& document, std::string* error = nullptr);
 std::optional<std::string> Decode(std::span<const std::byte> bytes, Kernel::Counted<Document>& document);

@@ -15,7 +15,8 @@ public:
 
     // Uses the file given, else RASTERTOOLS_SETTINGS, else $XDG_CONFIG_HOME (or
     // ~/.config)/rastertools/settings.json. Loading happens on first use; an unreadable file is kept aside as
-    // FILE.bad and the store starts empty.
+    // FILE.bad (FILE.bad.1, ... when that is taken) and the store starts empty; a folder or device is left
+    // where it is.
     void SetFile(std::filesystem::path file);
     std::filesystem::path GetFile() const;
     static std::filesystem::path DefaultFile();
@@ -23,8 +24,9 @@ public:
     double GetDoubleForKey(const std::string& key, double fallback);
     bool GetBoolForKey(const std::string& key, bool fallback);
     int GetIntForKey(const std::string& key, int fallback);
-    // Each set writes the whole file atomically; a write that fails keeps the value in memory and
-    // reports through GetLastError().
+    // Each set writes the whole file atomically, holding FILE.lock meanwhile and merging the key into what
+    // the file holds then, so that commits from other processes are kept. A write that fails keeps the value
+    // in memory (the next set tries it again) and reports through GetLastError().
     void SetDoubleForKey(const std::string& key, double value);
     void SetBoolForKey(const std::string& key, bool value);
     void SetIntForKey(const std::string& key, int value);

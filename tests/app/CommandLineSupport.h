@@ -36,10 +36,11 @@ protected:
         return path;
     }
 
-    Result Run(const std::string& arguments) {
+    // environment: NAME=VALUE words set for this run only.
+    Result Run(const std::string& arguments, const std::string& environment = "") {
         const std::string command = "cd '" + m_Folder.string() + "' && RASTERTOOLS_SETTINGS='" +
-                                    (m_Folder / "settings.json").string() + "' '" RASTERTOOLS_PROGRAM "' " +
-                                    arguments + " 2>&1";
+                                    (m_Folder / "settings.json").string() + "' " + environment +
+                                    " '" RASTERTOOLS_PROGRAM "' " + arguments + " 2>&1";
         Result result;
         FILE* pipe = ::popen(command.c_str(), "r");
         if (!pipe) return result;

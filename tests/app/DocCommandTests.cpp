@@ -5,7 +5,12 @@
 #include "host/io/ImageIO.h"
 #include "tests/app/CommandLineSupport.h"
 
+#include <csignal>
 #include <cstring>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <thread>
+#include <vector>
 
 using namespace AppTests;
 
@@ -201,4 +206,182 @@ TEST_F(DocCommand, SavedNoiseRendersAsApplyingItDoes) {
     ASSERT_EQ(Run("doc filter destructive.rtd addnoise --intensity 0.5 --gaussian false").exitCode, 0);
     ASSERT_EQ(Run("doc render destructive.rtd destructive.png").exitCode, 0);
     EXPECT_EQ(Pixels(m_Folder / "destructive.png"), Pixels(m_Folder / "direct.png"));
+}
+
+// Commands changing one document at the same time each lock it from reading to writing: every edit is in
+// the history afterwards.
+TEST_F(DocCommand, ConcurrentEditsOfOneDocumentAreAllKept) {
+    ASSERT_EQ(Run("doc new in.png -o d.rtd").exitCode, 0);
+    constexpr int kCommands = 6;
+    std::vector<Result> results(kCommands);
+    std::vector<std::thread> threads;
+    for (int i = 0; i < kCommands; ++i)
+        threads.emplace_back([&, i] {
+            results[std::size_t(i)] =
+                Run(i % 2 ? "doc filter d.rtd copy --live" : "doc filter d.rtd " + kFilter,
+                    "RASTERTOOLS_LOCK_TIMEOUT=120 RASTERTOOLS_DEVICE=cpu");
+        });
+    for (auto& thread : threads)
+        thread.join();
+    for (const auto& result : results)
+        EXPECT_EQ(result.exitCode, 0) << result.output;
+    const Result shown = Run("doc show d.rtd");
+    EXPECT_TRUE(Contains(shown.output, "d.rtd: 4 layers")) << shown.output;
+    EXPECT_TRUE(Contains(shown.output, "history: 6 entries, 0 undone\n")) << shown.output;
+}
+
+// A document another command holds is waited for, then refused with a message; it is left as it was.
+TEST_F(DocCommand, ADocumentInUseIsRefusedAfterTheWait) {
+    ASSERT_EQ(Run("doc new in.png -o d.rtd").exitCode, 0);
+    const std::string saved = ReadBytes(m_Folder / "d.rtd");
+    Kernel::FileLock held;
+    ASSERT_FALSE(held.Acquire(m_Folder / "d.rtd", std::chrono::milliseconds(0), false));
+    for (const std::string& arguments : {"doc filter d.rtd " + kFilter, std::string("doc undo d.rtd"),
+                                        std::string("doc new in.png -o d.rtd")}) {
+        const Result result = Run(arguments, "RASTERTOOLS_LOCK_TIMEOUT=0.2");
+        EXPECT_EQ(result.exitCode, 1) << arguments;
+        EXPECT_TRUE(Contains(result.output, "d.rtd: is in use by another process (still locked after 0.2 s)"))
+            << arguments << ": " << result.output;
+        EXPECT_EQ(ReadBytes(m_Folder / "d.rtd"), saved) << arguments;
+    }
+    // Reading needs no lock.
+    EXPECT_EQ(Run("doc show d.rtd").exitCode, 0);
+    held.Release();
+    EXPECT_EQ(Run("doc filter d.rtd " + kFilter).exitCode, 0);
+    const Result bad = Run("doc show d.rtd", "RASTERTOOLS_LOCK_TIMEOUT=soon");
+    EXPECT_EQ(bad.exitCode, 0) << "only commands that change a document wait";
+    const Result refused = Run("doc undo d.rtd", "RASTERTOOLS_LOCK_TIMEOUT=soon");
+    EXPECT_EQ(refused.exitCode, 2);
+    EXPECT_TRUE(Contains(refused.output, "RASTERTOOLS_LOCK_TIMEOUT: \"soon\" is not a number of seconds"))
+        << refused.output;
+}
+
+// doc new replaces a document but nothing else unless told to.
+TEST_F(DocCommand, NewReplacesOnlyDocumentsUnlessForced) {
+    const std::string picture = ReadBytes(m_Folder / "in.png");
+    Result result = Run("doc new in.png -o in.png");
+    EXPECT_EQ(result.exitCode, 1);
+    EXPECT_TRUE(Contains(result.output, "in.png: exists and is not a RasterTools document; not replaced "
+                                        "(--force replaces it)"))
+        << result.output;
+    EXPECT_EQ(ReadBytes(m_Folder / "in.png"), picture);
+    std::filesystem::create_directory(m_Folder / "folder.rtd");
+    result = Run("doc new in.png -o folder.rtd");
+    EXPECT_EQ(result.exitCode, 1);
+    EXPECT_TRUE(Contains(result.output, "folder.rtd: exists and is not a RasterTools document"))
+        << result.output;
+
+    ASSERT_EQ(Run("doc new in.png -o d.rtd").exitCode, 0);
+    ASSERT_EQ(Run("doc filter d.rtd " + kFilter).exitCode, 0);
+    ASSERT_EQ(Run("doc new in.png -o d.rtd").exitCode, 0) << "a document is replaced without --force";
+    EXPECT_TRUE(Contains(Run("doc show d.rtd").output, "history: 0 entries")) << Run("doc show d.rtd").output;
+
+    result = Run("doc new in.png -o in.png --force");
+    ASSERT_EQ(result.exitCode, 0) << result.output;
+    EXPECT_TRUE(Contains(Run("doc show in.png").output, "in.png: 1 layers"));
+    result = Run("doc show d.rtd --force");
+    EXPECT_EQ(result.exitCode, 2);
+    EXPECT_TRUE(Contains(result.output, "--force belongs to doc new")) << result.output;
+}
+
+// Saving keeps the document's permissions; a folder given as a document is named as one.
+TEST_F(DocCommand, FilesKeepTheirPermissionsAndFoldersAreNamed) {
+    ASSERT_EQ(Run("doc new in.png -o d.rtd").exitCode, 0);
+    ASSERT_EQ(::chmod((m_Folder / "d.rtd").c_str(), 0600), 0);
+    ASSERT_EQ(Run("doc filter d.rtd " + kFilter).exitCode, 0);
+    ASSERT_EQ(Run("doc undo d.rtd").exitCode, 0);
+    struct stat info {};
+    ASSERT_EQ(::stat((m_Folder / "d.rtd").c_str(), &info), 0);
+    EXPECT_EQ(info.st_mode & 07777, 0600u);
+
+    std::filesystem::create_directory(m_Folder / "folder.rtd");
+    for (const std::string& arguments :
+         {std::string("doc show folder.rtd"), "doc filter folder.rtd " + kFilter}) {
+        const Result result = Run(arguments);
+        EXPECT_EQ(result.exitCode, 1) << arguments;
+        EXPECT_TRUE(Contains(result.output, "folder.rtd: is a folder, not a file")) << result.output;
+        EXPECT_TRUE(std::filesystem::is_directory(m_Folder / "folder.rtd"));
+    }
+}
+
+// History keeps its undo pixels within a budget; doc show and doc filter say when older entries went.
+TEST_F(DocCommand, HistoryStaysWithinItsBudget) {
+    ASSERT_EQ(Run("doc new in.png -o d.rtd").exitCode, 0);
+    // Each entry holds the 8 × 6 RGBA8 layer's pixels, 384 bytes with rows padded to 64: two fit in 800,
+    // three do not.
+    const std::string budget = "RASTERTOOLS_HISTORY_BUDGET=800";
+    ASSERT_EQ(Run("doc filter d.rtd " + kFilter, budget).exitCode, 0);
+    ASSERT_EQ(Run("doc filter d.rtd " + kFilter, budget).exitCode, 0);
+    Result result = Run("doc filter d.rtd " + kFilter, budget);
+    ASSERT_EQ(result.exitCode, 0) << result.output;
+    EXPECT_TRUE(Contains(result.output, "; history reached its memory budget: 1 oldest entry dropped"))
+        << result.output;
+    ASSERT_EQ(Run("doc filter d.rtd " + kFilter, budget).exitCode, 0);
+    result = Run("doc show d.rtd", budget);
+    EXPECT_TRUE(Contains(result.output, "history: 2 entries, 0 undone; 2 older entries were dropped to keep "
+                                        "history within its memory budget\n"))
+        << result.output;
+    // The default budget keeps them all; a budget that is no size is refused.
+    ASSERT_EQ(Run("doc new in.png -o e.rtd").exitCode, 0);
+    for (int i = 0; i < 4; ++i)
+        ASSERT_EQ(Run("doc filter e.rtd " + kFilter).exitCode, 0);
+    EXPECT_TRUE(Contains(Run("doc show e.rtd").output, "history: 4 entries, 0 undone\n"));
+    result = Run("doc show e.rtd", "RASTERTOOLS_HISTORY_BUDGET=lots");
+    EXPECT_EQ(result.exitCode, 2);
+    EXPECT_TRUE(Contains(result.output, "RASTERTOOLS_HISTORY_BUDGET: \"lots\" is not a number of bytes"))
+        << result.output;
+}
+
+// rastertools interrupted while it writes a document removes its temporary file and ends by the signal; the
+// document is not created.
+TEST_F(DocCommand, AnInterruptedWriteLeavesNoTemporaryFile) {
+    // Random bytes do not compress, so writing the document takes a while.
+    auto image = Raster::DynamicBuffer::Create(2048, 2048, Raster::PixelFormat::RGBA8);
+    std::uint64_t state = 0x9e3779b97f4a7c15ull;
+    for (int y = 0; y < image->GetHeight(); ++y)
+        for (std::size_t x = 0; x < image->GetRowBytes(); x += 8) {
+            state ^= state << 13, state ^= state >> 7, state ^= state << 17;
+            std::memcpy(image->RowBytes(y) + x, &state, 8);
+        }
+    ASSERT_TRUE(IO::WriteImage(m_Folder / "big.tif", *image));
+    const auto temporaries = [&](pid_t writer) {
+        int count = 0;
+        const std::string prefix = ".d.rtd." + std::to_string(writer) + ".";
+        for (const auto& entry : std::filesystem::directory_iterator(m_Folder))
+            count += entry.path().filename().string().starts_with(prefix);
+        return count;
+    };
+    bool caught = false;
+    for (int attempt = 0; attempt < 5 && !caught; ++attempt) {
+        std::filesystem::remove(m_Folder / "d.rtd");
+        const pid_t child = ::fork();
+        ASSERT_GE(child, 0);
+        if (child == 0) {
+            if (::chdir(m_Folder.c_str()) != 0) ::_exit(126);
+            ::setenv("RASTERTOOLS_SETTINGS", (m_Folder / "settings.json").c_str(), 1);
+            const int null = ::open("/dev/null", O_WRONLY);
+            ::dup2(null, 1), ::dup2(null, 2);
+            ::execl(RASTERTOOLS_PROGRAM, RASTERTOOLS_PROGRAM, "doc", "new", "big.tif", "-o", "d.rtd",
+                    nullptr);
+            ::_exit(127);
+        }
+        const int signal = attempt % 2 ? SIGINT : SIGTERM;
+        int status = 0;
+        for (;;) {
+            if (::waitpid(child, &status, WNOHANG) == child) break; // finished before it could be caught
+            if (temporaries(child) > 0) {
+                caught = true;
+                ::kill(child, signal);
+                ASSERT_EQ(::waitpid(child, &status, 0), child);
+                break;
+            }
+            std::this_thread::sleep_for(std::chrono::microseconds(200));
+        }
+        if (!caught) continue;
+        ASSERT_TRUE(WIFSIGNALED(status)) << "status " << status;
+        EXPECT_EQ(WTERMSIG(status), signal);
+        EXPECT_EQ(temporaries(child), 0);
+        EXPECT_FALSE(std::filesystem::exists(m_Folder / "d.rtd"));
+    }
+    EXPECT_TRUE(caught) << "every write finished before it could be interrupted";
 }

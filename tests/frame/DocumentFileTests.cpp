@@ -126,9 +126,10 @@ TEST_F(DocumentFiles, HostileCountsWithAValidChecksumAreRefused) {
     std::memcpy(future.data() + 8, &version, 4);
     Reseal(future);
     Kernel::Counted<Document> loaded;
-    EXPECT_EQ(
-        DocumentFile::Decode(future, loaded).value_or(""),
-        "document version 99 is from a newer rastertools and cannot be read (this program reads version 2)");
+    EXPECT_EQ(DocumentFile::Decode(future, loaded).value_or(""),
+              "document version 99 is from a newer rastertools and cannot be read (this program reads "
+              "versions 2 to "
+              "3)");
 }
 
 TEST_F(DocumentFiles, AFailedLoadLeavesTheFileAndAFailedSaveLeavesTheOldFile) {

@@ -1,10 +1,13 @@
-// The settings store: typed values survive a reload, bad files are kept aside, failed writes are reported.
+// The settings store: typed values survive a reload, bad files are kept aside (each of them), hostile files
+// are refused, failed writes are reported, concurrent commits from several processes keep every key.
 
 #include "host/document/VeyraController.h"
 #include "host/kernel/AtomicFile.h"
 
 #include <fstream>
 #include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 namespace {
@@ -83,6 +86,113 @@ TEST_F(SettingsStore, AFailedWriteIsReportedAndTheValueKeptInMemory) {
     std::string untouched;
     ASSERT_FALSE(Kernel::ReadWholeFile(m_Folder / "plain-file", untouched, 100));
     EXPECT_EQ(untouched, "not a folder");
+}
+
+// A file of deeply nested arrays, alone or as a value, is refused before it is parsed and kept aside like any
+// unreadable file; a commit then writes a sound file.
+TEST_F(SettingsStore, DeepNestingIsRefusedAndKeptAside) {
+    std::filesystem::create_directories(m_File.parent_path());
+    const std::string arrays = std::string(100000, '[') + std::string(100000, ']');
+    auto& store = VeyraController::GetInstance();
+    for (const std::string& nested : {arrays, R"({"tools.x.n": )" + arrays + "}"}) {
+        std::filesystem::remove(m_File.string() + ".bad");
+        ASSERT_FALSE(Kernel::WriteFileAtomically(m_File, nested));
+        store.SetFile(m_File);
+        EXPECT_EQ(store.GetDoubleForKey("tools.x.d", 9), 9);
+        ASSERT_TRUE(store.GetLastError());
+        EXPECT_NE(store.GetLastError()->find("nested deeper than 8 levels"), std::string::npos)
+            << *store.GetLastError();
+        std::string kept;
+        ASSERT_FALSE(Kernel::ReadWholeFile(m_File.string() + ".bad", kept, 1 << 20));
+        EXPECT_EQ(kept, nested);
+        store.SetDoubleForKey("tools.x.d", 0.5);
+        EXPECT_FALSE(store.GetLastError());
+        store.SetFile(m_File);
+        EXPECT_EQ(store.GetDoubleForKey("tools.x.d", 0), 0.5);
+        EXPECT_EQ(store.GetEntries("tools.").size(), 1u);
+    }
+    // Shallow nesting inside strings or values is no reason to refuse a file.
+    ASSERT_FALSE(
+        Kernel::WriteFileAtomically(m_File, std::string_view(R"({"tools.x.d": 2, "s": "[[[[[[[[[[[["})")));
+    store.SetFile(m_File);
+    EXPECT_EQ(store.GetDoubleForKey("tools.x.d", 0), 2);
+}
+
+// Every unreadable file is kept: a second one does not replace the first copy.
+TEST_F(SettingsStore, EachUnreadableFileGetsItsOwnCopy) {
+    std::filesystem::create_directories(m_File.parent_path());
+    auto& store = VeyraController::GetInstance();
+    const std::string damaged[] = {"first {", "second {", "third {"};
+    for (const auto& text : damaged) {
+        ASSERT_FALSE(Kernel::WriteFileAtomically(m_File, text));
+        store.SetFile(m_File);
+        EXPECT_EQ(store.GetIntForKey("tools.x.i", 4), 4);
+    }
+    const std::string names[] = {".bad", ".bad.1", ".bad.2"};
+    for (int i = 0; i < 3; ++i) {
+        std::string kept;
+        ASSERT_FALSE(Kernel::ReadWholeFile(m_File.string() + names[i], kept, 100)) << names[i];
+        EXPECT_EQ(kept, damaged[i]);
+    }
+    EXPECT_NE(store.GetLastError()->find("kept as " + m_File.string() + ".bad.2"), std::string::npos)
+        << *store.GetLastError();
+}
+
+// A folder where the file should be is reported as such, never set aside, and never written over.
+TEST_F(SettingsStore, AFolderInPlaceOfTheFileIsReportedAndLeft) {
+    std::filesystem::create_directories(m_File / "inside");
+    auto& store = VeyraController::GetInstance();
+    EXPECT_EQ(store.GetDoubleForKey("tools.x.d", 3), 3);
+    ASSERT_TRUE(store.GetLastError());
+    EXPECT_EQ(*store.GetLastError(), m_File.string() + ": is a folder, not a file");
+    store.SetDoubleForKey("tools.x.d", 1);
+    ASSERT_TRUE(store.GetLastError());
+    EXPECT_EQ(*store.GetLastError(), m_File.string() + ": is a folder, not a file");
+    EXPECT_EQ(store.GetDoubleForKey("tools.x.d", 3), 1) << "the value is kept in memory";
+    EXPECT_TRUE(std::filesystem::is_directory(m_File / "inside"));
+    EXPECT_FALSE(std::filesystem::exists(m_File.string() + ".bad"));
+}
+
+TEST_F(SettingsStore, ACommitKeepsTheFilesPermissions) {
+    auto& store = VeyraController::GetInstance();
+    store.SetIntForKey("tools.x.i", 1);
+    ASSERT_EQ(::chmod(m_File.c_str(), 0600), 0);
+    store.SetIntForKey("tools.x.i", 2);
+    struct stat info {};
+    ASSERT_EQ(::stat(m_File.c_str(), &info), 0);
+    EXPECT_EQ(info.st_mode & 07777, 0600u);
+}
+
+// Processes committing at the same time each merge their key into what the file holds under its lock: no
+// key is lost.
+TEST_F(SettingsStore, ConcurrentCommitsFromProcessesKeepEveryKey) {
+    constexpr int kProcesses = 4, kKeys = 20;
+    std::vector<pid_t> children;
+    for (int p = 0; p < kProcesses; ++p) {
+        const pid_t child = ::fork();
+        ASSERT_GE(child, 0);
+        if (child == 0) {
+            auto& store = VeyraController::GetInstance();
+            store.SetFile(m_File);
+            for (int k = 0; k < kKeys; ++k) {
+                store.SetIntForKey("tools.p" + std::to_string(p) + ".k" + std::to_string(k), k);
+                if (store.GetLastError()) ::_exit(2);
+            }
+            ::_exit(0);
+        }
+        children.push_back(child);
+    }
+    for (const pid_t child : children) {
+        int status = 0;
+        ASSERT_EQ(::waitpid(child, &status, 0), child);
+        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
+    }
+    auto& store = VeyraController::GetInstance();
+    store.SetFile(m_File);
+    EXPECT_EQ(store.GetEntries("tools.p").size(), std::size_t(kProcesses * kKeys));
+    for (int p = 0; p < kProcesses; ++p)
+        for (int k = 0; k < kKeys; ++k)
+            EXPECT_EQ(store.GetIntForKey("tools.p" + std::to_string(p) + ".k" + std::to_string(k), -1), k);
 }
 
 TEST(AtomicFile, ReplacesWholeFilesOnly) {
