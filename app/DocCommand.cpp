@@ -184,10 +184,10 @@ int RunFilter(const DocArguments& arguments) {
     const auto values = ParseFilterParameters(filter, arguments.options);
     const auto command = filter.makeCommand(arguments.live, values);
     if (!command) throw Error(std::string(filter.name) + ": the command could not be made");
+    if (arguments.force) throw UsageError("--force belongs to doc new");
     const Kernel::FileLock lock = LockDocument(path);
     auto document = LoadDocument(path);
 
-    if (arguments.force) throw UsageError("--force belongs to doc new");
     if (arguments.live) {
         auto live = Kernel::CountedCast<RasterDevicePreviewableFilterLayerCommand>(command);
         if (!live) throw Error(std::string(filter.name) + " cannot be the filter of a live filter layer");
