@@ -9,10 +9,10 @@
 #include "host/document/DocumentRender.h"
 #include "host/document/VeyraController.h"
 #include "host/io/ImageIO.h"
+#include "host/kernel/AtomicFile.h"
 
 #include <charconv>
 #include <cmath>
-#include <fstream>
 #include <iostream>
 #include <sstream>
 
@@ -344,15 +344,21 @@ void PlayScript(std::istream& in, std::ostream& out, const std::string& name, co
     if (in.bad()) throw Error(name + ": cannot read the script");
 }
 
+// Scripts are typed by people or written by tools; anything larger is not a script.
+constexpr std::size_t kMaxScriptBytes = std::size_t{64} << 20;
+
 int RunPlay(const std::vector<std::string>& args) {
     if (args.size() != 1) throw UsageError("usage: rastertools play SCRIPT (\"-\" reads standard input)");
     const std::string& name = args[0];
-    std::ifstream file;
-    if (name != "-") {
-        file.open(name);
-        if (!file) throw Error(name + ": cannot open the script");
+    if (name == "-") {
+        PlayScript(std::cin, std::cout, name);
+        return 0;
     }
-    PlayScript(name == "-" ? std::cin : file, std::cout, name);
+    // Read whole, so that a folder, a device or a pipe is named as such rather than read as an empty script.
+    std::string text;
+    if (auto error = Kernel::ReadWholeFile(name, text, kMaxScriptBytes)) throw Error(*error);
+    std::istringstream file(text);
+    PlayScript(file, std::cout, name);
     return 0;
 }
 

@@ -84,5 +84,13 @@ TEST_F(CommandLine, BadCommandLinesExitWithUsage) {
     EXPECT_EQ(Run("play").exitCode, 2);
     EXPECT_EQ(Run("list --settings").exitCode, 2);
     EXPECT_EQ(Run("play nowhere.play").exitCode, 1);
+    // A folder or a device given as the script is named for what it is, not read as an empty script.
+    std::filesystem::create_directory(m_Folder / "scripts");
+    const Result folder = Run("play scripts");
+    EXPECT_EQ(folder.exitCode, 1);
+    EXPECT_TRUE(Contains(folder.output, "scripts: is a folder, not a file")) << folder.output;
+    const Result device = Run("play /dev/null");
+    EXPECT_EQ(device.exitCode, 1);
+    EXPECT_TRUE(Contains(device.output, "/dev/null: is not a regular file")) << device.output;
     EXPECT_EQ(Run("--help").exitCode, 0);
 }
