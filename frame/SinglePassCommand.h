@@ -68,7 +68,7 @@ public:
     RenderPath Render(const RenderTarget& target) const override {
         return WithStages(target, [&](auto stages) {
             using Stages = decltype(stages);
-            typename Stages::Params params;
+            typename Stages::Params params{};
             Self().FillStageParams(params, target.bounds, target.transform);
             return RasterTools::Render<Stages>(target, params);
         });
@@ -108,8 +108,3 @@ private:
 
 } // namespace RasterTools
 
-// One layer format's processor renders of a single-pass command (both stage kinds); the build generates one
-// unit per command and format that expands it (see frame/CMakeLists.txt).
-#define RT_INSTANTIATE_SINGLE_PASS(Command, Format)                                                          \
-    RT_INSTANTIATE_PROCESSOR(Command::PlainStages<Raster::PixelFormat::Format>, Format)                      \
-    RT_INSTANTIATE_PROCESSOR(Command::MaskedStages<Raster::PixelFormat::Format>, Format)
