@@ -35,9 +35,8 @@ public:
     using Base::Base;
     bool PrepareOutputRectangle(Kernel::RectT<double>& rect) const override {
         using Derived = typename Filter::Command;
-        const auto& self = static_cast<const Derived&>(*this);
         if constexpr (DeclaresMargin<Derived, typename Filter::Params>)
-            rect = rect.Inflated(Derived::Margin(self.GetParameters()));
+            rect = rect.Inflated(Derived::Margin(static_cast<const Derived&>(*this).GetParameters()));
         return true;
     }
 };
@@ -107,4 +106,3 @@ private:
 };
 
 } // namespace RasterTools
-
