@@ -48,6 +48,8 @@ TEST(CatalogueSimd, PlainAndSimdBuildsGiveTheSameBytesForEveryFilterAndFormat) {
         GTEST_SKIP() << "this processor has no AVX2 (or RASTERTOOLS_NO_SIMD is set): there is only the plain "
                         "build to run";
     const SimdGuard guard;
+    SetSimdEnabled(false);
+    ASSERT_FALSE(HasAvx2()) << "the switch must turn the AVX2 builds off";
     for (const auto& filter : GetFilterCatalogue()) {
         const auto command = filter.makeCommand(false, SampleOf(filter));
         const auto* pipeline = dynamic_cast<const PipelineCommand*>(command.Get());
