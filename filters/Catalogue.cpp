@@ -1,81 +1,35 @@
 #include "filters/Catalogue.h"
 
-#include "filters/blur/MotionBlurTool.h"
-#include "filters/blur/RasterMotionBlurCommand.h"
-#include "filters/copy/RasterCopyCommand.h"
-#include "filters/distort/RasterSphereCommand.h"
-#include "filters/distort/RasterTwirlCommand.h"
-#include "filters/distort/SphereTool.h"
-#include "filters/distort/TwirlTool.h"
-#include "filters/tonal/DiffuseTool.h"
-#include "filters/tonal/NoiseTool.h"
-#include "filters/tonal/RasterAddNoiseCommand.h"
-#include "filters/tonal/RasterDiffuseCommand.h"
-#include "filters/tonal/RasterUnsharpMaskCommand.h"
-#include "filters/tonal/RasterVerticalEdgeDetectCommand.h"
-#include "filters/tonal/UnsharpMaskTool.h"
-
 #include <algorithm>
 
 namespace RasterTools {
 
 namespace {
 
-template <class Filter>
-FilterInfo Describe(std::string_view toolClass, std::string_view commandClass) {
-    using Params = typename Filter::Params;
-    using CommandClass = typename Filter::Command;
-    FilterInfo info{.name = Filter::kName,
-                    .toolClass = toolClass,
-                    .commandClass = commandClass,
-                    .description = Filter::kDescription,
-                    .toolID = Filter::kToolID,
-                    .classCode = CommandClass::GetTypeClassProperties().GetClassCode(),
-                    .parameters = {},
-                    .makeCommand = {},
-                    .isCommand = {},
-                    .readCommand = {}};
-    for (const auto& parameter : Filter::kParameters)
-        info.parameters.push_back(parameter.spec);
-    if constexpr (requires { Filter::kSamples; })
-        for (const Params& sample : Filter::kSamples) {
-            std::vector<ParameterValue> values;
-            for (const auto& parameter : Filter::kParameters)
-                values.push_back(GetParameter(sample, parameter));
-            info.samples.push_back(std::move(values));
-        }
-    info.makeCommand = [](bool liveEffect, const std::vector<ParameterValue>& values) {
-        Params params = DefaultParameters(Filter::kParameters);
-        for (std::size_t i = 0; i < values.size() && i < Filter::kParameters.size(); ++i)
-            SetParameter(params, Filter::kParameters[i], values[i]);
-        return Kernel::Counted<RasterCommand>(new CommandClass(liveEffect, params));
-    };
-    info.isCommand = [](const Command& command) {
-        return dynamic_cast<const CommandClass*>(&command) != nullptr;
-    };
-    info.readCommand = [](const Command& command) {
-        std::vector<ParameterValue> values;
-        if (const auto* own = dynamic_cast<const CommandClass*>(&command))
-            for (const auto& parameter : Filter::kParameters)
-                values.push_back(GetParameter(own->GetParameters(), parameter));
-        return values;
-    };
-    return info;
+// Filled by the filters' registration objects while the library loads; read once, when the catalogue is
+// first built.
+std::vector<FilterInfo (*)()>& Describers() {
+    static std::vector<FilterInfo (*)()> describers;
+    return describers;
 }
 
 } // namespace
 
+void RegisterFilter(FilterInfo (*describe)()) {
+    Describers().push_back(describe);
+}
+
 const std::vector<FilterInfo>& GetFilterCatalogue() {
-    static const std::vector<FilterInfo> catalogue = {
-        Describe<AddNoiseFilter>("NoiseTool", "RasterAddNoiseCommand"),
-        Describe<DiffuseFilter>("DiffuseTool", "RasterDiffuseCommand"),
-        Describe<UnsharpMaskFilter>("UnsharpMaskTool", "RasterUnsharpMaskCommand"),
-        Describe<CopyFilter>("", "RasterCopyCommand"),
-        Describe<MotionBlurFilter>("MotionBlurTool", "RasterMotionBlurCommand"),
-        Describe<TwirlFilter>("TwirlTool", "RasterTwirlCommand"),
-        Describe<SphereFilter>("SphereTool", "RasterSphereCommand"),
-        Describe<VerticalEdgeDetectFilter>("", "RasterVerticalEdgeDetectCommand"),
-    };
+    // Built on first use: the entries read class properties that other units initialise at load. The order
+    // of registration follows the link order, so the catalogue is sorted by name.
+    static const std::vector<FilterInfo> catalogue = [] {
+        std::vector<FilterInfo> filters;
+        for (auto* describe : Describers())
+            filters.push_back(describe());
+        std::sort(filters.begin(), filters.end(),
+                  [](const FilterInfo& a, const FilterInfo& b) { return a.name < b.name; });
+        return filters;
+    }();
     return catalogue;
 }
 

@@ -4,6 +4,7 @@
 #include "frame/Parameters.h"
 #include "host/document/Command.h"
 #include "host/document/ToolID.h"
+#include "pipeline/DeviceSteps.h"
 
 #include <functional>
 #include <span>
@@ -30,13 +31,21 @@ struct FilterInfo {
     // Values worth rendering besides the parameter table's corners and defaults (a filter's kSamples), in
     // parameter order; used by the conformance tests.
     std::vector<std::vector<ParameterValue>> samples;
+    // The device kernels of the filter for a language and layer format, as texts, for checks that compile
+    // them; empty for a filter that declares none.
+    std::function<std::vector<DeviceKernelText>(Raster::HardwareKernelLanguage language,
+                                                Raster::PixelFormat format)>
+        kernelTexts;
 };
 
-// Every filter of the library, in a fixed order. Built on first use, not at load.
+// Every filter of the library, sorted by name. Built on first use, not at load.
 const std::vector<FilterInfo>& GetFilterCatalogue();
 const FilterInfo* FindFilter(std::string_view name);
 const FilterInfo* FindFilter(ToolID tool);
 // The catalogue entry of a command object, or null when the library does not know it.
 const FilterInfo* FindFilterOf(const Command& command);
+
+// Called at load by each filter's registration object (frame/Registration.h): describe builds its entry.
+void RegisterFilter(FilterInfo (*describe)());
 
 } // namespace RasterTools

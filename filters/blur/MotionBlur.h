@@ -20,6 +20,9 @@ struct MotionBlurFilter {
     using Command = RasterMotionBlurCommand;
 
     static constexpr std::string_view kName = "motionblur";
+    // The host knows the classes by these names (coverage, documents, tool lists).
+    static constexpr std::string_view kCommandClass = "RasterMotionBlurCommand";
+    static constexpr std::string_view kToolClass = "MotionBlurTool"; // empty: no tool
     static constexpr std::string_view kDescription = "Motion Blur";
     static constexpr std::string_view kHint = "|DRAG| to set radius and direction. |CLICK| to reset.";
     static constexpr ToolID kToolID = ToolID::MotionBlur;

@@ -17,7 +17,7 @@ const Kernel::ClassProperties RasterMotionBlurCommand::ms_ClassProperties(
     &RasterDevicePreviewableFilterLayerCommand::GetTypeClassProperties());
 
 namespace {
-const CommandRegistration<RasterMotionBlurCommand> kRegistration("RasterMotionBlurCommand");
+const FilterRegistration<MotionBlurFilter, &MotionBlurDevice::GetKernelTexts> kRegistration;
 
 // A quarter turn of the motion: the direction lies along the columns of the intermediate image.
 constexpr double QuarterTurn = 1.5707963267948966;

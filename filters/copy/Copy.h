@@ -18,6 +18,9 @@ struct CopyFilter {
     using Command = RasterCopyCommand;
 
     static constexpr std::string_view kName = "copy";
+    // The host knows the classes by these names (coverage, documents, tool lists).
+    static constexpr std::string_view kCommandClass = "RasterCopyCommand";
+    static constexpr std::string_view kToolClass = ""; // empty: no tool
     static constexpr std::string_view kDescription = "Copy";
     static constexpr ToolID kToolID = ToolID::None;
     // Scales beyond these make no sense for a copy and would only make huge or empty images.

@@ -14,7 +14,27 @@ const Kernel::ClassProperties RasterCopyCommand::ms_ClassProperties(
     &RasterDevicePreviewableFilterLayerCommand::GetTypeClassProperties());
 
 namespace {
-const CommandRegistration<RasterCopyCommand> kRegistration("RasterCopyCommand");
+
+// The four kinds of copy kernel into a layer format from the same format, for checks that compile them.
+std::vector<DeviceKernelText> GetCopyKernelTexts(Raster::HardwareKernelLanguage language,
+                                                 Raster::PixelFormat format) {
+    std::vector<DeviceKernelText> texts;
+    const auto add = [&](auto stages, std::optional<Raster::PixelFormat> mask) {
+        const auto descriptor =
+            DescribeKernel<decltype(stages)>(language, {format, format, mask, mask.has_value()});
+        if (descriptor)
+            texts.push_back({Raster::AssembleKernelSource(*descriptor, language), descriptor->entryPoint});
+        else
+            texts.push_back({});
+    };
+    add(CopyStages::Plain{}, std::nullopt);
+    add(CopyStages::PlainMasked{}, Raster::PixelFormat::MaskA8);
+    add(CopyStages::Scaled{}, std::nullopt);
+    add(CopyStages::ScaledMasked{}, Raster::PixelFormat::MaskA8);
+    return texts;
+}
+
+const FilterRegistration<CopyFilter, &GetCopyKernelTexts> kRegistration;
 
 double ClampScale(double scale) {
     // NaN and anything out of range end up inside it.

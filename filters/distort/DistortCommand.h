@@ -5,19 +5,22 @@
 
 #include "filters/distort/DistortPlacement.h"
 #include "filters/distort/DistortStages.h"
-#include "frame/FilterCommand.h"
-#include "pipeline/PipelineCommand.h"
+#include "frame/SinglePassCommand.h"
 
 namespace RasterTools {
 
 template <class Filter, class Map>
-class DistortCommand : public FilterCommand<Filter>, public PipelineCommand {
+class DistortCommand : public SinglePassCommand<Filter> {
 public:
     using Params = typename Filter::Params;
     using TransformParams = typename DistortStages::Chain<Map>::Params;
+    template <Raster::PixelFormat F>
+    using PlainStages = DistortStages::Plain<Map, F>;
+    template <Raster::PixelFormat F>
+    using MaskedStages = DistortStages::Masked<Map, F>;
 
     DistortCommand(bool liveEffect, const Params& params)
-        : FilterCommand<Filter>(liveEffect, params) {}
+        : SinglePassCommand<Filter>(liveEffect, params) {}
 
     double GetRadius() const noexcept { return m_Params.radius; }
     // Document coordinates; not numbers when unset (see UnsetCentre).
@@ -39,8 +42,7 @@ public:
     void PrepareInputRectangle(Kernel::RectT<double>& rect) const override {
         Distort::GrowToReadArea(rect, m_Params.centre, m_Params.radius);
     }
-    // Only pixels of the output area are written.
-    bool PrepareOutputRectangle(Kernel::RectT<double>&) const override { return true; }
+    // Only pixels of the output area are written: the base's answer.
 
     // The Transform stage's block for a raster of the given bounds (output units) seen through view (source
     // pixels to output pixels): the inverse view, then [centre x, centre y, strength, radius] in source
@@ -57,21 +59,10 @@ public:
         return params;
     }
 
-    // Renders on the device or the processor, for every layer format (source and destination alike).
-    RenderPath Render(const RenderTarget& target) const override {
-        const TransformParams transform = GetTransformParams(target.bounds, target.transform);
-        return WithStages(target, [&](auto stages) {
-            using Stages = decltype(stages);
-            typename Stages::Params params;
-            params.transform = transform;
-            return RasterTools::Render<Stages>(target, params);
-        });
-    }
-
-    bool PrepareDevice(const RenderTarget& target) const override {
-        return WithStages(target, [&](auto stages) {
-                   return WaitForKernel<decltype(stages)>(target) ? RenderPath::Device : RenderPath::Failed;
-               }) == RenderPath::Device;
+    template <class StageParams>
+    void FillStageParams(StageParams& params, const Kernel::RectT<double>& bounds,
+                         const Raster::AffineTransform::Params& view) const {
+        params.transform = GetTransformParams(bounds, view);
     }
 
     // The whole raster (cut to the selection) on the processor, with the circle carried into the layer's
@@ -87,20 +78,6 @@ public:
 protected:
     DistortCommand() = default;
     using FilterCommand<Filter>::m_Params;
-
-private:
-    // Calls f with the stages for the target's format, with or without a mask; Failed for another format.
-    template <class Function>
-    static RenderPath WithStages(const RenderTarget& target, Function&& f) {
-        if (!target.source) return RenderPath::Failed;
-        RenderPath path = RenderPath::Failed;
-        LayerFormatList::Dispatch(target.source.pixels->GetFormat(), [&](auto format) {
-            constexpr Raster::PixelFormat F = decltype(format)::value;
-            path = target.mask ? f(DistortStages::Masked<Map, F>{}) : f(DistortStages::Plain<Map, F>{});
-            return true;
-        });
-        return path;
-    }
 };
 
 } // namespace RasterTools

@@ -5,13 +5,13 @@
 
 namespace RasterTools::DistortStages {
 
-RT_AVX2_CLONES void MapSpan(const Raster::PreparedTransform<Chain<TwirlTransform>>& t, int x0, int y,
-                            float* xs, float* ys) noexcept {
-    MapSpanInline<Chain<TwirlTransform>>(t, x0, y, xs, ys);
-}
-RT_AVX2_CLONES void MapSpan(const Raster::PreparedTransform<Chain<SphereTransform>>& t, int x0, int y,
-                            float* xs, float* ys) noexcept {
-    MapSpanInline<Chain<SphereTransform>>(t, x0, y, xs, ys);
-}
+RT_AVX2_DISPATCH(MapSpan, MapSpanInline<Chain<TwirlTransform>>,
+                 (const Raster::PreparedTransform<Chain<TwirlTransform>>& t, int x0, int y, float* xs,
+                  float* ys),
+                 (t, x0, y, xs, ys))
+RT_AVX2_DISPATCH(MapSpan, MapSpanInline<Chain<SphereTransform>>,
+                 (const Raster::PreparedTransform<Chain<SphereTransform>>& t, int x0, int y, float* xs,
+                  float* ys),
+                 (t, x0, y, xs, ys))
 
 } // namespace RasterTools::DistortStages

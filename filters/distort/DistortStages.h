@@ -147,3 +147,5 @@ struct StageText<SpanBilinearSampler> {
 #define RT_INSTANTIATE_DISTORT(Name, Format)                                                                 \
     RT_INSTANTIATE_PROCESSOR(RasterTools::DistortStages::Name##Plain<Raster::PixelFormat::Format>, Format)   \
     RT_INSTANTIATE_PROCESSOR(RasterTools::DistortStages::Name##Masked<Raster::PixelFormat::Format>, Format)
+#define RT_INSTANTIATE_TWIRL(Format) RT_INSTANTIATE_DISTORT(Twirl, Format)
+#define RT_INSTANTIATE_SPHERE(Format) RT_INSTANTIATE_DISTORT(Sphere, Format)

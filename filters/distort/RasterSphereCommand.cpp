@@ -10,7 +10,7 @@ const Kernel::ClassProperties RasterSphereCommand::ms_ClassProperties(
     &RasterDevicePreviewableFilterLayerCommand::GetTypeClassProperties());
 
 namespace {
-const CommandRegistration<RasterSphereCommand> kRegistration("RasterSphereCommand");
+const FilterRegistration<SphereFilter> kRegistration;
 }
 
 RasterSphereCommand::RasterSphereCommand(bool liveEffect, double intensity, double radius,

@@ -10,7 +10,7 @@ const Kernel::ClassProperties RasterTwirlCommand::ms_ClassProperties(
     &RasterDevicePreviewableFilterLayerCommand::GetTypeClassProperties());
 
 namespace {
-const CommandRegistration<RasterTwirlCommand> kRegistration("RasterTwirlCommand");
+const FilterRegistration<TwirlFilter> kRegistration;
 }
 
 RasterTwirlCommand::RasterTwirlCommand(bool liveEffect, double angle, double radius,

@@ -21,6 +21,9 @@ struct AddNoiseFilter {
     using Command = RasterAddNoiseCommand;
 
     static constexpr std::string_view kName = "addnoise";
+    // The host knows the classes by these names (coverage, documents, tool lists).
+    static constexpr std::string_view kCommandClass = "RasterAddNoiseCommand";
+    static constexpr std::string_view kToolClass = "NoiseTool"; // empty: no tool
     static constexpr std::string_view kDescription = "Add Noise";
     static constexpr std::string_view kHint = "|DRAG| to set intensity. |CLICK| to reset.";
     static constexpr ToolID kToolID = ToolID::AddNoise;

@@ -19,6 +19,9 @@ struct DiffuseFilter {
     using Command = RasterDiffuseCommand;
 
     static constexpr std::string_view kName = "diffuse";
+    // The host knows the classes by these names (coverage, documents, tool lists).
+    static constexpr std::string_view kCommandClass = "RasterDiffuseCommand";
+    static constexpr std::string_view kToolClass = "DiffuseTool"; // empty: no tool
     static constexpr std::string_view kDescription = "Diffuse";
     static constexpr std::string_view kHint = "|DRAG| to set diffusion. |CLICK| to reset.";
     static constexpr ToolID kToolID = ToolID::Diffuse;

@@ -72,17 +72,16 @@ template <class Component>
 
 } // namespace
 
-RT_AVX2_CLONES void Gradient(const std::uint8_t* above, const std::uint8_t* row, const std::uint8_t* below,
-                             int channels, int n, std::uint8_t* out) noexcept {
-    Dispatch(above, row, below, channels, n, out);
-}
-RT_AVX2_CLONES void Gradient(const std::uint16_t* above, const std::uint16_t* row, const std::uint16_t* below,
-                             int channels, int n, std::uint16_t* out) noexcept {
-    Dispatch(above, row, below, channels, n, out);
-}
-RT_AVX2_CLONES void Gradient(const float* above, const float* row, const float* below, int channels, int n,
-                             float* out) noexcept {
-    Dispatch(above, row, below, channels, n, out);
-}
+RT_AVX2_DISPATCH(Gradient, Dispatch,
+                 (const std::uint8_t* above, const std::uint8_t* row, const std::uint8_t* below, int channels,
+                  int n, std::uint8_t* out),
+                 (above, row, below, channels, n, out))
+RT_AVX2_DISPATCH(Gradient, Dispatch,
+                 (const std::uint16_t* above, const std::uint16_t* row, const std::uint16_t* below,
+                  int channels, int n, std::uint16_t* out),
+                 (above, row, below, channels, n, out))
+RT_AVX2_DISPATCH(Gradient, Dispatch,
+                 (const float* above, const float* row, const float* below, int channels, int n, float* out),
+                 (above, row, below, channels, n, out))
 
 } // namespace RasterTools::EdgeDetectSpan

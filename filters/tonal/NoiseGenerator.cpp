@@ -108,24 +108,23 @@ template <class Component>
 
 } // namespace
 
-RT_AVX2_CLONES void SpanAddNoise(std::uint8_t* components, int channels, const SpanChannelNoise* noise,
-                                 int n) noexcept {
-    AddNoiseToSpan(components, channels, noise, n);
-}
-RT_AVX2_CLONES void SpanAddNoise(std::uint16_t* components, int channels, const SpanChannelNoise* noise,
-                                 int n) noexcept {
-    AddNoiseToSpan(components, channels, noise, n);
-}
-RT_AVX2_CLONES void SpanAddNoise(float* components, int channels, const SpanChannelNoise* noise,
-                                 int n) noexcept {
-    AddNoiseToSpan(components, channels, noise, n);
-}
+RT_AVX2_DISPATCH(SpanAddNoise, AddNoiseToSpan,
+                 (std::uint8_t * components, int channels, const SpanChannelNoise* noise, int n),
+                 (components, channels, noise, n))
+RT_AVX2_DISPATCH(SpanAddNoise, AddNoiseToSpan,
+                 (std::uint16_t * components, int channels, const SpanChannelNoise* noise, int n),
+                 (components, channels, noise, n))
+RT_AVX2_DISPATCH(SpanAddNoise, AddNoiseToSpan,
+                 (float* components, int channels, const SpanChannelNoise* noise, int n),
+                 (components, channels, noise, n))
 
 const Jump* GetJumps() noexcept {
     return Jumps.data();
 }
 
-RT_AVX2_CLONES void SpanSeeds(int x0, int y, const float* samplerParams, std::uint32_t* seeds) noexcept {
+namespace {
+
+inline void SeedsOfSpan(int x0, int y, const float* samplerParams, std::uint32_t* seeds) noexcept {
     alignas(64) float xs[SpanPixels], ys[SpanPixels];
     const float centreY = float(y) + 0.5f;
     int outside = 0;
@@ -149,6 +148,11 @@ RT_AVX2_CLONES void SpanSeeds(int x0, int y, const float* samplerParams, std::ui
         seeds[i] = Hash(uint(ty) * width + uint(tx));
     }
 }
+
+} // namespace
+
+RT_AVX2_DISPATCH(SpanSeeds, SeedsOfSpan, (int x0, int y, const float* samplerParams, std::uint32_t* seeds),
+                 (x0, y, samplerParams, seeds))
 
 // Each draw's state comes straight from the seed (state k = multiplier(k) * seed + increment(k)), so the
 // draws of a pixel are independent and the lanes carry pixels; all channels are drawn side by side.
@@ -183,7 +187,9 @@ template <int Channels>
             noise[c][i] = GaussianFromSum(sums[c][i], sigma);
 }
 
-RT_AVX2_CLONES void SpanUnitDraws(const std::uint32_t* seeds, int draws, SpanChannelNoise* values) noexcept {
+namespace {
+
+inline void UnitDraws(const std::uint32_t* seeds, int draws, SpanChannelNoise* values) noexcept {
     const Jump* jumps = Jumps.data() + 1;
     for (int k = 0; k < draws && k < MaxJump; ++k) {
         const std::uint32_t multiplier = jumps[k].multiplier, increment = jumps[k].increment;
@@ -192,8 +198,8 @@ RT_AVX2_CLONES void SpanUnitDraws(const std::uint32_t* seeds, int draws, SpanCha
     }
 }
 
-RT_AVX2_CLONES void SpanNoise(const std::uint32_t* seeds, int channels, bool gaussian, float sigma,
-                              SpanChannelNoise* noise) noexcept {
+inline void NoiseOfSpan(const std::uint32_t* seeds, int channels, bool gaussian, float sigma,
+                        SpanChannelNoise* noise) noexcept {
     switch (channels) {
     case 1:
         return DrawSpanNoise<1>(seeds, gaussian, sigma, noise);
@@ -207,5 +213,14 @@ RT_AVX2_CLONES void SpanNoise(const std::uint32_t* seeds, int channels, bool gau
         return;
     }
 }
+
+} // namespace
+
+RT_AVX2_DISPATCH(SpanUnitDraws, UnitDraws, (const std::uint32_t* seeds, int draws, SpanChannelNoise* values),
+                 (seeds, draws, values))
+RT_AVX2_DISPATCH(SpanNoise, NoiseOfSpan,
+                 (const std::uint32_t* seeds, int channels, bool gaussian, float sigma,
+                  SpanChannelNoise* noise),
+                 (seeds, channels, gaussian, sigma, noise))
 
 } // namespace RasterTools::NoiseGenerator

@@ -3,13 +3,17 @@
 
 #include "filters/tonal/AddNoise.h"
 #include "filters/tonal/NoiseStages.h"
-#include "frame/FilterCommand.h"
-#include "pipeline/PipelineCommand.h"
+#include "frame/SinglePassCommand.h"
 
 namespace RasterTools {
 
-class RasterAddNoiseCommand final : public FilterCommand<AddNoiseFilter>, public PipelineCommand {
+class RasterAddNoiseCommand final : public SinglePassCommand<AddNoiseFilter> {
 public:
+    template <Raster::PixelFormat F>
+    using PlainStages = NoiseStages::Plain<F>;
+    template <Raster::PixelFormat F>
+    using MaskedStages = NoiseStages::Masked<F>;
+
     RasterAddNoiseCommand(bool liveEffect, double intensity, bool mono, bool gaussian);
     RasterAddNoiseCommand(bool liveEffect, const AddNoiseParameters& params);
 
@@ -20,9 +24,7 @@ public:
     bool GetLooksTerribleWhenPreviewingBecauseOfRetina() const override { return true; }
     bool CanAffectAlpha() const override { return false; }
     bool CanRequireInflation() const override { return false; }
-    // Noise reads and writes exactly the output pixel.
-    void PrepareInputRectangle(Kernel::RectT<double>&) const override {}
-    bool PrepareOutputRectangle(Kernel::RectT<double>&) const override { return true; }
+    // Noise reads and writes exactly the output pixel: no Margin, the area answers are the base's.
 
     // The sampler block for a raster of the given bounds (document units) seen through view (raster pixels
     // to the view): the inverse of view as the sampler affine (a singular view gives the zero linear part
@@ -30,11 +32,11 @@ public:
     NoiseSampler::Params GetSamplerParams(const Kernel::RectT<double>& bounds,
                                           const Raster::AffineTransform::Params& view) const noexcept;
 
-    // Renders on the device or the processor, for every layer format (source and destination alike).
-    RenderPath Render(const RenderTarget& target) const override;
-    bool PrepareDevice(const RenderTarget& target) const override;
-    // The whole raster (cut to the selection) on the processor.
-    Kernel::RectT<int> DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const override;
+    template <class StageParams>
+    void FillStageParams(StageParams& params, const Kernel::RectT<double>& bounds,
+                         const Raster::AffineTransform::Params& view) const noexcept {
+        params.sampler = GetSamplerParams(bounds, view);
+    }
 
     const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
     static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }

@@ -12,37 +12,15 @@ const Kernel::ClassProperties RasterDiffuseCommand::ms_ClassProperties(
     &RasterDevicePreviewableFilterLayerCommand::GetTypeClassProperties());
 
 namespace {
-const CommandRegistration<RasterDiffuseCommand> kRegistration("RasterDiffuseCommand");
-
-// Calls f with the stages for the target's format, with or without a mask; Failed for another format.
-template <class Function>
-RenderPath WithStages(const RenderTarget& target, Function&& f) {
-    if (!target.source) return RenderPath::Failed;
-    RenderPath path = RenderPath::Failed;
-    LayerFormatList::Dispatch(target.source.pixels->GetFormat(), [&](auto format) {
-        constexpr Raster::PixelFormat F = decltype(format)::value;
-        path = target.mask ? f(DiffuseStages::Masked<F>{}) : f(DiffuseStages::Plain<F>{});
-        return true;
-    });
-    return path;
-}
+const FilterRegistration<DiffuseFilter> kRegistration;
 
 } // namespace
 
 RasterDiffuseCommand::RasterDiffuseCommand(bool liveEffect, double intensity)
-    : FilterCommand(liveEffect, DiffuseParameters{intensity}) {}
+    : SinglePassCommand(liveEffect, DiffuseParameters{intensity}) {}
 
 RasterDiffuseCommand::RasterDiffuseCommand(bool liveEffect, const DiffuseParameters& params)
-    : FilterCommand(liveEffect, params) {}
-
-void RasterDiffuseCommand::PrepareInputRectangle(Kernel::RectT<double>& rect) const {
-    rect = rect.Inflated(std::ceil(m_Params.intensity * 512.0));
-}
-
-bool RasterDiffuseCommand::PrepareOutputRectangle(Kernel::RectT<double>& rect) const {
-    rect = rect.Inflated(m_Params.intensity * 512.0);
-    return true;
-}
+    : SinglePassCommand(liveEffect, params) {}
 
 DiffuseSampler::Params
 RasterDiffuseCommand::GetSamplerParams(const Kernel::RectT<double>& bounds,
@@ -57,27 +35,6 @@ RasterDiffuseCommand::GetSamplerParams(const Kernel::RectT<double>& bounds,
     params.block[DiffuseSampler::SigmaIndex] = float(m_Params.intensity * scale);
     params.block[DiffuseSampler::WidthIndex] = NoiseGenerator::TruncatedWidth(bounds.left, bounds.right);
     return params;
-}
-
-RenderPath RasterDiffuseCommand::Render(const RenderTarget& target) const {
-    const DiffuseSampler::Params sampler = GetSamplerParams(target.bounds, target.transform);
-    return WithStages(target, [&](auto stages) {
-        using Stages = decltype(stages);
-        typename Stages::Params params;
-        params.sampler = sampler;
-        return RasterTools::Render<Stages>(target, params);
-    });
-}
-
-bool RasterDiffuseCommand::PrepareDevice(const RenderTarget& target) const {
-    return WithStages(target, [&](auto stages) {
-               return WaitForKernel<decltype(stages)>(target) ? RenderPath::Device : RenderPath::Failed;
-           }) == RenderPath::Device;
-}
-
-Kernel::RectT<int> RasterDiffuseCommand::DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const {
-    if (!raster) return {};
-    return RenderDirectly(*raster);
 }
 
 } // namespace RasterTools

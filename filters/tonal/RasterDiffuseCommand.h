@@ -3,13 +3,17 @@
 
 #include "filters/tonal/Diffuse.h"
 #include "filters/tonal/DiffuseStages.h"
-#include "frame/FilterCommand.h"
-#include "pipeline/PipelineCommand.h"
+#include "frame/SinglePassCommand.h"
 
 namespace RasterTools {
 
-class RasterDiffuseCommand final : public FilterCommand<DiffuseFilter>, public PipelineCommand {
+class RasterDiffuseCommand final : public SinglePassCommand<DiffuseFilter> {
 public:
+    template <Raster::PixelFormat F>
+    using PlainStages = DiffuseStages::Plain<F>;
+    template <Raster::PixelFormat F>
+    using MaskedStages = DiffuseStages::Masked<F>;
+
     RasterDiffuseCommand(bool liveEffect, double intensity);
     RasterDiffuseCommand(bool liveEffect, const DiffuseParameters& params);
 
@@ -18,10 +22,8 @@ public:
     bool GetLooksTerribleWhenPreviewingBecauseOfRetina() const override { return true; }
     // The chosen neighbour's alpha comes along.
     bool CanAffectAlpha() const override { return true; }
-    // A pixel reads neighbours up to 512 × intensity away: every side grows by that, rounded up.
-    void PrepareInputRectangle(Kernel::RectT<double>& rect) const override;
-    // The written area grows by the same distance, unrounded.
-    bool PrepareOutputRectangle(Kernel::RectT<double>& rect) const override;
+    // A pixel reads neighbours up to 512 × intensity away; the written area grows by as much.
+    static double Margin(const DiffuseParameters& params) noexcept { return params.intensity * 512.0; }
 
     // The sampler block for a raster of the given bounds (document units) seen through view (raster pixels
     // to the view): the inverse of view as the sampler affine (a singular view collapses, see
@@ -29,11 +31,11 @@ public:
     DiffuseSampler::Params GetSamplerParams(const Kernel::RectT<double>& bounds,
                                             const Raster::AffineTransform::Params& view) const noexcept;
 
-    // Renders on the device or the processor, for every layer format (source and destination alike).
-    RenderPath Render(const RenderTarget& target) const override;
-    bool PrepareDevice(const RenderTarget& target) const override;
-    // The whole raster (cut to the selection) on the processor.
-    Kernel::RectT<int> DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const override;
+    template <class StageParams>
+    void FillStageParams(StageParams& params, const Kernel::RectT<double>& bounds,
+                         const Raster::AffineTransform::Params& view) const noexcept {
+        params.sampler = GetSamplerParams(bounds, view);
+    }
 
     const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
     static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }

@@ -16,7 +16,7 @@ const Kernel::ClassProperties RasterUnsharpMaskCommand::ms_ClassProperties(
     &RasterDevicePreviewableFilterLayerCommand::GetTypeClassProperties());
 
 namespace {
-const CommandRegistration<RasterUnsharpMaskCommand> kRegistration("RasterUnsharpMaskCommand");
+const FilterRegistration<UnsharpMaskFilter, &UnsharpMaskDevice::GetKernelTexts> kRegistration;
 }
 
 RasterUnsharpMaskCommand::RasterUnsharpMaskCommand(bool liveEffect, double radius, double factor,

@@ -1,6 +1,5 @@
 #include "filters/tonal/RasterVerticalEdgeDetectCommand.h"
 
-#include "filters/tonal/EdgeDetectStages.h"
 #include "frame/Registration.h"
 
 namespace RasterTools {
@@ -10,20 +9,7 @@ const Kernel::ClassProperties RasterVerticalEdgeDetectCommand::ms_ClassPropertie
     RasterVerticalEdgeDetectCommand::__GetDefaultSerialisation(), &RasterCommand::GetTypeClassProperties());
 
 namespace {
-const CommandRegistration<RasterVerticalEdgeDetectCommand> kRegistration("RasterVerticalEdgeDetectCommand");
-
-// Calls f with the stages for the target's format, with or without a mask; Failed for another format.
-template <class Function>
-RenderPath WithStages(const RenderTarget& target, Function&& f) {
-    if (!target.source) return RenderPath::Failed;
-    RenderPath path = RenderPath::Failed;
-    LayerFormatList::Dispatch(target.source.pixels->GetFormat(), [&](auto format) {
-        constexpr Raster::PixelFormat F = decltype(format)::value;
-        path = target.mask ? f(EdgeDetectStages::Masked<F>{}) : f(EdgeDetectStages::Plain<F>{});
-        return true;
-    });
-    return path;
-}
+const FilterRegistration<VerticalEdgeDetectFilter> kRegistration;
 
 } // namespace
 
@@ -47,24 +33,6 @@ Kernel::Counted<Kernel::Serialisable> RasterVerticalEdgeDetectCommand::CreateObj
 const Kernel::ClassPropertiesBase::DefaultItem* RasterVerticalEdgeDetectCommand::__GetDefaultSerialisation() {
     static const Kernel::ClassPropertiesBase::DefaultItem items[] = {{}};
     return items;
-}
-
-RenderPath RasterVerticalEdgeDetectCommand::Render(const RenderTarget& target) const {
-    return WithStages(target, [&](auto stages) {
-        return RasterTools::Render<decltype(stages)>(target, typename decltype(stages)::Params{});
-    });
-}
-
-bool RasterVerticalEdgeDetectCommand::PrepareDevice(const RenderTarget& target) const {
-    return WithStages(target, [&](auto stages) {
-               return WaitForKernel<decltype(stages)>(target) ? RenderPath::Device : RenderPath::Failed;
-           }) == RenderPath::Device;
-}
-
-Kernel::RectT<int>
-RasterVerticalEdgeDetectCommand::DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const {
-    if (!raster) return {};
-    return RenderDirectly(*raster);
 }
 
 } // namespace RasterTools

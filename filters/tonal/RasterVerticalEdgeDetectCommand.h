@@ -2,14 +2,20 @@
 // The vertical edge detect command: every pixel's colour becomes the magnitude of the horizontal gradient
 // around it (vertical edges light up, flat areas go to the minimum); alpha stays. Applied to pixels only.
 
+#include "filters/tonal/EdgeDetectStages.h"
 #include "filters/tonal/VerticalEdgeDetect.h"
-#include "host/document/Command.h"
-#include "pipeline/PipelineCommand.h"
+#include "frame/SinglePassCommand.h"
 
 namespace RasterTools {
 
-class RasterVerticalEdgeDetectCommand final : public RasterCommand, public PipelineCommand {
+class RasterVerticalEdgeDetectCommand final
+    : public SinglePassCommand<VerticalEdgeDetectFilter, RasterCommand> {
 public:
+    template <Raster::PixelFormat F>
+    using PlainStages = EdgeDetectStages::Plain<F>;
+    template <Raster::PixelFormat F>
+    using MaskedStages = EdgeDetectStages::Masked<F>;
+
     RasterVerticalEdgeDetectCommand() = default;
     // The catalogue's form; a command without parameters has no live form, so liveEffect is ignored.
     RasterVerticalEdgeDetectCommand(bool liveEffect, const VerticalEdgeDetectParameters& params);
@@ -20,11 +26,10 @@ public:
     Kernel::Counted<DocumentCommand> Clone() const override;
     bool CanRepeat() const override { return true; }
 
-    // Renders on the device or the processor, for every layer format (source and destination alike).
-    RenderPath Render(const RenderTarget& target) const override;
-    bool PrepareDevice(const RenderTarget& target) const override;
-    // The whole raster (cut to the selection) on the processor.
-    Kernel::RectT<int> DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const override;
+    // The stages take no parameters.
+    template <class StageParams>
+    void FillStageParams(StageParams&, const Kernel::RectT<double>&,
+                         const Raster::AffineTransform::Params&) const noexcept {}
 
     const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
     static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }

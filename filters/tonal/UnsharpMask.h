@@ -21,6 +21,9 @@ struct UnsharpMaskFilter {
     using Command = RasterUnsharpMaskCommand;
 
     static constexpr std::string_view kName = "unsharpmask";
+    // The host knows the classes by these names (coverage, documents, tool lists).
+    static constexpr std::string_view kCommandClass = "RasterUnsharpMaskCommand";
+    static constexpr std::string_view kToolClass = "UnsharpMaskTool"; // empty: no tool
     static constexpr std::string_view kDescription = "Unsharp Mask";
     static constexpr std::string_view kHint = "|DRAG| to set radius. |CLICK| to reset.";
     static constexpr ToolID kToolID = ToolID::UnsharpMask;

@@ -38,8 +38,8 @@ TEST_F(CommandLine, ScriptErrorsNameTheLineAndFail) {
     } cases[] = {
         {"tool addnoise\nfly away\n", "session.play:2: unknown verb \"fly\""},
         {"tool nonesuch\n",
-         // Later filters extend the list.
-         "session.play:1: unknown tool \"nonesuch\" (tools: addnoise, diffuse, unsharpmask"},
+         // The list is sorted by name; later filters may land anywhere in it.
+         "session.play:1: unknown tool \"nonesuch\" (tools: addnoise, "},
         {"start\n", "session.play:1: no tool chosen"},
         {"tool addnoise\n\n# only a comment\ndrag 0,0\n", "session.play:4: usage: drag X0,Y0 X1,Y1 [STEPS]"},
         {"tool addnoise\nclick here\n", "session.play:2: \"here\" is not a point"},

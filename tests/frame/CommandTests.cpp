@@ -7,6 +7,7 @@
 #include "filters/tonal/RasterUnsharpMaskCommand.h"
 #include "host/document/Document.h"
 
+#include <algorithm>
 #include <cstring>
 #include <gtest/gtest.h>
 
@@ -243,34 +244,56 @@ TEST(CommandRectangles, GrowByWhatEachFilterReads) {
     EXPECT_TRUE(sentinel.IsUnbounded());
 }
 
-TEST(CommandAnswers, MatchTheHostContract) {
+// The fixed answers of the host contract, per command class; every filter of the catalogue must have a row,
+// so that registering a filter enrols it here.
+TEST(CommandAnswers, EveryRegisteredCommandGivesTheHostContractsAnswers) {
     struct Expected {
-        Kernel::Counted<RasterCommand> command;
-        const char* description;
-        int toolID;
-        bool canAffectAlpha, canRequireInflation, looksTerrible;
+        const char* commandClass;
+        char classCode[5];
+        bool canAffectAlpha, canRequireInflation, looksTerrible, prefersToProtectAlpha;
+        int progressType; // 0: the host's own answer
     };
-    const Expected table[] = {
-        {Kernel::Counted<RasterCommand>(new RasterAddNoiseCommand(false, 0, false, true)), "Add Noise", 55,
-         false, false, true},
-        {Kernel::Counted<RasterCommand>(new RasterDiffuseCommand(false, 0)), "Diffuse", 56, true, true, true},
-        {Kernel::Counted<RasterCommand>(new RasterUnsharpMaskCommand(false, 0, 0.5, 0)), "Unsharp Mask", 81,
-         false, true, false},
+    constexpr Expected table[] = {
+        {"RasterAddNoiseCommand", "RANC", false, false, true, false, 2},
+        {"RasterDiffuseCommand", "RDf2", true, true, true, false, 2},
+        {"RasterUnsharpMaskCommand", "RUSC", false, true, false, false, 2},
+        {"RasterMotionBlurCommand", "RMoB", true, true, false, false, 2},
+        {"RasterSphereCommand", "RSpC", true, true, false, false, 2},
+        {"RasterTwirlCommand", "RTwC", true, true, false, false, 2},
+        {"RasterCopyCommand", "RCpy", false, false, false, false, 2},
+        {"RasterVerticalEdgeDetectCommand", "RVEd", true, true, false, true, 0},
     };
-    for (const auto& row : table) {
-        SCOPED_TRACE(row.description);
-        EXPECT_EQ(row.command->GetDescription(),
-                  Kernel::LocalisedString(row.description, "Command description"));
-        EXPECT_EQ(int(row.command->GetAssociatedToolID()), row.toolID);
-        EXPECT_EQ(row.command->CanAffectAlpha(), row.canAffectAlpha);
-        EXPECT_EQ(row.command->CanRequireInflation(), row.canRequireInflation);
-        EXPECT_EQ(row.command->GetLooksTerribleWhenPreviewingBecauseOfRetina(), row.looksTerrible);
-        EXPECT_FALSE(row.command->PrefersToProtectAlpha());
-        EXPECT_EQ(int(row.command->GetProgressType()), 2);
+    const auto CodeOf = [](const char* code) {
+        return (Kernel::FourCC(std::uint8_t(code[0])) << 24) | (Kernel::FourCC(std::uint8_t(code[1])) << 16) |
+               (Kernel::FourCC(std::uint8_t(code[2])) << 8) | Kernel::FourCC(std::uint8_t(code[3]));
+    };
+    for (const auto& info : GetFilterCatalogue()) {
+        SCOPED_TRACE(std::string(info.commandClass));
+        const auto* row = std::find_if(std::begin(table), std::end(table), [&](const Expected& e) {
+            return info.commandClass == e.commandClass;
+        });
+        ASSERT_NE(row, std::end(table)) << "no contract answers for this command";
+        for (const bool live : {false, true}) {
+            const auto command = info.makeCommand(live, {});
+            ASSERT_TRUE(command);
+            EXPECT_EQ(command->GetDescription(),
+                      Kernel::LocalisedString(std::string(info.description), "Command description"));
+            EXPECT_EQ(command->GetAssociatedToolID(), info.toolID);
+            EXPECT_EQ(command->GetObjectClassProperties().GetClassCode(), info.classCode);
+            EXPECT_EQ(info.classCode, CodeOf(row->classCode));
+            EXPECT_EQ(command->CanAffectAlpha(), row->canAffectAlpha);
+            EXPECT_EQ(command->CanRequireInflation(), row->canRequireInflation);
+            EXPECT_EQ(command->GetLooksTerribleWhenPreviewingBecauseOfRetina(), row->looksTerrible);
+            EXPECT_EQ(command->PrefersToProtectAlpha(), row->prefersToProtectAlpha);
+            if (row->progressType != 0) {
+                EXPECT_EQ(int(command->GetProgressType()), row->progressType);
+            }
+            EXPECT_EQ(FindFilterOf(*command), &info);
+        }
+        // The command class is known to the host under the name its table declares.
+        EXPECT_TRUE(CommandCoverage::Instance().Contains(std::string(info.commandClass)));
     }
     EXPECT_EQ(RasterAddNoiseCommand::GetTypeClassProperties().GetClassCode(), 0x52414E43u); // "RANC"
-    EXPECT_EQ(RasterDiffuseCommand::GetTypeClassProperties().GetClassCode(), Kernel::MakeFourCC("RDf2"));
-    EXPECT_EQ(RasterUnsharpMaskCommand::GetTypeClassProperties().GetClassCode(), Kernel::MakeFourCC("RUSC"));
     // No default values are declared for any property.
     EXPECT_EQ(RasterAddNoiseCommand::__GetDefaultSerialisation()[0].code, 0u);
 }

@@ -171,6 +171,9 @@ TEST_P(PipelineConformance, ProcessorAndDeviceAgreeInEveryTiling) {
                               << " differ from the processor's whole render at " << difference->Describe();
         }
     }
+    // The processor's tilings were checked above; say so rather than pass without the device.
+    if (pipeline->HasDeviceKernel() && !device)
+        GTEST_SKIP() << "no OpenCL device (install pocl-opencl-icd): the device renders were not compared";
 }
 
 INSTANTIATE_TEST_SUITE_P(Registered, PipelineConformance, testing::ValuesIn(AllSamples()), TestName);

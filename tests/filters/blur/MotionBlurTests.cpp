@@ -166,14 +166,7 @@ TEST(MotionBlurPixels, PremultipliedColourIsPreservedAwayFromTheBorders) {
                 before, before * 0.01);
 }
 
-TEST(MotionBlurCommand, ContractAndRectangles) {
-    const RasterMotionBlurCommand command(false, 10.0, 0.25);
-    EXPECT_EQ(command.GetDescription().Localise(), "Motion Blur");
-    EXPECT_EQ(command.GetAssociatedToolID(), ToolID::MotionBlur);
-    EXPECT_TRUE(command.CanAffectAlpha());
-    EXPECT_FALSE(command.PrefersToProtectAlpha());
-    EXPECT_EQ(RasterTools::FindFilter("motionblur")->classCode, Kernel::MakeFourCC("RMoB"));
-
+TEST(MotionBlurCommand, Rectangles) {
     // The intermediate rectangle: a quarter turn of a 10 x 4 rectangle about its centre is 4 x 10, with
     // trunc(r / s) rows above and below; the unbounded rectangle is left alone.
     Raster::AffineTransform::Params zoom;

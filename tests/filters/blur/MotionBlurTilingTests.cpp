@@ -181,14 +181,6 @@ TEST(MotionBlurTiling, TwoThreadsShareTheDevice) {
     EXPECT_FALSE(difference) << difference->Describe();
 }
 
-TEST(MotionBlurTiling, LanguageZeroStepsCompileWithNvrtcForEveryFormat) {
-    REQUIRE_NVRTC();
-    for (const PixelFormat format : kLayerFormats)
-        PipelineTest::ExpectStepsCompile(
-            RasterTools::MotionBlurDevice::GetKernelTexts(Raster::HardwareKernelLanguage::CudaCpp, format),
-            format);
-}
-
 TEST(MotionBlurTiling, AnAbortEndsTheRenderAndFreesTheScratchImages) {
     const auto source = PipelineTest::MakeImage(PixelFormat::RGBA8, 700, 700, 2);
     const RasterMotionBlurCommand command(false, 40.0, 0.5);

@@ -188,21 +188,6 @@ TEST(DistortRender, AHalfTurnNearTheCentreSwapsNeighbours) {
     }
 }
 
-TEST(DistortKernelText, LanguageZeroCompilesWithNvrtcForEveryFormat) {
-    REQUIRE_NVRTC();
-    const auto check = [](auto stages, const KernelShape& shape) {
-        PipelineTest::ExpectLanguageZeroCompiles<decltype(stages)>(shape);
-    };
-    [&]<std::size_t... I>(std::index_sequence<I...>) {
-        ((check(DistortStages::TwirlPlain<LayerFormatList::Values[I]>{},
-                {LayerFormatList::Values[I], LayerFormatList::Values[I], std::nullopt, false}),
-          check(DistortStages::SphereMasked<LayerFormatList::Values[I]>{},
-                {LayerFormatList::Values[I], LayerFormatList::Values[I], PixelFormat::MaskA8, true})),
-         ...);
-    }
-    (std::make_index_sequence<LayerFormatList::Values.size()>{});
-}
-
 std::string FormatName(const testing::TestParamInfo<PixelFormat>& info) {
     return std::string(Raster::GetPixelFormatName(info.param));
 }

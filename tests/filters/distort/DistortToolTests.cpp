@@ -193,30 +193,6 @@ TEST(DistortCommands, SaveWritesTheCodesInOrderThenTheBaseAndLoadRestoresThem) {
     EXPECT_EQ(sphereOut.GetBytes(), sphereExpected);
 }
 
-TEST(DistortCommands, AnswersAndRegistration) {
-    const auto twirl = DistortTest::MakeTwirl(10.0, 20.0, {0.0, 0.0});
-    const auto sphere = DistortTest::MakeSphere(10.0, 20.0, {0.0, 0.0});
-    EXPECT_EQ(twirl->GetDescription().GetEnglish(), "Twirl");
-    EXPECT_EQ(sphere->GetDescription().GetEnglish(), "Sphere");
-    EXPECT_EQ(twirl->GetDescription().GetContext(), "Command description");
-    EXPECT_EQ(int(twirl->GetAssociatedToolID()), 53);
-    EXPECT_EQ(int(sphere->GetAssociatedToolID()), 60);
-    EXPECT_EQ(sphere->GetIntensity(), 10.0);
-    for (const RasterDevicePreviewableFilterLayerCommand* command :
-         {static_cast<const RasterDevicePreviewableFilterLayerCommand*>(twirl.Get()),
-          static_cast<const RasterDevicePreviewableFilterLayerCommand*>(sphere.Get())}) {
-        EXPECT_TRUE(command->CanAffectAlpha());
-        EXPECT_FALSE(command->PrefersToProtectAlpha());
-        EXPECT_TRUE(command->CanRepeat());
-        EXPECT_EQ(command->GetProgressType(), DomainCommand::ProgressType::Fraction);
-    }
-    EXPECT_FALSE(RasterTwirlCommand(true, 1.0, 2.0, {}).CanRepeat()) << "a live effect does not repeat";
-    EXPECT_EQ(RasterTwirlCommand::GetTypeClassProperties().GetClassCode(), Kernel::MakeFourCC("RTwC"));
-    EXPECT_EQ(RasterSphereCommand::GetTypeClassProperties().GetClassCode(), Kernel::MakeFourCC("RSpC"));
-    EXPECT_TRUE(CommandCoverage::Instance().Contains("RasterTwirlCommand"));
-    EXPECT_TRUE(CommandCoverage::Instance().Contains("RasterSphereCommand"));
-}
-
 // The command line's default centre (the catalogue's) renders like the image's middle typed in.
 TEST(DistortCommands, TheDefaultCentreIsTheImagesMiddle) {
     const auto source = PipelineTest::MakeImage(Raster::PixelFormat::RGBA8, 50, 30, 3u);

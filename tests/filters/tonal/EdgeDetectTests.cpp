@@ -214,49 +214,6 @@ TEST(EdgeValues, BorderPixelsClampToTheEdge) {
     }
 }
 
-TEST(EdgeCommand, IsAOneShotRasterCommandInTheCatalogue) {
-    const auto command = MakeEdge();
-    EXPECT_EQ(command->GetDescription(),
-              Kernel::LocalisedString("Vertical Edge Detect", "Command description"));
-    EXPECT_TRUE(command->CanRepeat());
-    EXPECT_EQ(command->GetAssociatedToolID(), ToolID::None);
-    EXPECT_EQ(RasterVerticalEdgeDetectCommand::GetTypeClassProperties().GetClassCode(),
-              Kernel::MakeFourCC("RVEd"));
-    EXPECT_EQ(dynamic_cast<const RasterDevicePreviewableCommand*>(command.Get()), nullptr)
-        << "not previewable, no live form";
-    const auto* info = RasterTools::FindFilter("verticaledgedetect");
-    ASSERT_NE(info, nullptr);
-    EXPECT_TRUE(info->toolClass.empty());
-    EXPECT_TRUE(info->parameters.empty());
-    EXPECT_TRUE(info->isCommand(*command));
-    EXPECT_TRUE(CommandCoverage::Instance().Contains("RasterVerticalEdgeDetectCommand"));
-    // Through the class registry: only the base's data is saved.
-    const auto bytes = Kernel::SerialiseObject(*command);
-    Kernel::FileStore store;
-    const auto restored =
-        Kernel::CountedCast<RasterVerticalEdgeDetectCommand>(Kernel::DeserialiseObject(bytes, store));
-    ASSERT_TRUE(restored);
-    const auto clone = Kernel::CountedCast<RasterVerticalEdgeDetectCommand>(restored->Clone());
-    ASSERT_TRUE(clone);
-    EXPECT_EQ(Kernel::SerialiseObject(*clone), bytes);
-}
-
-TEST(EdgeKernelText, LanguageZeroCompilesWithNvrtcForEveryFormat) {
-    REQUIRE_NVRTC();
-    using namespace RasterTools;
-    const auto check = [](auto stages, const KernelShape& shape) {
-        PipelineTest::ExpectLanguageZeroCompiles<decltype(stages)>(shape);
-    };
-    [&]<std::size_t... I>(std::index_sequence<I...>) {
-        ((check(EdgeDetectStages::Plain<LayerFormatList::Values[I]>{},
-                {LayerFormatList::Values[I], LayerFormatList::Values[I], std::nullopt, false}),
-          check(DiffuseStages::Plain<LayerFormatList::Values[I]>{},
-                {LayerFormatList::Values[I], LayerFormatList::Values[I], std::nullopt, false})),
-         ...);
-    }
-    (std::make_index_sequence<LayerFormatList::Values.size()>{});
-}
-
 std::string FormatName(const testing::TestParamInfo<PixelFormat>& info) {
     return std::string(Raster::GetPixelFormatName(info.param));
 }

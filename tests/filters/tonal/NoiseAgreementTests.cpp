@@ -224,22 +224,6 @@ TEST(NoiseView, ASingularViewSeedsFromTheNegatedTranslation) {
     EXPECT_EQ(params.block[6], float(0.341 * 0.3));
 }
 
-TEST(NoiseKernelText, LanguageZeroCompilesWithNvrtcForEveryFormat) {
-    REQUIRE_NVRTC();
-    using namespace RasterTools;
-    const auto check = [](auto stages, const KernelShape& shape) {
-        PipelineTest::ExpectLanguageZeroCompiles<decltype(stages)>(shape);
-    };
-    [&]<std::size_t... I>(std::index_sequence<I...>) {
-        ((check(NoiseStages::Plain<LayerFormatList::Values[I]>{},
-                {LayerFormatList::Values[I], LayerFormatList::Values[I], std::nullopt, false}),
-          check(NoiseStages::Masked<LayerFormatList::Values[I]>{},
-                {LayerFormatList::Values[I], LayerFormatList::Values[I], PixelFormat::MaskA8, true})),
-         ...);
-    }
-    (std::make_index_sequence<LayerFormatList::Values.size()>{});
-}
-
 std::string FormatName(const testing::TestParamInfo<PixelFormat>& info) {
     return std::string(Raster::GetPixelFormatName(info.param));
 }

@@ -125,14 +125,6 @@ TEST(UnsharpMaskPixels, TheDeviceGivesTheProcessorsPixels) {
     }
 }
 
-TEST(UnsharpMaskPixels, LanguageZeroStepsCompileWithNvrtcForEveryFormat) {
-    REQUIRE_NVRTC();
-    for (const PixelFormat format : kFormats)
-        PipelineTest::ExpectStepsCompile(
-            RasterTools::UnsharpMaskDevice::GetKernelTexts(Raster::HardwareKernelLanguage::CudaCpp, format),
-            format);
-}
-
 TEST(UnsharpMaskPixels, WholeAndTiledRendersAgreeInEveryFormat) {
     for (const PixelFormat format : kFormats) {
         const auto source = PipelineTest::MakeImage(format, 45, 38, 8);

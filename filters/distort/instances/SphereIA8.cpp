@@ -1,5 +1,0 @@
-// The sphere processor renders of IA8 layers.
-#include "filters/distort/DistortStages.h"
-#include "pipeline/ProcessorInstances.h"
-
-RT_INSTANTIATE_DISTORT(Sphere, IA8)

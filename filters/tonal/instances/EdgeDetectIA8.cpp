@@ -1,5 +1,0 @@
-// The vertical edge detect processor renders of IA8 layers.
-#include "filters/tonal/EdgeDetectStages.h"
-#include "pipeline/ProcessorInstances.h"
-
-RT_INSTANTIATE_EDGE_DETECT(IA8)

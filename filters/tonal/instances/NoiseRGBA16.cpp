@@ -1,5 +1,0 @@
-// The add-noise processor renders of RGBA16 layers.
-#include "filters/tonal/NoiseStages.h"
-#include "pipeline/ProcessorInstances.h"
-
-RT_INSTANTIATE_NOISE(RGBA16)
