@@ -30,11 +30,15 @@ public:
     // scale.
     void ApplyTransform(const Raster::AffineTransform::Params& transform) {
         Distort::TransformCircle(m_Params.centre, m_Params.radius, transform, false);
+        // A scale may carry the circle past the limits that keep its arithmetic finite.
+        BoundParameters(m_Params, Filter::kParameters);
     }
     // The converse, e.g. from document coordinates into a layer's own pixels; false, changing nothing, for a
     // singular transform.
     bool ApplyInverseTransform(const Raster::AffineTransform::Params& transform) {
-        return Distort::TransformCircle(m_Params.centre, m_Params.radius, transform, true);
+        const bool applied = Distort::TransformCircle(m_Params.centre, m_Params.radius, transform, true);
+        BoundParameters(m_Params, Filter::kParameters);
+        return applied;
     }
 
     // Bilinear reads at the image's edge mix in transparent neighbours' weights.

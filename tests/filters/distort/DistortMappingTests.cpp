@@ -160,6 +160,14 @@ TEST(DistortPlacement, TheCircleMovesAndScalesWithTheLayer) {
     sphere->ApplyTransform(Affine(0.0, -3.0, 0.0, 3.0, 0.0, 0.0)); // a turn by 90 degrees, zoom 3
     EXPECT_TRUE(Distort::IsUnset(sphere->GetCentre())) << "an unset centre stays unset";
     EXPECT_DOUBLE_EQ(sphere->GetRadius(), 30.0);
+
+    // A layer scaled up without end cannot carry the circle past the limits that keep its arithmetic finite.
+    const auto huge = Affine(1e12, 0.0, 0.0, 0.0, 1e12, 0.0);
+    twirl->ApplyTransform(huge);
+    EXPECT_LE(twirl->GetRadius(), 1e6);
+    EXPECT_LE(std::abs(twirl->GetCentre().x), 1e6);
+    EXPECT_TRUE(twirl->ApplyInverseTransform(Affine(1e-12, 0.0, 0.0, 0.0, 1e-12, 0.0)));
+    EXPECT_LE(twirl->GetRadius(), 1e6);
 }
 
 TEST(DistortPlacement, TheStageBlockIsTheInverseViewThenTheCircleInSourcePixels) {
