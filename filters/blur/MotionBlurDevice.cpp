@@ -4,6 +4,7 @@
 #include "filters/blur/MotionBlurDevice.h"
 
 #include "filters/blur/BlurKernelText.h"
+#include "filters/blur/BlurMath.h"
 #include "pipeline/DeviceSteps.h"
 
 namespace RasterTools::MotionBlurDevice {
@@ -21,13 +22,10 @@ KERNEL(motion_blur_resample_in)(GLOBAL const T* source, int sourceWidth, int sou
                                 GLOBAL const double* plan, int q0, int rows, int j0, int lines) {
     const int r = GLOBAL_X, j = GLOBAL_Y;
     if (r >= rows || j >= lines) return;
-    const double c = plan[0], s = plan[1], px = plan[2], py = plan[3];
-    const double mx = (double)(j0 + j) + 0.5 - px;
-    const double my = (double)(q0 + r) + 0.5 - py;
-    const double baseX = -s * my + px - 0.5, baseY = c * my + py - 0.5;
+    double x, y;
+    rt_turn_in(plan[0], plan[1], plan[2], plan[3], j0 + j, q0 + r, &x, &y);
     T value[RT_N];
-    rt_sample_bilinear(source, 0, 0, sourceWidth, sourceHeight, 1, sourceWidth, baseX + c * mx, baseY + s * mx,
-                       value);
+    rt_sample_bilinear(source, 0, 0, sourceWidth, sourceHeight, 1, sourceWidth, x, y, value);
     GLOBAL T* to = rotated + rt_line_pixel(j, rows, q0, q0 + r);
     for (int k = 0; k < RT_N; ++k)
         to[k] = value[k];
@@ -73,13 +71,7 @@ KERNEL(motion_blur_lines)(GLOBAL const T* rotated, int q0, int rowsIn, GLOBAL T*
             for (int c = 0; c < RT_N; ++c)
                 total[c] += fraction * (float)outer[c];
         }
-        // Colour is divided by the normalised alpha unless that is exactly 1 or within 1e-20 of 0.
-        const float alpha = total[RT_A] * inverse / RT_MAX;
-        const int divide = alpha != 1.0f && !(alpha > -1e-20f && alpha < 1e-20f);
-        const float colourScale = inverse / RT_PSCALE / (divide ? alpha : 1.0f);
-        GLOBAL T* to = blurred + rt_line_pixel(j, rowsOut, r0, b);
-        for (int c = 0; c < RT_N; ++c)
-            to[c] = rt_store(c == RT_A ? total[RT_A] * inverse : total[c] * colourScale);
+        rt_resolve(total, inverse, blurred + rt_line_pixel(j, rowsOut, r0, b));
     }
 }
 
@@ -99,22 +91,12 @@ KERNEL(motion_blur_resample_out)(GLOBAL const T* blurred, int j0, int lines, int
         for (int k = 0; k < RT_N; ++k)
             value[k] = source[at + k];
     } else {
-        const double c = plan[0], s = plan[1], px = plan[2], py = plan[3];
-        const double my = (double)y + 0.5 - py;
-        const double baseX = s * my + px - 0.5, baseY = c * my + py - 0.5;
-        const double mx = (double)x + 0.5 - px;
-        rt_sample_bilinear(blurred, j0, r0, lines, rows, rows, 1, baseX + c * mx, baseY - s * mx, value);
+        double sx, sy;
+        rt_turn_out(plan[0], plan[1], plan[2], plan[3], x, y, &sx, &sy);
+        rt_sample_bilinear(blurred, j0, r0, lines, rows, rows, 1, sx, sy, value);
     }
-    if (hasMask) {
-        const uchar m = mask[(rt_index)y * maskWidth + x];
-        if (m != 255) {
-            const float w = (float)m / 255.0f;
-            for (int k = 0; k < RT_N; ++k)
-                value[k] = rt_store((float)source[at + k] + ((float)value[k] - (float)source[at + k]) * w);
-        }
-    }
-    for (int k = 0; k < RT_N; ++k)
-        if (channelMask < 0 || (channelMask & rt_channel_bit(k))) dest[at + k] = value[k];
+    rt_write_masked(value, source + at, hasMask ? (int)mask[(rt_index)y * maskWidth + x] : 255, channelMask,
+                    dest + at);
 }
 )";
 
@@ -123,7 +105,8 @@ struct Kernels {
 };
 
 Kernels Build(Raster::HardwareKernelLanguage language, Raster::PixelFormat format) {
-    const std::string text = Blur::PixelsKernelText(language, format) + StepsText;
+    const std::string text =
+        Blur::PixelsKernelText(language, format) + "\n" + Blur::GetBlurTurnText() + "\n" + StepsText;
     return {
         {text, "motion_blur_resample_in"}, {text, "motion_blur_lines"}, {text, "motion_blur_resample_out"}};
 }
