@@ -9,13 +9,20 @@
 #include <cmath>
 #include <cstring>
 #include <limits>
+#include <string>
 #include <type_traits>
 
 namespace RasterTools::NoiseGenerator {
 
 const char* GetNoiseGeneratorText() {
-    static const char* const text = RASTER_KERNEL_STRINGIFY(RT_NOISE_GENERATOR_SOURCE);
-    return text;
+    static const std::string text = [] {
+        std::string names = "enum {";
+        for (const auto& [name, value] : SamplerIndexNames)
+            names += std::string(" ") + name + " = " + std::to_string(value) + ",";
+        names.back() = ' ';
+        return names + "};\n" + RASTER_KERNEL_STRINGIFY(RT_NOISE_GENERATOR_SOURCE);
+    }();
+    return text.c_str();
 }
 
 namespace {
