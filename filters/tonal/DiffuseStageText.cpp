@@ -9,7 +9,8 @@ namespace RasterTools {
 
 namespace {
 
-// The processor's DiffuseSampler::Sample: the generator's DiffuseMoved, then the read.
+// The processor's DiffuseSampler::Sample: the generator's DiffuseMoved, then the read. The seed maps the
+// integer location, not its centre: no MapPixelCenter here.
 constexpr const char* SampleBody =
     R"(const int2 coords = TransformPixelCenterToInt(location,transform_params);
 const int2 moved = DiffuseMoved(location,coords,sampler_params);

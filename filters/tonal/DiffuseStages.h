@@ -58,7 +58,7 @@ struct DiffuseSampler {
                 alignas(64) std::uint32_t seeds[SpanPixels];
                 alignas(64) float draws[2][SpanPixels];
                 alignas(64) int xs[SpanPixels], ys[SpanPixels];
-                SpanSeeds(x0, y, params.block, seeds);
+                SpanDiffuseSeeds(x0, y, params.block, seeds);
                 SpanUnitDraws(seeds, 2, draws);
                 for (int i = 0; i < SpanPixels; ++i) {
                     xs[i] = x0 + i + int((draws[0][i] * 1024.0f - 512.0f) * sigma);

@@ -26,7 +26,8 @@
 // Hash seeds the generator; RandomGet (host fragments) is a linear congruential step returning 16 bits.
 // Uniform noise is one draw in [-sigma, sigma]; gaussian noise sums twelve draws (standard deviation
 // sigma / 6, always within +-sigma). The seed is the hash of the pixel's place under the sampler affine,
-// row-major with the raster's width, so that it does not depend on tiling. NoiseDraws draws the noise of
+// row-major with the raster's width, so that it does not depend on tiling: noise maps the pixel's centre
+// and floors, diffuse maps the integer location and truncates toward zero. NoiseDraws draws the noise of
 // `channels` channels in channel order (mono: one draw for all). Diffuse moves a location by two draws,
 // each scaled to at most 512 × sigma and truncated toward zero, with 32-bit wrap-around.
 #define RT_NOISE_GENERATOR_SOURCE                                                                            \
@@ -88,9 +89,14 @@
     RT_NOISE_FUNCTION int MovedBy(int at, int offset) {                                                      \
         return (int)((uint)at + (uint)offset);                                                               \
     }                                                                                                        \
+    RT_NOISE_FUNCTION uint DiffuseSeed(int2 at, params_address_space float* sampler_params) {                \
+        const float2 place = SamplerAffine(convert_float2(at), sampler_params);                              \
+        return Hash((uint)rt_sat_int(place.y) * (uint)(int)sampler_params[WidthIndex] +                      \
+                    (uint)rt_sat_int(place.x));                                                              \
+    }                                                                                                        \
     RT_NOISE_FUNCTION int2 DiffuseMoved(int2 location, int2 at,                                              \
                                         params_address_space float* sampler_params) {                        \
-        uint state = NoiseSeed(at, sampler_params);                                                          \
+        uint state = DiffuseSeed(at, sampler_params);                                                        \
         const float sigma = sampler_params[SigmaIndex];                                                      \
         const int dx = DiffuseOffset(GetRandom(&state), sigma);                                              \
         const int dy = DiffuseOffset(GetRandom(&state), sigma);                                              \
@@ -140,6 +146,7 @@ inline constexpr const char* DefinedNames[] = {
     "SamplerAffine",
     "NoiseSeed",
     "NoiseDraws",
+    "DiffuseSeed",
     "DiffuseOffset",
     "MovedBy",
     "DiffuseMoved",
@@ -162,8 +169,9 @@ const char* GetNoiseGeneratorText();
 inline constexpr int SpanPixels = 32;
 
 // The seeds of pixels (x0 + i, y), i < 32, whose integer source location is their own (the identity
-// transform stage).
+// transform stage): NoiseSeed's, and DiffuseSeed's.
 void SpanSeeds(int x0, int y, const float* samplerParams, std::uint32_t* seeds) noexcept;
+void SpanDiffuseSeeds(int x0, int y, const float* samplerParams, std::uint32_t* seeds) noexcept;
 
 // The noise of `channels` channels for 32 seeds, as GetNoise draws it channel after channel from each seed:
 // noise[c][i] for pixel i. channels is 1 to 4.
