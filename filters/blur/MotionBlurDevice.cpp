@@ -7,9 +7,34 @@
 #include "filters/blur/BlurMath.h"
 #include "pipeline/DeviceSteps.h"
 
+#include <string>
+
 namespace RasterTools::MotionBlurDevice {
 
 namespace {
+
+// The rotation table's doubles, by index: the processor's enum and the kernel text's constants are both made
+// from this list.
+#define RT_TURN_INDICES(X)                                                                                   \
+    X(TurnCosine, 0)                                                                                         \
+    X(TurnSine, 1)                                                                                           \
+    X(TurnPivotX, 2)                                                                                         \
+    X(TurnPivotY, 3)                                                                                         \
+    X(TurnCount, 4)
+enum TurnIndex : int {
+#define RT_TURN_ENUMERATOR(name, value) name = value,
+    RT_TURN_INDICES(RT_TURN_ENUMERATOR)
+#undef RT_TURN_ENUMERATOR
+};
+
+std::string TurnIndexText() {
+    std::string text = "enum {";
+#define RT_TURN_NAME(name, value) text += " " #name " = " #value ",";
+    RT_TURN_INDICES(RT_TURN_NAME)
+#undef RT_TURN_NAME
+    text.back() = ' ';
+    return text + "};\n";
+}
 
 constexpr const char* StepsText = R"(
 // Pixel b of the rows of line j that a buffer holds from row first on, rows to a line.
@@ -23,7 +48,7 @@ KERNEL(motion_blur_resample_in)(GLOBAL const T* source, int sourceWidth, int sou
     const int r = GLOBAL_X, j = GLOBAL_Y;
     if (r >= rows || j >= lines) return;
     double x, y;
-    rt_turn_in(plan[0], plan[1], plan[2], plan[3], j0 + j, q0 + r, &x, &y);
+    rt_turn_in(plan[TurnCosine], plan[TurnSine], plan[TurnPivotX], plan[TurnPivotY], j0 + j, q0 + r, &x, &y);
     T value[RT_N];
     rt_sample_bilinear(source, 0, 0, sourceWidth, sourceHeight, 1, sourceWidth, x, y, value);
     GLOBAL T* to = rotated + rt_line_pixel(j, rows, q0, q0 + r);
@@ -92,7 +117,7 @@ KERNEL(motion_blur_resample_out)(GLOBAL const T* blurred, int j0, int lines, int
             value[k] = source[at + k];
     } else {
         double sx, sy;
-        rt_turn_out(plan[0], plan[1], plan[2], plan[3], x, y, &sx, &sy);
+        rt_turn_out(plan[TurnCosine], plan[TurnSine], plan[TurnPivotX], plan[TurnPivotY], x, y, &sx, &sy);
         rt_sample_bilinear(blurred, j0, r0, lines, rows, rows, 1, sx, sy, value);
     }
     rt_write_masked(value, source + at, hasMask ? (int)mask[(rt_index)y * maskWidth + x] : 255, channelMask,
@@ -105,8 +130,8 @@ struct Kernels {
 };
 
 Kernels Build(Raster::HardwareKernelLanguage language, Raster::PixelFormat format) {
-    const std::string text =
-        Blur::PixelsKernelText(language, format) + "\n" + Blur::GetBlurTurnText() + "\n" + StepsText;
+    const std::string text = Blur::PixelsKernelText(language, format) + "\n" + Blur::GetBlurTurnText() +
+                             "\n" + TurnIndexText() + StepsText;
     return {
         {text, "motion_blur_resample_in"}, {text, "motion_blur_lines"}, {text, "motion_blur_resample_out"}};
 }
@@ -148,8 +173,12 @@ bool Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const Motio
 
     DeviceSteps steps(target, rect);
     if (!steps) return false;
-    const double turn[4] = {plan.cosine, plan.sine, plan.pivotX, plan.pivotY};
-    const auto turnTable = steps.Table(turn, 4);
+    double turn[TurnCount];
+    turn[TurnCosine] = plan.cosine;
+    turn[TurnSine] = plan.sine;
+    turn[TurnPivotX] = plan.pivotX;
+    turn[TurnPivotY] = plan.pivotY;
+    const auto turnTable = steps.Table(turn, TurnCount);
     if (!turnTable) return false;
     const Raster::DynamicBuffer& source = *target.source.pixels;
 
