@@ -97,22 +97,21 @@ constexpr const char* HelperToInt =
     "inline int2 TransformPixelCenterToInt(int2 location, params_address_space float* transform_params)\n"
     "{\n    return convert_int2(floor(Transform(convert_float2(location)+0.5f,transform_params)));\n}\n";
 
-constexpr const char* BilinearBody =
-    R"(float2 flocation = TransformPixelCenterToFloat(location,transform_params);
-flocation-=0.5f;
-int ix = rt_sat_int(flocation.x);
-if (flocation.x < 0.0f) ix -= 1;
-int iy = rt_sat_int(flocation.y);
-if (flocation.y < 0.0f) iy -= 1;
-const source_accumulator_type tl = premultiplied_accumulator_from_source(Extend(make_int2(ix, iy),source_bounds,input_pixels,source_params));
-const source_accumulator_type tr = premultiplied_accumulator_from_source(Extend(make_int2(ix + 1, iy),source_bounds,input_pixels,source_params));
-const source_accumulator_type bl = premultiplied_accumulator_from_source(Extend(make_int2(ix, iy + 1),source_bounds,input_pixels,source_params));
-const source_accumulator_type br = premultiplied_accumulator_from_source(Extend(make_int2(ix + 1, iy + 1),source_bounds,input_pixels,source_params));
-const float fx = flocation.x - (float)ix;
-const float fy = flocation.y - (float)iy;
-const source_accumulator_type result = accumulator_from_source(source_minimum()) + tl * ((1.0f - fx) * (1.0f - fy)) + tr * (fx * (1.0f - fy)) + bl * (fy * (1.0f - fx)) + br * (fy * fx);
-(void)sampler_params; (void)sampler_bounds; (void)sampler_pixels;
-return source_from_accumulator(postdivide_source(result));)";
+// The processor's BilinearSampler: the interpolation's tokens (Stages.h), reading through Extend.
+const std::string& BilinearBody() {
+    static const std::string body =
+        std::string("float2 flocation = TransformPixelCenterToFloat(location,transform_params);\n"
+                    "flocation-=0.5f;\n"
+                    "#define RASTER_BILINEAR_READ(x,y) "
+                    "premultiplied_accumulator_from_source(Extend(make_int2(x,y),source_bounds,input_pixels,"
+                    "source_params))\n") +
+        RASTER_KERNEL_STRINGIFY(RASTER_BILINEAR_INTERPOLATION(source_accumulator_type, RASTER_BILINEAR_READ,
+                                                              accumulator_from_source(source_minimum()))) +
+        "\n#undef RASTER_BILINEAR_READ\n"
+        "(void)sampler_params; (void)sampler_bounds; (void)sampler_pixels;\n"
+        "return source_from_accumulator(postdivide_source(result));";
+    return body;
+}
 
 constexpr const char* BitmapMaskBody =
     R"(params_address_space float* transform_block = mask_params + (int)mask_params[0] + 1;
@@ -256,37 +255,20 @@ const char* GetBilinearSampleText(Language language) {
 }
 
 const char* GetFilterText(Raster::PixelFormat dest, bool channelMasked, Language language) {
-    using Table = std::array<std::array<KernelTextPair, 2>, Raster::PixelFormatCount>;
-    static const Table table = [] {
-        return [&]<std::size_t... I>(std::index_sequence<I...>) {
-            auto entry = [](Raster::PixelFormat f) {
-                return std::array<KernelTextPair, 2>{
-                    KernelTextPair(
-                        [f](Language) { return MakeStage(StageSignature::Filter, FilterBody(f, false)); }),
-                    KernelTextPair(
-                        [f](Language) { return MakeStage(StageSignature::Filter, FilterBody(f, true)); })};
-            };
-            return Table{entry(static_cast<Raster::PixelFormat>(I))...};
-        }
-        (std::make_index_sequence<Raster::PixelFormatCount>{});
-    }();
-    if (!Raster::IsValidPixelFormat(dest)) return nullptr;
-    return table[static_cast<std::size_t>(dest)][channelMasked ? 1 : 0].Get(language);
+    static const PerFormatStageText plain([](Raster::PixelFormat f, Language) {
+        return MakeStage(StageSignature::Filter, FilterBody(f, false));
+    });
+    static const PerFormatStageText masked([](Raster::PixelFormat f, Language) {
+        return MakeStage(StageSignature::Filter, FilterBody(f, true));
+    });
+    return (channelMasked ? masked : plain).Get(language, dest);
 }
 
 const char* GetColourOnlyFilterText(Raster::PixelFormat dest, Language language) {
-    using Table = std::array<KernelTextPair, Raster::PixelFormatCount>;
-    static const Table table = [] {
-        return [&]<std::size_t... I>(std::index_sequence<I...>) {
-            return Table{KernelTextPair([](Language l) {
-                return MakeStage(StageSignature::Filter,
-                                 ColourOnlyFilterBody(static_cast<Raster::PixelFormat>(I), l));
-            })...};
-        }
-        (std::make_index_sequence<Raster::PixelFormatCount>{});
-    }();
-    if (!Raster::IsValidPixelFormat(dest)) return nullptr;
-    return table[static_cast<std::size_t>(dest)].Get(language);
+    static const PerFormatStageText texts([](Raster::PixelFormat f, Language l) {
+        return MakeStage(StageSignature::Filter, ColourOnlyFilterBody(f, l));
+    });
+    return texts.Get(language, dest);
 }
 
 #define RT_DEFINE_STAGE_TEXT(Type, Build)                                                                    \
@@ -308,7 +290,7 @@ RT_DEFINE_STAGE_TEXT(Raster::AffineTransform, [](Language) {
 RT_DEFINE_STAGE_TEXT(Raster::IdentitySampler,
                      [](Language) { return MakeStage(StageSignature::Sample, StageBody::NearestSample); })
 RT_DEFINE_STAGE_TEXT(Raster::BilinearSampler,
-                     [](Language) { return MakeStage(StageSignature::Sample, BilinearBody); })
+                     [](Language) { return MakeStage(StageSignature::Sample, BilinearBody()); })
 RT_DEFINE_STAGE_TEXT(Raster::IdentityMask,
                      [](Language) { return MakeStage(StageSignature::ReadMask, StageBody::ReadMask); })
 RT_DEFINE_STAGE_TEXT(Raster::ConstantMask, [](Language) {

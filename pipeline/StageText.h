@@ -4,10 +4,13 @@
 // the channel-masked Filter. StageText<T>::Get(language) gives the text of a processor stage type T; a filter
 // adds its own stage by specialising StageText for its Process type.
 
+#include "host/raster/KernelText.h"
 #include "host/raster/Stages.h"
 
+#include <array>
 #include <string>
 #include <string_view>
+#include <utility>
 
 namespace RasterTools {
 
@@ -89,6 +92,29 @@ const char* GetBilinearSampleText(HardwareKernelLanguage language);
 const char* GetFilterText(Raster::PixelFormat dest, bool channelMasked, HardwareKernelLanguage language);
 // The Filter that writes the colour channels and keeps the destination's alpha.
 const char* GetColourOnlyFilterText(Raster::PixelFormat dest, HardwareKernelLanguage language);
+
+// One text per pixel format and kernel language, built once by build(format, language) (empty text means
+// "none") and kept for the life of the process. Get returns null for an invalid format or a language without
+// text.
+class PerFormatStageText {
+public:
+    template <class Build>
+    explicit PerFormatStageText(Build build)
+        : m_Texts([&]<std::size_t... I>(std::index_sequence<I...>) {
+            return Texts{Raster::KernelTextPair([&](HardwareKernelLanguage language) {
+                return build(static_cast<Raster::PixelFormat>(I), language);
+            })...};
+        }(std::make_index_sequence<Raster::PixelFormatCount>{})) {}
+
+    const char* Get(HardwareKernelLanguage language, Raster::PixelFormat format) const noexcept {
+        if (!Raster::IsValidPixelFormat(format)) return nullptr;
+        return m_Texts[static_cast<std::size_t>(format)].Get(language);
+    }
+
+private:
+    using Texts = std::array<Raster::KernelTextPair, Raster::PixelFormatCount>;
+    Texts m_Texts;
+};
 
 // The kernel text of a processor stage type; specialised per type. Get returns null for a language without
 // text.

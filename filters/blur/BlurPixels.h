@@ -1,8 +1,11 @@
 #pragma once
 // Per-format pixel arithmetic shared by the blurs: component layout, premultiplied sums with integer rules
-// for 8- and 16-bit formats, stores with rounding, and premultiplied bilinear sampling.
+// for 8- and 16-bit formats, stores with rounding, and premultiplied bilinear sampling. The scalar arithmetic
+// is BlurMath.h's, which the device steps paste as text; the lane code here gives the same bytes (see the
+// lane tests).
 
 #include "filters/blur/BlurAvx2.h"
+#include "filters/blur/BlurMath.h"
 #include "host/raster/DynamicBuffer.h"
 #include "host/raster/PixelFormat.h"
 
@@ -18,27 +21,18 @@ namespace RasterTools::Blur {
 
 template <Raster::PixelFormat F>
 struct Layout {
-    static constexpr int N = Raster::GetChannelCount(F);
-    static constexpr int A = Raster::GetPixelFormatInfo(F).alphaIndex;
-    static constexpr bool IsFloat = Raster::IsFloatFormat(F);
-    static constexpr int Bytes = Raster::GetBytesPerComponent(F);
-    using T = std::conditional_t<IsFloat, float, std::conditional_t<Bytes == 1, std::uint8_t, std::uint16_t>>;
-    // Sums are exact integers for integer formats (at most 2^32 / 65535 terms) and doubles for floats.
-    using Acc = std::conditional_t<IsFloat, double, std::uint32_t>;
-    static constexpr float Max = IsFloat ? 1.0f : Bytes == 1 ? 255.0f : 65535.0f;
-    // What a summed premultiplied colour is divided by to give colour units: 8-bit sums hold colour × alpha.
-    static constexpr float PremultipliedScale = Bytes == 1 && !IsFloat ? 255.0f : 1.0f;
-    static_assert(A >= 0 && A < N, "blurs need a format with alpha");
+    using M = Math<F>;
+    static constexpr int N = M::RT_N;
+    static constexpr int A = M::RT_A;
+    static constexpr bool IsFloat = M::IsFloat;
+    static constexpr int Bytes = M::Bytes;
+    using T = typename M::T;
+    using Acc = typename M::ACC;
+    static constexpr float Max = M::RT_MAX;
+    static constexpr float PremultipliedScale = M::RT_PSCALE;
 
     // The premultiplied value of colour component c of a pixel whose alpha is a.
-    static Acc Premultiply(T c, T a) noexcept {
-        if constexpr (IsFloat)
-            return double(c * a);
-        else if constexpr (Bytes == 1)
-            return Acc(c) * Acc(a);
-        else
-            return a < 65535 ? Acc(c) * Acc(a) / 65535u : Acc(c);
-    }
+    static Acc Premultiply(T c, T a) noexcept { return M::rt_premultiply(c, a); }
 
     // Four integer components with alpha last are premultiplied as one vector: for 16 bits, dividing by
     // 65535 where alpha is 65535 gives the colour back, so the division can apply to every pixel.
@@ -46,20 +40,16 @@ struct Layout {
 
     // Adds the premultiplied components of pixel p to sum.
     static void Accumulate(Acc* sum, const T* p) noexcept {
-        if constexpr (Vectorised) {
+        if constexpr (Vectorised)
             Store4(sum, Load4(sum) + Premultiplied4(p));
-        } else {
-            for (int c = 0; c < N; ++c)
-                sum[c] += c == A ? Acc(p[A]) : Premultiply(p[c], p[A]);
-        }
+        else
+            M::rt_accumulate(sum, p);
     }
     static void Remove(Acc* sum, const T* p) noexcept {
-        if constexpr (Vectorised) {
+        if constexpr (Vectorised)
             Store4(sum, Load4(sum) - Premultiplied4(p));
-        } else {
-            for (int c = 0; c < N; ++c)
-                sum[c] -= c == A ? Acc(p[A]) : Premultiply(p[c], p[A]);
-        }
+        else
+            M::rt_remove(sum, p);
     }
 
     using U4 = std::uint32_t __attribute__((vector_size(16)));
@@ -80,12 +70,7 @@ struct Layout {
         }
     }
 
-    static T Store(float v) noexcept {
-        if constexpr (IsFloat)
-            return v;
-        else
-            return T(int(std::clamp(v, 0.0f, Max) + 0.5f)); // round half up: no library call per component
-    }
+    static T Store(float v) noexcept { return M::rt_store(v); }
 
     // Resolve for four pixels at once, one component per register, with the same arithmetic: formats of
     // four components with alpha last.
@@ -94,12 +79,7 @@ struct Layout {
     // Writes the pixel of premultiplied sums colour[] and alpha (in stored units) over total weight: colour
     // is divided by the normalised alpha unless that is exactly 1 or within 1e-20 of 0.
     static void Resolve(const float* sum, float weight, T* out) noexcept {
-        const float inverse = 1.0f / weight;
-        const float alpha = sum[A] * inverse / Max;
-        const bool divide = alpha != 1.0f && !(alpha > -1e-20f && alpha < 1e-20f);
-        const float colourScale = inverse / PremultipliedScale / (divide ? alpha : 1.0f);
-        for (int c = 0; c < N; ++c)
-            out[c] = Store(c == A ? sum[A] * inverse : sum[c] * colourScale);
+        M::rt_resolve(sum, 1.0f / weight, out);
     }
 };
 
@@ -207,27 +187,52 @@ inline void Layout<F>::Resolve4(const float (*sum)[N], float weight, T* out) noe
     Detail::Store4(a, out + 12);
 }
 
+// The four pixels and the fractions of a bilinear sample at (x, y) (BlurMath's cell); true where the sample
+// sits on the centre of p[0].
+template <Raster::PixelFormat F, class Grid>
+inline bool BilinearCell(const Grid& grid, double x, double y, const typename Layout<F>::T* (&p)[4],
+                         float& fx, float& fy) noexcept {
+    int cell[4];
+    float fraction[2];
+    const bool exact = Layout<F>::M::rt_bilinear_cell(x, y, grid.left, grid.top, grid.left + grid.Width() - 1,
+                                                      grid.top + grid.Height() - 1, cell, fraction);
+    p[0] = grid.At(cell[0], cell[1]);
+    p[1] = grid.At(cell[2], cell[1]);
+    p[2] = grid.At(cell[0], cell[3]);
+    p[3] = grid.At(cell[2], cell[3]);
+    fx = fraction[0];
+    fy = fraction[1];
+    return exact;
+}
+
+// The shared scalar sample alone, which the lane code below must equal (the lane tests).
+template <Raster::PixelFormat F, class Grid>
+inline void SampleBilinearScalar(const Grid& grid, double x, double y, typename Layout<F>::T* out) noexcept {
+    const typename Layout<F>::T* p[4];
+    float fx, fy;
+    if (BilinearCell<F>(grid, x, y, p, fx, fy))
+        std::copy_n(p[0], Layout<F>::N, out);
+    else
+        Layout<F>::M::rt_bilinear_mix(p[0], p[1], p[2], p[3], fx, fy, out);
+}
+
 // Premultiplied bilinear sample of grid at continuous index (x, y) of its frame (pixel i's centre is at i),
 // clamped to the grid's edges. A sample exactly on a pixel centre copies that pixel, so quarter turns are
 // exact.
 template <Raster::PixelFormat F, class Grid>
 inline void SampleBilinear(const Grid& grid, double x, double y, typename Layout<F>::T* out) noexcept {
     using L = Layout<F>;
-    using T = typename L::T;
-    const int lastX = grid.left + grid.Width() - 1, lastY = grid.top + grid.Height() - 1;
-    x = std::clamp(x, double(grid.left), double(lastX));
-    y = std::clamp(y, double(grid.top), double(lastY));
-    const int x0 = int(std::floor(x)), y0 = int(std::floor(y));
-    const float fx = float(x - x0), fy = float(y - y0);
-    if (fx == 0.0f && fy == 0.0f) {
-        std::copy_n(grid.At(x0, y0), L::N, out);
-        return;
-    }
-    const int x1 = std::min(x0 + 1, lastX), y1 = std::min(y0 + 1, lastY);
-    const T* p[4] = {grid.At(x0, y0), grid.At(x1, y0), grid.At(x0, y1), grid.At(x1, y1)};
-    const float weight[4] = {(1.0f - fx) * (1.0f - fy), fx * (1.0f - fy), (1.0f - fx) * fy, fx * fy};
-    if constexpr (L::N == 4 && L::A == 3) {
-        // The same arithmetic as below on all four components at once, in the same order.
+    if constexpr (!(L::N == 4 && L::A == 3)) {
+        SampleBilinearScalar<F>(grid, x, y, out);
+    } else {
+        // The shared mix on all four components at once, in the same order.
+        const typename L::T* p[4];
+        float fx, fy;
+        if (BilinearCell<F>(grid, x, y, p, fx, fy)) {
+            std::copy_n(p[0], L::N, out);
+            return;
+        }
+        const float weight[4] = {(1.0f - fx) * (1.0f - fy), fx * (1.0f - fy), (1.0f - fx) * fy, fx * fy};
         __m128 v[4], sum = _mm_setzero_ps();
         float alpha = 0.0f;
         for (int k = 0; k < 4; ++k) {
@@ -248,29 +253,7 @@ inline void SampleBilinear(const Grid& grid, double x, double y, typename Layout
         const __m128 last = _mm_castsi128_ps(_mm_set_epi32(-1, 0, 0, 0));
         sum = _mm_or_ps(_mm_and_ps(last, _mm_set1_ps(alphaOut)), _mm_andnot_ps(last, sum));
         Detail::Store4(sum, out);
-        return;
     }
-    float alpha = 0.0f;
-    float colour[L::N] = {};
-    for (int k = 0; k < 4; ++k) {
-        const float a = float(p[k][L::A]) * weight[k];
-        alpha += a;
-        for (int c = 0; c < L::N; ++c)
-            colour[c] += float(p[k][c]) * a;
-    }
-    const T alphaOut = L::Store(alpha);
-    // Where every neighbour is transparent the colour has no weight; the plain average keeps it defined.
-    if (!(std::fabs(alpha) >= 1e-20f)) {
-        for (int c = 0; c < L::N; ++c) {
-            colour[c] = 0.0f;
-            for (int k = 0; k < 4; ++k)
-                colour[c] += float(p[k][c]) * weight[k];
-        }
-        alpha = 1.0f;
-    }
-    const float inverse = 1.0f / alpha;
-    for (int c = 0; c < L::N; ++c)
-        out[c] = c == L::A ? alphaOut : L::Store(colour[c] * inverse);
 }
 
 // Four samples at once, each exactly as SampleBilinear gives it: formats of four components with alpha last
@@ -285,23 +268,11 @@ inline void SampleBilinear4(const Grid& grid, const double* xs, const double* ys
         for (int i = 0; i < 4; ++i)
             SampleBilinear<F>(grid, xs[i], ys[i], out + i * L::N);
     } else {
-        const int lastX = grid.left + grid.Width() - 1, lastY = grid.top + grid.Height() - 1;
         alignas(16) float fxs[4], fys[4];
         const T* p[4][4];
         int exact = 0; // pixels that sit on a pixel centre and copy it
-        for (int i = 0; i < 4; ++i) {
-            const double x = std::clamp(xs[i], double(grid.left), double(lastX));
-            const double y = std::clamp(ys[i], double(grid.top), double(lastY));
-            const int x0 = int(std::floor(x)), y0 = int(std::floor(y));
-            fxs[i] = float(x - x0);
-            fys[i] = float(y - y0);
-            const int x1 = std::min(x0 + 1, lastX), y1 = std::min(y0 + 1, lastY);
-            p[i][0] = grid.At(x0, y0);
-            p[i][1] = grid.At(x1, y0);
-            p[i][2] = grid.At(x0, y1);
-            p[i][3] = grid.At(x1, y1);
-            if (fxs[i] == 0.0f && fys[i] == 0.0f) exact |= 1 << i;
-        }
+        for (int i = 0; i < 4; ++i)
+            if (BilinearCell<F>(grid, xs[i], ys[i], p[i], fxs[i], fys[i])) exact |= 1 << i;
         const __m128 one = _mm_set1_ps(1.0f);
         const __m128 fx = _mm_load_ps(fxs), fy = _mm_load_ps(fys);
         const __m128 gx = _mm_sub_ps(one, fx), gy = _mm_sub_ps(one, fy);
@@ -379,11 +350,8 @@ inline void SampleBilinearRun(const Grid& grid, int first, int last, const Posit
 
 // The write-mask bit of component c of a pixel of F (see Raster::WriteChannels).
 template <Raster::PixelFormat F>
-constexpr int ChannelBit(int c) noexcept {
-    if constexpr (Layout<F>::N == 2)
-        return c == 0 ? 7 : 8;
-    else
-        return 1 << c;
+int ChannelBit(int c) noexcept {
+    return Math<F>::rt_channel_bit(c);
 }
 
 } // namespace RasterTools::Blur

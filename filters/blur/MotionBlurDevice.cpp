@@ -4,11 +4,37 @@
 #include "filters/blur/MotionBlurDevice.h"
 
 #include "filters/blur/BlurKernelText.h"
+#include "filters/blur/BlurMath.h"
 #include "pipeline/DeviceSteps.h"
+
+#include <string>
 
 namespace RasterTools::MotionBlurDevice {
 
 namespace {
+
+// The rotation table's doubles, by index: the processor's enum and the kernel text's constants are both made
+// from this list.
+#define RT_TURN_INDICES(X)                                                                                   \
+    X(TurnCosine, 0)                                                                                         \
+    X(TurnSine, 1)                                                                                           \
+    X(TurnPivotX, 2)                                                                                         \
+    X(TurnPivotY, 3)                                                                                         \
+    X(TurnCount, 4)
+enum TurnIndex : int {
+#define RT_TURN_ENUMERATOR(name, value) name = value,
+    RT_TURN_INDICES(RT_TURN_ENUMERATOR)
+#undef RT_TURN_ENUMERATOR
+};
+
+std::string TurnIndexText() {
+    std::string text = "enum {";
+#define RT_TURN_NAME(name, value) text += " " #name " = " #value ",";
+    RT_TURN_INDICES(RT_TURN_NAME)
+#undef RT_TURN_NAME
+    text.back() = ' ';
+    return text + "};\n";
+}
 
 constexpr const char* StepsText = R"(
 // Pixel b of the rows of line j that a buffer holds from row first on, rows to a line.
@@ -21,13 +47,10 @@ KERNEL(motion_blur_resample_in)(GLOBAL const T* source, int sourceWidth, int sou
                                 GLOBAL const double* plan, int q0, int rows, int j0, int lines) {
     const int r = GLOBAL_X, j = GLOBAL_Y;
     if (r >= rows || j >= lines) return;
-    const double c = plan[0], s = plan[1], px = plan[2], py = plan[3];
-    const double mx = (double)(j0 + j) + 0.5 - px;
-    const double my = (double)(q0 + r) + 0.5 - py;
-    const double baseX = -s * my + px - 0.5, baseY = c * my + py - 0.5;
+    double x, y;
+    rt_turn_in(plan[TurnCosine], plan[TurnSine], plan[TurnPivotX], plan[TurnPivotY], j0 + j, q0 + r, &x, &y);
     T value[RT_N];
-    rt_sample_bilinear(source, 0, 0, sourceWidth, sourceHeight, 1, sourceWidth, baseX + c * mx, baseY + s * mx,
-                       value);
+    rt_sample_bilinear(source, 0, 0, sourceWidth, sourceHeight, 1, sourceWidth, x, y, value);
     GLOBAL T* to = rotated + rt_line_pixel(j, rows, q0, q0 + r);
     for (int k = 0; k < RT_N; ++k)
         to[k] = value[k];
@@ -73,13 +96,7 @@ KERNEL(motion_blur_lines)(GLOBAL const T* rotated, int q0, int rowsIn, GLOBAL T*
             for (int c = 0; c < RT_N; ++c)
                 total[c] += fraction * (float)outer[c];
         }
-        // Colour is divided by the normalised alpha unless that is exactly 1 or within 1e-20 of 0.
-        const float alpha = total[RT_A] * inverse / RT_MAX;
-        const int divide = alpha != 1.0f && !(alpha > -1e-20f && alpha < 1e-20f);
-        const float colourScale = inverse / RT_PSCALE / (divide ? alpha : 1.0f);
-        GLOBAL T* to = blurred + rt_line_pixel(j, rowsOut, r0, b);
-        for (int c = 0; c < RT_N; ++c)
-            to[c] = rt_store(c == RT_A ? total[RT_A] * inverse : total[c] * colourScale);
+        rt_resolve(total, inverse, blurred + rt_line_pixel(j, rowsOut, r0, b));
     }
 }
 
@@ -99,22 +116,12 @@ KERNEL(motion_blur_resample_out)(GLOBAL const T* blurred, int j0, int lines, int
         for (int k = 0; k < RT_N; ++k)
             value[k] = source[at + k];
     } else {
-        const double c = plan[0], s = plan[1], px = plan[2], py = plan[3];
-        const double my = (double)y + 0.5 - py;
-        const double baseX = s * my + px - 0.5, baseY = c * my + py - 0.5;
-        const double mx = (double)x + 0.5 - px;
-        rt_sample_bilinear(blurred, j0, r0, lines, rows, rows, 1, baseX + c * mx, baseY - s * mx, value);
+        double sx, sy;
+        rt_turn_out(plan[TurnCosine], plan[TurnSine], plan[TurnPivotX], plan[TurnPivotY], x, y, &sx, &sy);
+        rt_sample_bilinear(blurred, j0, r0, lines, rows, rows, 1, sx, sy, value);
     }
-    if (hasMask) {
-        const uchar m = mask[(rt_index)y * maskWidth + x];
-        if (m != 255) {
-            const float w = (float)m / 255.0f;
-            for (int k = 0; k < RT_N; ++k)
-                value[k] = rt_store((float)source[at + k] + ((float)value[k] - (float)source[at + k]) * w);
-        }
-    }
-    for (int k = 0; k < RT_N; ++k)
-        if (channelMask < 0 || (channelMask & rt_channel_bit(k))) dest[at + k] = value[k];
+    rt_write_masked(value, source + at, hasMask ? (int)mask[(rt_index)y * maskWidth + x] : 255, channelMask,
+                    dest + at);
 }
 )";
 
@@ -123,7 +130,8 @@ struct Kernels {
 };
 
 Kernels Build(Raster::HardwareKernelLanguage language, Raster::PixelFormat format) {
-    const std::string text = Blur::PixelsKernelText(language, format) + StepsText;
+    const std::string text = Blur::PixelsKernelText(language, format) + "\n" + Blur::GetBlurTurnText() +
+                             "\n" + TurnIndexText() + StepsText;
     return {
         {text, "motion_blur_resample_in"}, {text, "motion_blur_lines"}, {text, "motion_blur_resample_out"}};
 }
@@ -165,8 +173,12 @@ bool Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const Motio
 
     DeviceSteps steps(target, rect);
     if (!steps) return false;
-    const double turn[4] = {plan.cosine, plan.sine, plan.pivotX, plan.pivotY};
-    const auto turnTable = steps.Table(turn, 4);
+    double turn[TurnCount];
+    turn[TurnCosine] = plan.cosine;
+    turn[TurnSine] = plan.sine;
+    turn[TurnPivotX] = plan.pivotX;
+    turn[TurnPivotY] = plan.pivotY;
+    const auto turnTable = steps.Table(turn, TurnCount);
     if (!turnTable) return false;
     const Raster::DynamicBuffer& source = *target.source.pixels;
 

@@ -18,10 +18,13 @@ class LineOfPixel {
 public:
     LineOfPixel(const Plan& plan, int y) noexcept
         : m_Plan(plan)
+        , m_Y(y)
         , m_Base(plan.sine * (double(y) + 0.5 - plan.pivotY) + plan.pivotX - 0.5) {}
 
     int operator()(int x) const noexcept {
-        const double at = m_Base + m_Plan.cosine * (double(x) + 0.5 - m_Plan.pivotX);
+        double at, unused;
+        Blur::Turn::rt_turn_out(m_Plan.cosine, m_Plan.sine, m_Plan.pivotX, m_Plan.pivotY, x, m_Y, &at,
+                                &unused);
         const double clamped = std::clamp(at, double(m_Plan.box.left), double(m_Plan.box.right - 1));
         return int(std::floor(clamped)) - m_Plan.box.left;
     }
@@ -56,7 +59,8 @@ public:
 
 private:
     const Plan& m_Plan;
-    double m_Base;
+    int m_Y;
+    double m_Base; // where the line of the row's pixel x is m_Base + cosine (x + 0.5 - pivotX): for guesses
 };
 
 #if RT_AVX2_BUILD
@@ -163,12 +167,8 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
             const RowRange rows = sampledRows(j);
             if (rows.first >= rows.last) continue;
             T* line = rotated->Row<T>(i) + std::ptrdiff_t(lead) * N;
-            const double mx = double(plan.box.left + j) + 0.5 - px;
             auto position = [&](int r, double& x, double& y) {
-                const double my = double(plan.box.top - reach + r) + 0.5 - py;
-                const double baseX = -s * my + px - 0.5, baseY = c * my + py - 0.5;
-                x = baseX + c * mx;
-                y = baseY + s * mx;
+                Blur::Turn::rt_turn_in(c, s, px, py, plan.box.left + j, plan.box.top - reach + r, &x, &y);
             };
             Blur::SampleBilinearRun<F>(sourceGrid, rows.first, rows.last, position, line);
         }
@@ -241,15 +241,11 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
             const int b = lineOf.Boundary(end, rect.left, rect.right);
             const int left = c < 0.0 ? b : a, right = c < 0.0 ? a : b;
             if (left >= right) continue;
-            const double my = double(y) + 0.5 - py;
-            const double baseX = s * my + px - 0.5, baseY = c * my + py - 0.5;
             T* out = destination.Row<T>(y);
             const T* original = source.Row<T>(y);
             const std::uint8_t* weights = mask ? mask->Row<std::uint8_t>(y) : nullptr;
             auto position = [&](int x, double& sx, double& sy) {
-                const double mx = double(x) + 0.5 - px;
-                sx = baseX + c * mx;
-                sy = baseY - s * mx;
+                Blur::Turn::rt_turn_out(c, s, px, py, x, y, &sx, &sy);
             };
             if (!weights && writesAll) { // straight into the destination
                 Blur::SampleBilinearRun<F>(blurredGrid, left, right, position, out);
@@ -260,15 +256,8 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
                 position(x, sx, sy);
                 T value[N];
                 Blur::SampleBilinear<F>(blurredGrid, sx, sy, value);
-                T* pixel = out + std::size_t(x) * N;
-                if (weights && weights[x] != 255) {
-                    const float w = float(weights[x]) / 255.0f;
-                    const T* from = original + std::size_t(x) * N;
-                    for (int k = 0; k < N; ++k)
-                        value[k] = L::Store(float(from[k]) + (float(value[k]) - float(from[k])) * w);
-                }
-                for (int k = 0; k < N; ++k)
-                    if (channelMask < 0 || (channelMask & Blur::ChannelBit<F>(k))) pixel[k] = value[k];
+                L::M::rt_write_masked(value, original + std::size_t(x) * N, weights ? weights[x] : 255,
+                                      channelMask, out + std::size_t(x) * N);
             }
         }
     }

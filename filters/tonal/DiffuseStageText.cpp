@@ -9,14 +9,11 @@ namespace RasterTools {
 
 namespace {
 
-// The processor's DiffuseSampler::Sample, Offset and Moved, step for step.
+// The processor's DiffuseSampler::Sample: the generator's DiffuseMoved, then the read. The seed maps the
+// integer location, not its centre: no MapPixelCenter here.
 constexpr const char* SampleBody =
     R"(const int2 coords = TransformPixelCenterToInt(location,transform_params);
-// MapPixelCenter! The seed is taken as the noise filter takes it (NoiseSeed maps the pixel centre).
-uint random = NoiseSeed(coords,sampler_params);
-const int dx = rt_sat_int((GetRandom(&random)*1024.0f-512.0f)*sampler_params[6]);
-const int dy = rt_sat_int((GetRandom(&random)*1024.0f-512.0f)*sampler_params[6]);
-const int2 moved = make_int2((int)((uint)location.x+(uint)dx),(int)((uint)location.y+(uint)dy));
+const int2 moved = DiffuseMoved(location,coords,sampler_params);
 (void)sampler_bounds;
 (void)sampler_pixels;
 return Extend(TransformPixelCenterToInt(moved,transform_params),source_bounds,input_pixels,source_params);)";

@@ -29,25 +29,14 @@ struct DiffuseSampler {
         float block[FloatCount] = {1.0f, 0.0f, 0.0f, 0.0f, 1.0f, 0.0f, 0.0f, 0.0f};
     };
 
-    // One axis' offset from a draw in 0..1: truncated toward zero (saturating, as the kernel text does).
-    static int Offset(float random, float sigma) noexcept {
-        return Raster::KernelMath::rt_sat_int((random * 1024.0f - 512.0f) * sigma);
-    }
-    // A location moved by an offset, with the 32-bit wrap-around of the kernel text.
-    static int Moved(int at, int offset) noexcept { return int(std::uint32_t(at) + std::uint32_t(offset)); }
-
-    // One pixel, exactly as the kernel text does it.
+    // One pixel, with the generator's DiffuseMoved as the kernel text calls it.
     template <class Transform, class Extend, class Image>
     static typename Image::Stored Sample(const Image& image, Raster::KernelMath::int2 location,
                                          const Raster::PreparedTransform<Transform>& t,
                                          const Params& params) noexcept {
         using namespace NoiseGenerator;
         const Raster::KernelMath::int2 at = Raster::TransformPixelCenterToInt<Transform>(location, t);
-        uint state = NoiseSeed(at, params.block);
-        const float sigma = params.block[SigmaIndex];
-        const int dx = Offset(GetRandom(&state), sigma);
-        const int dy = Offset(GetRandom(&state), sigma);
-        const auto moved = Raster::KernelMath::make_int2(Moved(location.x, dx), Moved(location.y, dy));
+        const Raster::KernelMath::int2 moved = DiffuseMoved(location, at, params.block);
         return Extend::Read(image, Raster::TransformPixelCenterToInt<Transform>(moved, t));
     }
 
@@ -69,7 +58,7 @@ struct DiffuseSampler {
                 alignas(64) std::uint32_t seeds[SpanPixels];
                 alignas(64) float draws[2][SpanPixels];
                 alignas(64) int xs[SpanPixels], ys[SpanPixels];
-                SpanSeeds(x0, y, params.block, seeds);
+                SpanDiffuseSeeds(x0, y, params.block, seeds);
                 SpanUnitDraws(seeds, 2, draws);
                 for (int i = 0; i < SpanPixels; ++i) {
                     xs[i] = x0 + i + int((draws[0][i] * 1024.0f - 512.0f) * sigma);

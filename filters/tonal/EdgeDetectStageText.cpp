@@ -5,6 +5,7 @@
 #include "host/raster/KernelText.h"
 
 #include <array>
+#include <iterator>
 #include <string>
 #include <vector>
 
@@ -15,19 +16,13 @@ namespace {
 using Language = HardwareKernelLanguage;
 using Raster::PixelFormat;
 
-// %1 takes the magnitudes of the colour lanes, %2 copies the colour channels of the result into initial.
+// %1 is the taps (EdgeTaps) and the centre's read, %2 takes the magnitudes of the colour lanes, %3 copies the
+// colour channels of the result into initial.
 constexpr const char* SampleBody =
     R"(source_accumulator_type acc = accumulator_from_source(source_minimum());
-acc = acc - accumulator_from_source(Extend(TransformPixelCenterToInt(make_int2((int)((uint)location.x-1u),(int)((uint)location.y-1u)),transform_params),source_bounds,input_pixels,source_params));
-acc = acc + accumulator_from_source(Extend(TransformPixelCenterToInt(make_int2((int)((uint)location.x+1u),(int)((uint)location.y-1u)),transform_params),source_bounds,input_pixels,source_params));
-acc = acc - accumulator_from_source(Extend(TransformPixelCenterToInt(make_int2((int)((uint)location.x-1u),location.y),transform_params),source_bounds,input_pixels,source_params))*2.0f;
-source_type initial = Extend(TransformPixelCenterToInt(location,transform_params),source_bounds,input_pixels,source_params);
-acc = acc + accumulator_from_source(Extend(TransformPixelCenterToInt(make_int2((int)((uint)location.x+1u),location.y),transform_params),source_bounds,input_pixels,source_params))*2.0f;
-acc = acc - accumulator_from_source(Extend(TransformPixelCenterToInt(make_int2((int)((uint)location.x-1u),(int)((uint)location.y+1u)),transform_params),source_bounds,input_pixels,source_params));
-acc = acc + accumulator_from_source(Extend(TransformPixelCenterToInt(make_int2((int)((uint)location.x+1u),(int)((uint)location.y+1u)),transform_params),source_bounds,input_pixels,source_params));
-%1source_clamp_accumulator(acc);
+%1%2source_clamp_accumulator(acc);
 const source_type clamped = source_from_accumulator(acc);
-%2(void)sampler_params;
+%3(void)sampler_params;
 (void)sampler_bounds;
 (void)sampler_pixels;
 return initial;)";
@@ -54,6 +49,33 @@ EdgeFormat Describe(PixelFormat format) {
     }
 }
 
+// One coordinate of a tap: the location's, moved with the processor's 32-bit wrap-around.
+std::string TapCoordinate(const char* axis, int d) {
+    const std::string at = std::string("location.") + axis;
+    if (d == 0) return at;
+    return "(int)((uint)" + at + (d < 0 ? "-" : "+") + std::to_string(d < 0 ? -d : d) + "u)";
+}
+
+// The taps in order, each added or taken away with its weight's magnitude (whole numbers), and the centre's
+// read among them.
+std::string TapsText() {
+    std::string text;
+    for (int k = 0; k < int(std::size(EdgeTaps)); ++k) {
+        if (k == EdgeCentreAfter)
+            text += "source_type initial = "
+                    "Extend(TransformPixelCenterToInt(location,transform_params),source_bounds,input_pixels,"
+                    "source_params);\n";
+        const EdgeTap tap = EdgeTaps[k];
+        const float magnitude = tap.weight < 0.0f ? -tap.weight : tap.weight;
+        text += std::string("acc = acc ") + (tap.weight < 0.0f ? "-" : "+") +
+                " accumulator_from_source(Extend(TransformPixelCenterToInt(make_int2(" +
+                TapCoordinate("x", tap.dx) + "," + TapCoordinate("y", tap.dy) +
+                "),transform_params),source_bounds,input_pixels,source_params))" +
+                (magnitude == 1.0f ? std::string() : "*" + std::to_string(int(magnitude)) + ".0f") + ";\n";
+    }
+    return text;
+}
+
 std::string BuildText(PixelFormat format, Language language) {
     if (!Raster::IsKernelTextLanguage(language)) return {};
     const EdgeFormat f = Describe(format);
@@ -63,22 +85,15 @@ std::string BuildText(PixelFormat format, Language language) {
         magnitudes += std::string("acc.") + f.lanes[c] + " = rt_fabs(acc." + f.lanes[c] + ");\n";
         copies += std::string("initial.") + f.channels[c] + " = clamped." + f.channels[c] + ";\n";
     }
-    return MakeStage(StageSignature::Sample, Raster::FormatKernelText(SampleBody, {magnitudes, copies}));
+    return MakeStage(StageSignature::Sample,
+                     Raster::FormatKernelText(SampleBody, {TapsText(), magnitudes, copies}));
 }
 
 } // namespace
 
 const char* StageText<EdgeDetectSampler>::Get(Language language, PixelFormat source) {
-    using Table = std::array<Raster::KernelTextPair, Raster::PixelFormatCount>;
-    static const Table table = [] {
-        return [&]<std::size_t... I>(std::index_sequence<I...>) {
-            return Table{Raster::KernelTextPair(
-                [](Language l) { return BuildText(static_cast<PixelFormat>(I), l); })...};
-        }
-        (std::make_index_sequence<Raster::PixelFormatCount>{});
-    }();
-    if (!Raster::IsValidPixelFormat(source)) return nullptr;
-    return table[static_cast<std::size_t>(source)].Get(language);
+    static const PerFormatStageText texts(BuildText);
+    return texts.Get(language, source);
 }
 
 } // namespace RasterTools

@@ -5,9 +5,11 @@
 
 #include "pipeline/Pipeline.h"
 
+#include <array>
 #include <cmath>
 #include <cstdint>
 #include <cstring>
+#include <iterator>
 #include <type_traits>
 
 namespace RasterTools {
@@ -27,6 +29,17 @@ void Gradient(const float* above, const float* row, const float* below, int chan
               float* out) noexcept;
 
 } // namespace EdgeDetectSpan
+
+// The 3 × 3 horizontal gradient's taps in accumulation order, which the processor walks and the kernel text
+// is generated from: (dx, dy, weight). The centre pixel is read after the first EdgeCentreAfter taps.
+struct EdgeTap {
+    int dx;
+    int dy;
+    float weight;
+};
+inline constexpr EdgeTap EdgeTaps[] = {{-1, -1, -1.0f}, {1, -1, 1.0f},  {-1, 0, -2.0f},
+                                       {1, 0, 2.0f},    {-1, 1, -1.0f}, {1, 1, 1.0f}};
+inline constexpr int EdgeCentreAfter = 3;
 
 // The 3 × 3 horizontal gradient (-1 0 1 / -2 0 2 / -1 0 1) of every colour channel, its magnitude clamped by
 // the format's rule and not normalised; the centre pixel's alpha stays.
@@ -52,21 +65,16 @@ struct EdgeDetectSampler {
             std::memcpy(components, &pixel, sizeof components);
             return std::to_array(components);
         };
-        // (dx, dy, weight) in accumulation order; the centre is read between the left and right of its row.
         float acc[Channels] = {};
-        const auto add = [&](int dx, int dy, float weight) {
-            const auto p = read(dx, dy);
+        std::array<Component, Channels> initial{};
+        for (int k = 0; k < int(std::size(EdgeTaps)); ++k) {
+            if (k == EdgeCentreAfter) initial = read(0, 0);
+            const EdgeTap tap = EdgeTaps[k];
+            const auto p = read(tap.dx, tap.dy);
             for (int c = 0; c < Channels; ++c)
-                acc[c] = weight < 0.0f ? acc[c] - float(p[std::size_t(c)]) * -weight
-                                       : acc[c] + float(p[std::size_t(c)]) * weight;
-        };
-        add(-1, -1, -1.0f);
-        add(1, -1, 1.0f);
-        add(-1, 0, -2.0f);
-        auto initial = read(0, 0);
-        add(1, 0, 2.0f);
-        add(-1, 1, -1.0f);
-        add(1, 1, 1.0f);
+                acc[c] = tap.weight < 0.0f ? acc[c] - float(p[std::size_t(c)]) * -tap.weight
+                                           : acc[c] + float(p[std::size_t(c)]) * tap.weight;
+        }
         for (int c = 0; c < Channels - 1; ++c) { // the last channel is alpha
             const float magnitude = std::fabs(acc[c]);
             if constexpr (std::is_integral_v<Component>)

@@ -9,13 +9,20 @@
 #include <cmath>
 #include <cstring>
 #include <limits>
+#include <string>
 #include <type_traits>
 
 namespace RasterTools::NoiseGenerator {
 
 const char* GetNoiseGeneratorText() {
-    static const char* const text = RASTER_KERNEL_STRINGIFY(RT_NOISE_GENERATOR_SOURCE);
-    return text;
+    static const std::string text = [] {
+        std::string names = "enum {";
+        for (const auto& [name, value] : SamplerIndexNames)
+            names += std::string(" ") + name + " = " + std::to_string(value) + ",";
+        names.back() = ' ';
+        return names + "};\n" + RASTER_KERNEL_STRINGIFY(RT_NOISE_GENERATOR_SOURCE);
+    }();
+    return text.c_str();
 }
 
 namespace {
@@ -124,34 +131,44 @@ const Jump* GetJumps() noexcept {
 
 namespace {
 
-inline void SeedsOfSpan(int x0, int y, const float* samplerParams, std::uint32_t* seeds) noexcept {
+// The seeds of a span: the sampler affine of each pixel's centre, floored (NoiseSeed), or of its integer
+// location, truncated (DiffuseSeed). Huge, infinite or NaN places saturate: those spans go pixel by pixel.
+template <bool Centre>
+[[gnu::always_inline]] inline void SeedSpan(int x0, int y, const float* samplerParams,
+                                            std::uint32_t* seeds) noexcept {
+    constexpr float Shift = Centre ? 0.5f : 0.0f;
     alignas(64) float xs[SpanPixels], ys[SpanPixels];
-    const float centreY = float(y) + 0.5f;
+    const float placeY = float(y) + Shift;
     int outside = 0;
     for (int i = 0; i < SpanPixels; ++i) {
-        const float2 at = SamplerAffine(make_float2(float(x0 + i) + 0.5f, centreY), samplerParams);
+        const float2 at = SamplerAffine(make_float2(float(x0 + i) + Shift, placeY), samplerParams);
         xs[i] = at.x;
         ys[i] = at.y;
         outside |= int(!(std::fabs(at.x) < SmallCoordinate)) | int(!(std::fabs(at.y) < SmallCoordinate));
     }
     if (outside) {
-        // Huge, infinite or NaN places saturate: NoiseSeed pixel by pixel.
         for (int i = 0; i < SpanPixels; ++i)
-            seeds[i] = NoiseSeed(make_int2(x0 + i, y), samplerParams);
+            seeds[i] = Centre ? NoiseSeed(make_int2(x0 + i, y), samplerParams)
+                              : DiffuseSeed(make_int2(x0 + i, y), samplerParams);
         return;
     }
     const uint width = (uint)(int)samplerParams[WidthIndex];
     for (int i = 0; i < SpanPixels; ++i) {
-        const int truncatedX = int(xs[i]), truncatedY = int(ys[i]);
-        const int tx = truncatedX - int(float(truncatedX) > xs[i]);
-        const int ty = truncatedY - int(float(truncatedY) > ys[i]);
+        int tx = int(xs[i]), ty = int(ys[i]);
+        if constexpr (Centre) {
+            tx -= int(float(tx) > xs[i]);
+            ty -= int(float(ty) > ys[i]);
+        }
         seeds[i] = Hash(uint(ty) * width + uint(tx));
     }
 }
 
 } // namespace
 
-RT_AVX2_DISPATCH(SpanSeeds, SeedsOfSpan, (int x0, int y, const float* samplerParams, std::uint32_t* seeds),
+RT_AVX2_DISPATCH(SpanSeeds, SeedSpan<true>, (int x0, int y, const float* samplerParams, std::uint32_t* seeds),
+                 (x0, y, samplerParams, seeds))
+RT_AVX2_DISPATCH(SpanDiffuseSeeds, SeedSpan<false>,
+                 (int x0, int y, const float* samplerParams, std::uint32_t* seeds),
                  (x0, y, samplerParams, seeds))
 
 // Each draw's state comes straight from the seed (state k = multiplier(k) * seed + increment(k)), so the

@@ -10,11 +10,26 @@
 
 #include <cmath>
 #include <cstdint>
+#include <utility>
+
+// The sampler block's floats by name: the affine (six: x' = x*p0 + y*p1 + p2, y' = x*p3 + y*p4 + p5), sigma,
+// the raster's width (for the seed), then add noise's mono and gaussian switches. The processor's enum and
+// the kernel text's constants are both made from this list.
+#define RT_NOISE_SAMPLER_INDICES(X)                                                                          \
+    X(AffineIndex, 0)                                                                                        \
+    X(SigmaIndex, 6)                                                                                         \
+    X(WidthIndex, 7)                                                                                         \
+    X(MonoIndex, 8)                                                                                          \
+    X(GaussianIndex, 9)                                                                                      \
+    X(SamplerFloatCount, 10)
 
 // Hash seeds the generator; RandomGet (host fragments) is a linear congruential step returning 16 bits.
 // Uniform noise is one draw in [-sigma, sigma]; gaussian noise sums twelve draws (standard deviation
 // sigma / 6, always within +-sigma). The seed is the hash of the pixel's place under the sampler affine,
-// row-major with the raster's width, so that it does not depend on tiling.
+// row-major with the raster's width, so that it does not depend on tiling: noise maps the pixel's centre
+// and floors, diffuse maps the integer location and truncates toward zero. NoiseDraws draws the noise of
+// `channels` channels in channel order (mono: one draw for all). Diffuse moves a location by two draws,
+// each scaled to at most 512 × sigma and truncated toward zero, with 32-bit wrap-around.
 #define RT_NOISE_GENERATOR_SOURCE                                                                            \
     enum { NoiseGaussianDraws = 12 };                                                                        \
     RT_NOISE_FUNCTION uint Hash(uint a) {                                                                    \
@@ -47,13 +62,45 @@
         return gaussian ? GetGaussianNoise(sigma, state) : GetUniformNoise(sigma, state);                    \
     }                                                                                                        \
     RT_NOISE_FUNCTION float2 SamplerAffine(float2 location, params_address_space float* sampler_params) {    \
-        return float2_literal(                                                                               \
-            location.x * sampler_params[0] + location.y * sampler_params[1] + sampler_params[2],             \
-            location.x * sampler_params[3] + location.y * sampler_params[4] + sampler_params[5]);            \
+        params_address_space float* p = sampler_params + AffineIndex;                                        \
+        return float2_literal(location.x * p[0] + location.y * p[1] + p[2],                                  \
+                              location.x * p[3] + location.y * p[4] + p[5]);                                 \
     }                                                                                                        \
     RT_NOISE_FUNCTION uint NoiseSeed(int2 at, params_address_space float* sampler_params) {                  \
         const int2 seedAt = convert_int2(floor(SamplerAffine(convert_float2(at) + 0.5f, sampler_params)));   \
-        return Hash((uint)seedAt.y * (uint)(int)sampler_params[7] + (uint)seedAt.x);                         \
+        return Hash((uint)seedAt.y * (uint)(int)sampler_params[WidthIndex] + (uint)seedAt.x);                \
+    }                                                                                                        \
+    RT_NOISE_FUNCTION void NoiseDraws(int channels, params_address_space float* sampler_params, uint* state, \
+                                      float* noise) {                                                        \
+        const bool gaussian = sampler_params[GaussianIndex] != 0.0f;                                         \
+        const float sigma = sampler_params[SigmaIndex];                                                      \
+        if (sampler_params[MonoIndex] != 0.0f) {                                                             \
+            const float n = GetNoise(gaussian, sigma, state);                                                \
+            for (int c = 0; c < channels; ++c)                                                               \
+                noise[c] = n;                                                                                \
+        } else {                                                                                             \
+            for (int c = 0; c < channels; ++c)                                                               \
+                noise[c] = GetNoise(gaussian, sigma, state);                                                 \
+        }                                                                                                    \
+    }                                                                                                        \
+    RT_NOISE_FUNCTION int DiffuseOffset(float random, float sigma) {                                         \
+        return rt_sat_int((random * 1024.0f - 512.0f) * sigma);                                              \
+    }                                                                                                        \
+    RT_NOISE_FUNCTION int MovedBy(int at, int offset) {                                                      \
+        return (int)((uint)at + (uint)offset);                                                               \
+    }                                                                                                        \
+    RT_NOISE_FUNCTION uint DiffuseSeed(int2 at, params_address_space float* sampler_params) {                \
+        const float2 place = SamplerAffine(convert_float2(at), sampler_params);                              \
+        return Hash((uint)rt_sat_int(place.y) * (uint)(int)sampler_params[WidthIndex] +                      \
+                    (uint)rt_sat_int(place.x));                                                              \
+    }                                                                                                        \
+    RT_NOISE_FUNCTION int2 DiffuseMoved(int2 location, int2 at,                                              \
+                                        params_address_space float* sampler_params) {                        \
+        uint state = DiffuseSeed(at, sampler_params);                                                        \
+        const float sigma = sampler_params[SigmaIndex];                                                      \
+        const int dx = DiffuseOffset(GetRandom(&state), sigma);                                              \
+        const int dy = DiffuseOffset(GetRandom(&state), sigma);                                              \
+        return make_int2(MovedBy(location.x, dx), MovedBy(location.y, dy));                                  \
     }                                                                                                        \
     RT_NOISE_FUNCTION int NoiseToInteger(float sum, int maximum) {                                           \
         return rt_clampi(rt_sat_int(sum), 0, maximum);                                                       \
@@ -63,21 +110,18 @@ namespace RasterTools::NoiseGenerator {
 
 using namespace Raster::KernelMath;
 
+// The sampler block's floats, by index.
+enum SamplerIndex : int {
+#define RT_NOISE_ENUMERATOR(name, value) name = value,
+    RT_NOISE_SAMPLER_INDICES(RT_NOISE_ENUMERATOR)
+#undef RT_NOISE_ENUMERATOR
+};
+
 #define RT_NOISE_FUNCTION inline
 #define params_address_space const
 RT_NOISE_GENERATOR_SOURCE
 #undef params_address_space
 #undef RT_NOISE_FUNCTION
-
-// The sampler block's ten floats, by index.
-enum SamplerIndex : int {
-    AffineIndex = 0, // six: x' = x*p0 + y*p1 + p2, y' = x*p3 + y*p4 + p5
-    SigmaIndex = 6,
-    WidthIndex = 7,
-    MonoIndex = 8,
-    GaussianIndex = 9,
-    SamplerFloatCount = 10,
-};
 
 // The sampler block's width entry for a raster's bounds: right minus left, truncated toward zero; 0 for
 // widths that no raster can have.
@@ -87,15 +131,36 @@ inline float TruncatedWidth(double left, double right) noexcept {
 }
 
 // The names the generator text defines, which language 1 keeps apart from other fragments' by renaming.
-inline constexpr const char* DefinedNames[] = {"NoiseGaussianDraws", "Hash",
-                                               "GetRandom",          "UniformFromRandom",
-                                               "GaussianFromSum",    "GetUniformNoise",
-                                               "GetGaussianNoise",   "GetNoise",
-                                               "SamplerAffine",      "NoiseSeed",
-                                               "NoiseToInteger"};
+inline constexpr const char* DefinedNames[] = {
+#define RT_NOISE_NAME(name, value) #name,
+    RT_NOISE_SAMPLER_INDICES(RT_NOISE_NAME)
+#undef RT_NOISE_NAME
+        "NoiseGaussianDraws",
+    "Hash",
+    "GetRandom",
+    "UniformFromRandom",
+    "GaussianFromSum",
+    "GetUniformNoise",
+    "GetGaussianNoise",
+    "GetNoise",
+    "SamplerAffine",
+    "NoiseSeed",
+    "NoiseDraws",
+    "DiffuseSeed",
+    "DiffuseOffset",
+    "MovedBy",
+    "DiffuseMoved",
+    "NoiseToInteger"};
 
-// The generator source as kernel text (one line; RT_NOISE_FUNCTION and params_address_space left for the
-// including text to define).
+// The sampler block's names as kernel text: an enum with the values above.
+inline constexpr std::pair<const char*, int> SamplerIndexNames[] = {
+#define RT_NOISE_PAIR(name, value) {#name, name},
+    RT_NOISE_SAMPLER_INDICES(RT_NOISE_PAIR)
+#undef RT_NOISE_PAIR
+};
+
+// The generator source as kernel text, after the enum of the sampler block's names (RT_NOISE_FUNCTION and
+// params_address_space left for the including text to define).
 const char* GetNoiseGeneratorText();
 
 // ---- Span kernels: the same numbers for 32 pixels at a time, written so that the compiler vectorises
@@ -104,8 +169,9 @@ const char* GetNoiseGeneratorText();
 inline constexpr int SpanPixels = 32;
 
 // The seeds of pixels (x0 + i, y), i < 32, whose integer source location is their own (the identity
-// transform stage).
+// transform stage): NoiseSeed's, and DiffuseSeed's.
 void SpanSeeds(int x0, int y, const float* samplerParams, std::uint32_t* seeds) noexcept;
+void SpanDiffuseSeeds(int x0, int y, const float* samplerParams, std::uint32_t* seeds) noexcept;
 
 // The noise of `channels` channels for 32 seeds, as GetNoise draws it channel after channel from each seed:
 // noise[c][i] for pixel i. channels is 1 to 4.

@@ -15,31 +15,20 @@ namespace {
 using Language = HardwareKernelLanguage;
 using Raster::PixelFormat;
 
-// The call that draws one channel's noise.
-constexpr const char* NoiseCall = "GetNoise(sampler_params[9]!=0.0f,sampler_params[6],&random)";
-
-// %1 draws the colour branch's noise into n0, n1, ... (one per accumulator channel, in channel order: the
-// components of a literal are evaluated in no fixed order, so the draws are taken before it), %2 is their
-// list, %3 the mono list, %4 the stores of the colour channels.
+// %1 is the number of accumulator channels, %2 the list of their draws (taken before the literal, whose
+// components are evaluated in no fixed order), %3 the stores of the colour channels.
 constexpr const char* SampleBody =
     R"(const int2 coords = TransformPixelCenterToInt(location,transform_params);
 const source_type pixel = Extend(coords,source_bounds,input_pixels,source_params);
 // MapPixelCenter! The sampler affine maps the pixel centre here (+0.5, then a floor), with the processor's
 // arithmetic, so that both paths seed every pixel alike.
 uint random = NoiseSeed(coords,sampler_params);
-source_accumulator_type noise;
-if (sampler_params[8]!=0.0f)
-{
-    const float n = GetNoise(sampler_params[9]!=0.0f,sampler_params[6],&random);
-    noise = source_accumulator_literal(%3);
-}
-else
-{
-%1    noise = source_accumulator_literal(%2);
-}
+float n[%1];
+NoiseDraws(%1,sampler_params,&random,n);
+const source_accumulator_type noise = source_accumulator_literal(%2);
 source_accumulator_type acc = accumulator_from_source(pixel) + noise*source_channel_maximum();
 source_type result = pixel;
-%4(void)sampler_bounds;
+%3(void)sampler_bounds;
 (void)sampler_pixels;
 return result;)";
 
@@ -74,13 +63,9 @@ NoiseFormat Describe(PixelFormat format) {
 std::string BuildBody(PixelFormat format) {
     const NoiseFormat f = Describe(format);
     if (f.channels == 0) return {};
-    std::string draws, list, mono, stores;
-    for (int c = 0; c < f.channels; ++c) {
-        const std::string name = "n" + std::to_string(c);
-        draws += "    const float " + name + " = " + NoiseCall + ";\n";
-        list += (c ? "," : "") + name;
-        mono += c ? ",n" : "n";
-    }
+    std::string list, stores;
+    for (int c = 0; c < f.channels; ++c)
+        list += (c ? ",n[" : "n[") + std::to_string(c) + "]";
     if (!f.component) stores += "source_clamp_accumulator(acc);\n"; // the float format's own clamp rule
     for (std::size_t c = 0; c < f.out.size(); ++c) {
         const std::string value = std::string("acc.") + f.acc[c];
@@ -90,7 +75,7 @@ std::string BuildBody(PixelFormat format) {
                          : value) +
             ";\n";
     }
-    return Raster::FormatKernelText(SampleBody, {draws, list, mono, stores});
+    return Raster::FormatKernelText(SampleBody, {std::to_string(f.channels), list, stores});
 }
 
 // The stage signature's parameters, as a call passes them on.
@@ -134,16 +119,8 @@ std::string MakeGeneratorSampleStage(Language language, std::string_view scope, 
 }
 
 const char* StageText<NoiseSampler>::Get(Language language, PixelFormat source) {
-    using Table = std::array<Raster::KernelTextPair, Raster::PixelFormatCount>;
-    static const Table table = [] {
-        return [&]<std::size_t... I>(std::index_sequence<I...>) {
-            return Table{Raster::KernelTextPair(
-                [](Language l) { return BuildText(static_cast<PixelFormat>(I), l); })...};
-        }
-        (std::make_index_sequence<Raster::PixelFormatCount>{});
-    }();
-    if (!Raster::IsValidPixelFormat(source)) return nullptr;
-    return table[static_cast<std::size_t>(source)].Get(language);
+    static const PerFormatStageText texts(BuildText);
+    return texts.Get(language, source);
 }
 
 } // namespace RasterTools

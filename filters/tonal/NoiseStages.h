@@ -51,18 +51,9 @@ struct NoiseSampler {
         constexpr int Channels = Raster::GetChannelCount(F);
         const Raster::KernelMath::int2 at = Raster::TransformPixelCenterToInt<Transform>(location, t);
         const auto pixel = Extend::Read(image, at);
-        const float* p = params.block;
-        uint state = NoiseSeed(at, p);
-        const bool gaussian = p[GaussianIndex] != 0.0f;
+        uint state = NoiseSeed(at, params.block);
         float noise[Channels];
-        if (p[MonoIndex] != 0.0f) {
-            const float n = GetNoise(gaussian, p[SigmaIndex], &state);
-            for (float& value : noise)
-                value = n;
-        } else {
-            for (float& value : noise)
-                value = GetNoise(gaussian, p[SigmaIndex], &state);
-        }
+        NoiseDraws(Channels, params.block, &state, noise);
         return AddNoise<F>(pixel, noise);
     }
 

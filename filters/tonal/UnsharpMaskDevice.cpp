@@ -51,29 +51,10 @@ KERNEL(unsharp_mask_sharpen)(GLOBAL const float* across, GLOBAL const float* tap
     }
     const int x = left + i, y = top + j;
     const rt_index at = ((rt_index)y * width + x) * RT_N;
-    GLOBAL const T* p = source + at;
-    // Colour back in stored units: premultiplied sums of 8-bit pixels hold colour × alpha.
-    const float alpha = (float)p[RT_A] / RT_MAX;
-    const int divide = alpha != 1.0f && !(alpha > -1e-20f && alpha < 1e-20f);
-    const float back = 1.0f / RT_PSCALE / (divide ? alpha : 1.0f);
     T value[RT_N];
-    for (int c = 0; c < RT_N; ++c) {
-        value[c] = p[c];
-        if (c == RT_A) continue;
-        const float difference = (float)rt_premultiply(p[c], p[RT_A]) - blur[c];
-        if (rt_fabsf(difference) / RT_PSCALE <= threshold || (!divide && alpha != 1.0f)) continue;
-        value[c] = rt_store((float)p[c] + factor * difference * back);
-    }
-    if (hasMask) {
-        const uchar m = mask[(rt_index)y * maskWidth + x];
-        if (m != 255) {
-            const float w = (float)m / 255.0f;
-            for (int c = 0; c < RT_N; ++c)
-                value[c] = rt_store((float)p[c] + ((float)value[c] - (float)p[c]) * w);
-        }
-    }
-    for (int c = 0; c < RT_N; ++c)
-        if (channelMask < 0 || (channelMask & rt_channel_bit(c))) dest[at + c] = value[c];
+    rt_sharpen(source + at, blur, factor, threshold, value);
+    rt_write_masked(value, source + at, hasMask ? (int)mask[(rt_index)y * maskWidth + x] : 255, channelMask,
+                    dest + at);
 }
 )";
 

@@ -61,36 +61,12 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
                                column[(std::size_t(k) * std::size_t(width) + std::size_t(i)) * N + c];
             const int x = rect.left + i;
             const T* p = in + std::size_t(x) * N;
+            // The straight source plus the straightened difference: exact where the difference vanishes,
+            // although 16-bit premultiplication rounds.
             T value[N];
-            // Colour back in stored units: premultiplied sums of 8-bit pixels hold colour × alpha.
-            const float alpha = float(p[L::A]) / L::Max;
-            const bool divide = alpha != 1.0f && !(alpha > -1e-20f && alpha < 1e-20f);
-            const float back = 1.0f / L::PremultipliedScale / (divide ? alpha : 1.0f);
-            for (int c = 0; c < N; ++c) {
-                if (c == L::A) {
-                    value[c] = p[c];
-                    continue;
-                }
-                const float own = float(L::Premultiply(p[c], p[L::A]));
-                const float difference = own - blur[c];
-                if (std::fabs(difference) / L::PremultipliedScale <= threshold ||
-                    (!divide && alpha != 1.0f)) {
-                    value[c] = p[c];
-                    continue;
-                }
-                // The straight source plus the straightened difference: exact where the difference vanishes,
-                // although 16-bit premultiplication rounds.
-                value[c] = L::Store(float(p[c]) + plan.factor * difference * back);
-            }
-            if (weights && weights[x] != 255) {
-                const float w = float(weights[x]) / 255.0f;
-                for (int c = 0; c < N; ++c)
-                    value[c] = L::Store(float(p[c]) + (float(value[c]) - float(p[c])) * w);
-            }
-            T* pixel = out + std::size_t(x) * N;
-            for (int c = 0; c < N; ++c)
-                if (target.channelMask < 0 || (target.channelMask & Blur::ChannelBit<F>(c)))
-                    pixel[c] = value[c];
+            L::M::rt_sharpen(p, blur, plan.factor, threshold, value);
+            L::M::rt_write_masked(value, p, weights ? weights[x] : 255, target.channelMask,
+                                  out + std::size_t(x) * N);
         }
     }
     return RenderPath::Processor;

@@ -9,6 +9,26 @@
 #include <cstring>
 #include <type_traits>
 
+// The bilinear interpolation of the four pixels around flocation (a transformed pixel centre less half a
+// pixel), written once: BilinearSampler expands it and the kernel text of the bilinear Sample stage pastes
+// the same tokens. ACC is the accumulator type, READ(x, y) the premultiplied accumulator of the pixel at (x,
+// y) read through Extend, ZERO the accumulator of the format's minimum; it leaves the premultiplied sum in
+// `result`. The cell's corner is the truncation, less one for negatives: a floor except at exact negative
+// integers, where it is one less.
+#define RASTER_BILINEAR_INTERPOLATION(ACC, READ, ZERO)                                                       \
+    int ix = rt_sat_int(flocation.x);                                                                        \
+    if (flocation.x < 0.0f) ix -= 1;                                                                         \
+    int iy = rt_sat_int(flocation.y);                                                                        \
+    if (flocation.y < 0.0f) iy -= 1;                                                                         \
+    const ACC tl = READ(ix, iy);                                                                             \
+    const ACC tr = READ(ix + 1, iy);                                                                         \
+    const ACC bl = READ(ix, iy + 1);                                                                         \
+    const ACC br = READ(ix + 1, iy + 1);                                                                     \
+    const float fx = flocation.x - (float)ix;                                                                \
+    const float fy = flocation.y - (float)iy;                                                                \
+    const ACC result = ZERO + tl * ((1.0f - fx) * (1.0f - fy)) + tr * (fx * (1.0f - fy)) +                   \
+                       bl * (fy * (1.0f - fx)) + br * (fy * fx);
+
 namespace Raster {
 
 // Rows top to bottom, each left to right: the order a tile is walked in.
@@ -224,19 +244,9 @@ struct BilinearSampler {
     static typename Image::Stored Interpolate(const Image& image, KernelMath::float2 flocation) noexcept {
         using namespace KernelMath;
         using T = typename Image::Traits;
-        // Truncation, then one less for negatives: a floor except at exact negative integers.
-        int ix = rt_sat_int(flocation.x);
-        if (flocation.x < 0.0f) ix -= 1;
-        int iy = rt_sat_int(flocation.y);
-        if (flocation.y < 0.0f) iy -= 1;
-        const auto tl = T::Premultiplied(Extend::Read(image, make_int2(ix, iy)));
-        const auto tr = T::Premultiplied(Extend::Read(image, make_int2(ix + 1, iy)));
-        const auto bl = T::Premultiplied(Extend::Read(image, make_int2(ix, iy + 1)));
-        const auto br = T::Premultiplied(Extend::Read(image, make_int2(ix + 1, iy + 1)));
-        const float fx = flocation.x - (float)ix;
-        const float fy = flocation.y - (float)iy;
-        const auto result = T::Accumulate(typename Image::Stored{}) + tl * ((1.0f - fx) * (1.0f - fy)) +
-                            tr * (fx * (1.0f - fy)) + bl * (fy * (1.0f - fx)) + br * (fy * fx);
+#define RASTER_BILINEAR_READ(x, y) T::Premultiplied(Extend::Read(image, make_int2(x, y)))
+        RASTER_BILINEAR_INTERPOLATION(auto, RASTER_BILINEAR_READ, T::Accumulate(typename Image::Stored{}))
+#undef RASTER_BILINEAR_READ
         return T::FromAccumulator(T::Postdivided(result));
     }
 };

@@ -1,6 +1,6 @@
-// The motion blur's four- and eight-lane routines against the one-pixel routines they stand in for: bilinear
-// samples and resolved sums equal bit for bit, over translucent and transparent neighbours, pixel centres,
-// the grid's edges and locations beyond them.
+// The blurs' four- and eight-lane routines against the shared scalar source (BlurMath.h, which the device
+// steps paste as text): bilinear samples, premultiplied sums and resolved sums equal bit for bit, over
+// translucent and transparent neighbours, pixel centres, the grid's edges and locations beyond them.
 
 #include "filters/blur/BlurPixels.h"
 #include "host/raster/DynamicBuffer.h"
@@ -69,11 +69,15 @@ TYPED_TEST(BlurLanes, FourSamplesEqualFourSingleSamples) {
             xs[i] = kind == 0 ? double(int(random() % 30) - 6) : along(random); // pixel centres too
             ys[i] = kind == 1 ? double(int(random() % 24) + 7) : down(random);
         }
-        typename L::T lanes[4 * L::N], single[4 * L::N];
+        typename L::T lanes[4 * L::N], single[4 * L::N], scalar[4 * L::N];
         Blur::SampleBilinear4<F>(grid, xs, ys, lanes);
-        for (int i = 0; i < 4; ++i)
+        for (int i = 0; i < 4; ++i) {
             Blur::SampleBilinear<F>(grid, xs[i], ys[i], single + i * L::N);
-        ASSERT_EQ(std::memcmp(lanes, single, sizeof lanes), 0)
+            Blur::SampleBilinearScalar<F>(grid, xs[i], ys[i], scalar + i * L::N);
+        }
+        ASSERT_EQ(std::memcmp(lanes, scalar, sizeof lanes), 0)
+            << "round " << round << ", first location (" << xs[0] << ", " << ys[0] << ")";
+        ASSERT_EQ(std::memcmp(single, scalar, sizeof single), 0)
             << "round " << round << ", first location (" << xs[0] << ", " << ys[0] << ")";
         ++compared;
     }
@@ -117,8 +121,8 @@ TYPED_TEST(BlurRuns, RunsOfSamplesEqualSingleSamples) {
             std::fill(single.begin(), single.end(), T(7));
             Blur::SampleBilinearRun<F>(grid, first, last, position, run.data());
             for (int i = first; i < last; ++i)
-                Blur::SampleBilinear<F>(grid, xs[std::size_t(i)], ys[std::size_t(i)],
-                                        single.data() + i * L::N);
+                Blur::SampleBilinearScalar<F>(grid, xs[std::size_t(i)], ys[std::size_t(i)],
+                                              single.data() + i * L::N);
             for (int i = 0; i < 160; ++i)
                 ASSERT_EQ(std::memcmp(run.data() + i * L::N, single.data() + i * L::N, sizeof(T) * L::N), 0)
                     << name << ", run " << first << ".." << last << ", sample " << i << " at ("
@@ -148,9 +152,28 @@ TYPED_TEST(BlurLanes, FourResolvesEqualFourSingleResolves) {
         typename L::T lanes[16], single[16];
         L::Resolve4(sums, weight, lanes);
         for (int i = 0; i < 4; ++i)
-            L::Resolve(sums[i], weight, single + 4 * i);
+            L::M::rt_resolve(sums[i], 1.0f / weight, single + 4 * i);
         ASSERT_EQ(std::memcmp(lanes, single, sizeof lanes), 0) << "round " << round;
     }
+}
+
+// The running sums' four-lane premultiply (integer formats of four components) against the shared one.
+TYPED_TEST(BlurLanes, VectorSumsEqualTheSharedSums) {
+    constexpr PixelFormat F = TypeParam::Value;
+    using L = Blur::Layout<F>;
+    const auto image = Grid<F>(64, 8, 17);
+    typename L::Acc lanes[4] = {}, scalar[4] = {};
+    for (int y = 0; y < 8; ++y)
+        for (int x = 0; x < 64; ++x) {
+            const typename L::T* p = image->template Row<typename L::T>(y) + x * L::N;
+            L::Accumulate(lanes, p);
+            L::M::rt_accumulate(scalar, p);
+            if (x % 3 == 0) {
+                L::Remove(lanes, p);
+                L::M::rt_remove(scalar, p);
+            }
+            ASSERT_EQ(std::memcmp(lanes, scalar, sizeof lanes), 0) << "at (" << x << ", " << y << ")";
+        }
 }
 
 } // namespace

@@ -125,6 +125,50 @@ TEST(DiffuseValues, ViewScaleWidensTheScatterAndSeedsFollowTheView) {
     EXPECT_LE(largest, 10);
 }
 
+// The second seeding step maps the integer location (not its centre) through the sampler affine and takes the
+// integer part toward zero. Hand values: a 48 × 48 layer under the view x' = 0.5 x + 10, y' = 0.5 y + 10.25,
+// whose inverse (the sampler affine) is x' = 2x − 20, y' = 2y − 20.5; intensity 0.1 and the view's scale
+// 0.5 give sigma 0.05f. Seed Hash(ty × 48 + tx) with 32-bit wrap-around; draws r1, r2 give
+// dx = trunc((r1/65535 × 1024 − 512) × sigma), dy likewise.
+//   (3, 4):   t = (−14, trunc(−12.5) = −12), Hash(4294966706) = 4023617639, draws 64028, 49253:
+//             (24.42, 12.88) -> (+24, +12): source (27, 16)
+//   (9, 1):   t = (−2, trunc(−18.5) = −18), Hash(4294966430) = 2379760769, draws 38483, 36498:
+//             (4.47, 2.92) -> (+4, +2): source (13, 3)
+//   (4, 3):   t = (−12, trunc(−14.5) = −14), Hash(4294966612) = 649171369, draws 27581, 37102:
+//             (−4.05, 3.39) -> (−4, +3): source (0, 6)
+//   (30, 20): t = (40, trunc(19.5) = 19), Hash(952) = 2095827869, draws 36431, 24757:
+//             (2.86, −6.26) -> (+2, −6): source (32, 14)
+//   (18, 40): t = (16, 59), Hash(2848) = 1047192052, draws 20166, 15332: (−9.84, −13.62) -> (−9, −13):
+//             source (9, 27)
+// The pixel centre (+0.5, then a floor) would seed (3, 4) from (−13, −12), (9, 1) from (−1, −18), (30, 20)
+// from (41, 20); a floor of the integer location's image would seed (3, 4) from (−14, −13).
+TEST(DiffuseValues, SeedsFromTheIntegerLocationUnderAScaledView) {
+    const auto source = MakePlaces(48, 48);
+    const auto command = MakeDiffuse(0.1);
+    const PipelineTest::View view{{}, Affine(0.5, 0, 10, 0, 0.5, 10.25)};
+    const auto params = command->GetSamplerParams({0.0, 0.0, 48.0, 48.0}, view.transform);
+    ASSERT_EQ(params.block[0], 2.0f);
+    ASSERT_EQ(params.block[2], -20.0f);
+    ASSERT_EQ(params.block[5], -20.5f);
+    ASSERT_EQ(params.block[6], 0.05f);
+    const struct {
+        int x, y, fromX, fromY;
+    } cases[] = {{3, 4, 27, 16}, {9, 1, 13, 3}, {4, 3, 0, 6}, {30, 20, 32, 14}, {18, 40, 9, 27}};
+    const auto device = PipelineTest::OpenCLDevice();
+    for (const bool onDevice : {false, true}) {
+        if (onDevice && !device) continue;
+        for (const int tile : {0, 16}) {
+            const auto result = NoiseTest::Render(*command, source, tile, onDevice ? device : nullptr, view);
+            ASSERT_TRUE(result);
+            for (const auto& c : cases)
+                EXPECT_EQ(Origin(*result, c.x, c.y), std::make_pair(c.fromX, c.fromY))
+                    << (onDevice ? "device" : "processor") << ", tiles of " << tile << ": pixel (" << c.x
+                    << ", " << c.y << ")";
+        }
+    }
+    if (!device) GTEST_SKIP() << "no OpenCL device: the hand values were checked on the processor only";
+}
+
 class DiffuseFormats : public testing::TestWithParam<PixelFormat> {};
 
 TEST_P(DiffuseFormats, EveryTilingAndBothPathsPickTheSameNeighbour) {
@@ -232,29 +276,36 @@ TEST(DiffuseRectangles, ATileReadsOnlyInsideItsInputRectangle) {
 }
 
 // The span form (identity transform) against the per-pixel form, for spans inside and beyond the image,
-// offsets small and huge (past 2^22 the span form falls back), and places far from the origin.
+// offsets small and huge (past 2^22 the span form falls back), places far from the origin, and seeds under
+// the identity and a scaled, shifted sampler affine.
 TEST(DiffuseSpan, MatchesThePerPixelDefinition) {
     const auto image = MakePlaces(50, 20);
     using Sampler = RasterTools::DiffuseSampler;
     using Transform = Raster::IdentityTransform;
     const Raster::BitmapOf<PixelFormat::RGBA16> bitmap(image.Get());
     const Transform::Params t{};
-    for (const float sigma : {0.0f, 0.01f, 0.3f, 5000.0f, 1e6f, 3e38f}) {
-        Sampler::Params params;
-        params.block[Sampler::SigmaIndex] = sigma;
-        params.block[Sampler::WidthIndex] = 50.0f;
-        for (const int y : {-3, 0, 7, 19, 25, 2097150, -2097153})
-            for (const int x0 : {-40, -1, 0, 13, 32, 45, 2097140})
-                for (const int n : {1, 17, 32}) {
-                    Raster::KernelMath::ushort4 span[Raster::SpanLength];
-                    Sampler::SampleSpan<Transform, Raster::Safe>(bitmap, t, params, x0, y, n, span);
-                    for (int i = 0; i < n; ++i) {
-                        const auto pixel = Sampler::Sample<Transform, Raster::Safe>(
-                            bitmap, Raster::KernelMath::make_int2(x0 + i, y), t, params);
-                        ASSERT_EQ(pixel, span[i]) << "sigma " << sigma << ", (" << x0 + i << ", " << y << ")";
+    for (const float sigma : {0.0f, 0.01f, 0.3f, 5000.0f, 1e6f, 3e38f})
+        for (const float scale : {1.0f, 2.0f}) {
+            Sampler::Params params;
+            params.block[Sampler::AffineIndex + 0] = scale;
+            params.block[Sampler::AffineIndex + 2] = scale == 1.0f ? 0.0f : -20.0f;
+            params.block[Sampler::AffineIndex + 4] = scale;
+            params.block[Sampler::AffineIndex + 5] = scale == 1.0f ? 0.0f : -20.5f;
+            params.block[Sampler::SigmaIndex] = sigma;
+            params.block[Sampler::WidthIndex] = 50.0f;
+            for (const int y : {-3, 0, 7, 19, 25, 2097150, -2097153})
+                for (const int x0 : {-40, -1, 0, 13, 32, 45, 2097140})
+                    for (const int n : {1, 17, 32}) {
+                        Raster::KernelMath::ushort4 span[Raster::SpanLength];
+                        Sampler::SampleSpan<Transform, Raster::Safe>(bitmap, t, params, x0, y, n, span);
+                        for (int i = 0; i < n; ++i) {
+                            const auto pixel = Sampler::Sample<Transform, Raster::Safe>(
+                                bitmap, Raster::KernelMath::make_int2(x0 + i, y), t, params);
+                            ASSERT_EQ(pixel, span[i]) << "sigma " << sigma << ", scale " << scale << ", ("
+                                                      << x0 + i << ", " << y << ")";
+                        }
                     }
-                }
-    }
+        }
 }
 
 std::string FormatName(const testing::TestParamInfo<PixelFormat>& info) {

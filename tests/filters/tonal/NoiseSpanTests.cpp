@@ -31,7 +31,7 @@ TEST(NoiseSpan, JumpsReachTheSameStatesAsSteps) {
     }
 }
 
-TEST(NoiseSpan, SeedsMatchNoiseSeedUnderAnyAffine) {
+TEST(NoiseSpan, SeedsMatchNoiseSeedAndDiffuseSeedUnderAnyAffine) {
     const float inf = std::numeric_limits<float>::infinity(), nan = std::numeric_limits<float>::quiet_NaN();
     const float affines[][6] = {
         {1, 0, 0, 0, 1, 0},          {0.5f, 0, 0, 0, 0.5f, 0}, {0.866f, 0.5f, -12.5f, -0.5f, 0.866f, 7.25f},
@@ -44,12 +44,17 @@ TEST(NoiseSpan, SeedsMatchNoiseSeedUnderAnyAffine) {
             for (const int y : {0, -3, 77}) {
                 float params[SamplerFloatCount] = {affine[0], affine[1], affine[2], affine[3], affine[4],
                                                    affine[5], 0.3f,      1000.0f,   0.0f,      1.0f};
-                std::uint32_t seeds[SpanPixels];
+                std::uint32_t seeds[SpanPixels], diffuse[SpanPixels];
                 SpanSeeds(x0, y, params, seeds);
-                for (int i = 0; i < SpanPixels; ++i)
+                SpanDiffuseSeeds(x0, y, params, diffuse);
+                for (int i = 0; i < SpanPixels; ++i) {
                     ASSERT_EQ(seeds[i], NoiseSeed(make_int2(x0 + i, y), params))
                         << "affine " << affine[0] << ", " << affine[2] << ", " << affine[5] << "; pixel ("
                         << x0 + i << ", " << y << ")";
+                    ASSERT_EQ(diffuse[i], DiffuseSeed(make_int2(x0 + i, y), params))
+                        << "affine " << affine[0] << ", " << affine[2] << ", " << affine[5] << "; pixel ("
+                        << x0 + i << ", " << y << ")";
+                }
             }
 }
 
