@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <cstdlib>
 #include <iostream>
+#include <utility>
 
 namespace {
 
@@ -70,9 +71,13 @@ void ApplyHistoryBudget() {
 int Run(std::vector<std::string> args) {
     ApplyHistoryBudget();
     // Global options may stand anywhere; take them out before the subcommand sees its arguments.
+    bool settingsGiven = false;
     for (std::size_t i = 0; i < args.size();) {
         if (args[i] == "--settings") {
             if (i + 1 >= args.size()) throw App::UsageError("--settings needs a file name");
+            // Two files would leave it to the order which one is written.
+            if (std::exchange(settingsGiven, true))
+                throw App::UsageError("--settings is given more than once");
             VeyraController::GetInstance().SetFile(args[i + 1]);
             args.erase(args.begin() + std::ptrdiff_t(i), args.begin() + std::ptrdiff_t(i) + 2);
         } else if (args[i] == "--quiet" || args[i] == "-q") {

@@ -83,6 +83,9 @@ TEST_F(CommandLine, BadCommandLinesExitWithUsage) {
     EXPECT_TRUE(Contains(unknown.output, "unknown command \"frobnicate\""));
     EXPECT_EQ(Run("play").exitCode, 2);
     EXPECT_EQ(Run("list --settings").exitCode, 2);
+    const Result twice = Run("--settings a.json list --settings b.json");
+    EXPECT_EQ(twice.exitCode, 2);
+    EXPECT_TRUE(Contains(twice.output, "--settings is given more than once")) << twice.output;
     EXPECT_EQ(Run("play nowhere.play").exitCode, 1);
     // A folder or a device given as the script is named for what it is, not read as an empty script.
     std::filesystem::create_directory(m_Folder / "scripts");
