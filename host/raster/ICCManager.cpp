@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <type_traits>
 
 namespace Raster {
 
@@ -46,6 +47,40 @@ __attribute__((target_clones("avx2", "default"))) void FromStored(Planes& p, int
     }
 }
 
+// Runs convert over count pixels a chunk at a time: each In pixel spread over the planes, each Out pixel
+// gathered from them (whole numbers 0..65535 are exact in float, so the narrowing to ushort4 loses nothing).
+template <class In, class Out>
+void ConvertInChunks(const unsigned char* in, unsigned char* out, int count,
+                     void (*convert)(Planes&, int) noexcept) {
+    Planes p;
+    for (int done = 0; done < count; done += ChunkPixels) {
+        const int n = std::min(ChunkPixels, count - done);
+        for (int i = 0; i < n; ++i) {
+            In pixel;
+            std::memcpy(&pixel, in + std::size_t(done + i) * sizeof pixel, sizeof pixel);
+            float4 v;
+            if constexpr (std::is_same_v<In, float4>)
+                v = pixel;
+            else
+                v = convert_float4(pixel);
+            p.c[0][i] = v.x;
+            p.c[1][i] = v.y;
+            p.c[2][i] = v.z;
+            p.c[3][i] = v.w;
+        }
+        convert(p, n);
+        for (int i = 0; i < n; ++i) {
+            Out pixel;
+            if constexpr (std::is_same_v<Out, float4>)
+                pixel = make_float4(p.c[0][i], p.c[1][i], p.c[2][i], p.c[3][i]);
+            else
+                pixel =
+                    make_ushort4(ushort(p.c[0][i]), ushort(p.c[1][i]), ushort(p.c[2][i]), ushort(p.c[3][i]));
+            std::memcpy(out + std::size_t(done + i) * sizeof pixel, &pixel, sizeof pixel);
+        }
+    }
+}
+
 } // namespace
 
 ICCManager& ICCManager::GetInstance() {
@@ -55,46 +90,11 @@ ICCManager& ICCManager::GetInstance() {
 }
 
 void ICCManager::DoRGBAFToLABA16Transform(unsigned char* in, unsigned char* out, int count) {
-    Planes p;
-    for (int done = 0; done < count; done += ChunkPixels) {
-        const int n = std::min(ChunkPixels, count - done);
-        for (int i = 0; i < n; ++i) {
-            float4 rgb;
-            std::memcpy(&rgb, in + std::size_t(done + i) * sizeof rgb, sizeof rgb);
-            p.c[0][i] = rgb.x;
-            p.c[1][i] = rgb.y;
-            p.c[2][i] = rgb.z;
-            p.c[3][i] = rgb.w;
-        }
-        ToStored(p, n);
-        for (int i = 0; i < n; ++i) {
-            // Whole numbers 0..65535, exact in float.
-            const ushort4 lab =
-                make_ushort4(ushort(p.c[0][i]), ushort(p.c[1][i]), ushort(p.c[2][i]), ushort(p.c[3][i]));
-            std::memcpy(out + std::size_t(done + i) * sizeof lab, &lab, sizeof lab);
-        }
-    }
+    ConvertInChunks<float4, ushort4>(in, out, count, ToStored);
 }
 
 void ICCManager::DoLABA16ToRGBAFTransform(unsigned char* in, unsigned char* out, int count) {
-    Planes p;
-    for (int done = 0; done < count; done += ChunkPixels) {
-        const int n = std::min(ChunkPixels, count - done);
-        for (int i = 0; i < n; ++i) {
-            ushort4 lab;
-            std::memcpy(&lab, in + std::size_t(done + i) * sizeof lab, sizeof lab);
-            const float4 stored = convert_float4(lab);
-            p.c[0][i] = stored.x;
-            p.c[1][i] = stored.y;
-            p.c[2][i] = stored.z;
-            p.c[3][i] = stored.w;
-        }
-        FromStored(p, n);
-        for (int i = 0; i < n; ++i) {
-            const float4 rgb = make_float4(p.c[0][i], p.c[1][i], p.c[2][i], p.c[3][i]);
-            std::memcpy(out + std::size_t(done + i) * sizeof rgb, &rgb, sizeof rgb);
-        }
-    }
+    ConvertInChunks<ushort4, float4>(in, out, count, FromStored);
 }
 
 } // namespace Raster
