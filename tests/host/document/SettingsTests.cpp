@@ -3,6 +3,7 @@
 
 #include "host/document/VeyraController.h"
 #include "host/kernel/AtomicFile.h"
+#include "tests/host/ProcessTestSupport.h"
 
 #include <fstream>
 #include <gtest/gtest.h>
@@ -167,26 +168,15 @@ TEST_F(SettingsStore, ACommitKeepsTheFilesPermissions) {
 // key is lost.
 TEST_F(SettingsStore, ConcurrentCommitsFromProcessesKeepEveryKey) {
     constexpr int kProcesses = 4, kKeys = 20;
-    std::vector<pid_t> children;
-    for (int p = 0; p < kProcesses; ++p) {
-        const pid_t child = ::fork();
-        ASSERT_GE(child, 0);
-        if (child == 0) {
-            auto& store = VeyraController::GetInstance();
-            store.SetFile(m_File);
-            for (int k = 0; k < kKeys; ++k) {
-                store.SetIntForKey("tools.p" + std::to_string(p) + ".k" + std::to_string(k), k);
-                if (store.GetLastError()) ::_exit(2);
-            }
-            ::_exit(0);
+    HostTests::RunInProcesses(kProcesses, [&](int p) {
+        auto& store = VeyraController::GetInstance();
+        store.SetFile(m_File);
+        for (int k = 0; k < kKeys; ++k) {
+            store.SetIntForKey("tools.p" + std::to_string(p) + ".k" + std::to_string(k), k);
+            if (store.GetLastError()) return 2;
         }
-        children.push_back(child);
-    }
-    for (const pid_t child : children) {
-        int status = 0;
-        ASSERT_EQ(::waitpid(child, &status, 0), child);
-        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
-    }
+        return 0;
+    });
     auto& store = VeyraController::GetInstance();
     store.SetFile(m_File);
     EXPECT_EQ(store.GetEntries("tools.p").size(), std::size_t(kProcesses * kKeys));

@@ -3,6 +3,7 @@
 // processes.
 
 #include "host/kernel/AtomicFile.h"
+#include "tests/host/ProcessTestSupport.h"
 
 #include <gtest/gtest.h>
 
@@ -203,29 +204,18 @@ TEST_F(AtomicFiles, LockedReadChangeWriteLosesNoUpdateAcrossProcesses) {
     const auto path = m_Folder / "counter";
     ASSERT_FALSE(Kernel::WriteFileAtomically(path, std::string_view("0")));
     constexpr int kProcesses = 4, kSteps = 50;
-    std::vector<pid_t> children;
-    for (int p = 0; p < kProcesses; ++p) {
-        const pid_t child = ::fork();
-        ASSERT_GE(child, 0);
-        if (child == 0) {
-            for (int i = 0; i < kSteps; ++i) {
-                Kernel::FileLock lock;
-                if (lock.Acquire(path, std::chrono::seconds(30), false) || !lock.IsHeld()) ::_exit(2);
-                std::string text;
-                if (Kernel::ReadWholeFile(path, text, 64)) ::_exit(3);
-                const std::string next = std::to_string(std::stoi(text) + 1);
-                // Writers without a lock would interleave here.
-                std::this_thread::sleep_for(std::chrono::microseconds(200));
-                if (Kernel::WriteFileAtomically(path, next)) ::_exit(4);
-            }
-            ::_exit(0);
+    HostTests::RunInProcesses(kProcesses, [&](int) {
+        for (int i = 0; i < kSteps; ++i) {
+            Kernel::FileLock lock;
+            if (lock.Acquire(path, std::chrono::seconds(30), false) || !lock.IsHeld()) return 2;
+            std::string text;
+            if (Kernel::ReadWholeFile(path, text, 64)) return 3;
+            const std::string next = std::to_string(std::stoi(text) + 1);
+            // Writers without a lock would interleave here.
+            std::this_thread::sleep_for(std::chrono::microseconds(200));
+            if (Kernel::WriteFileAtomically(path, next)) return 4;
         }
-        children.push_back(child);
-    }
-    for (const pid_t child : children) {
-        int status = 0;
-        ASSERT_EQ(::waitpid(child, &status, 0), child);
-        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
-    }
+        return 0;
+    });
     EXPECT_EQ(Read(path), std::to_string(kProcesses * kSteps));
 }
