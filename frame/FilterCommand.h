@@ -9,8 +9,8 @@
 
 namespace RasterTools {
 
-// Filter describes the filter (its Params record, parameter table, description, tool identifier and
-// Command class); Filter::Command derives from FilterCommand<Filter>.
+// Filter describes the filter (its Params record, parameter table, description, tool identifier, class code
+// and Command class); Filter::Command derives from FilterCommand<Filter>.
 template <class Filter>
 class FilterCommand : public RasterDevicePreviewableFilterLayerCommand {
 public:
@@ -82,6 +82,9 @@ public:
         return items;
     }
 
+    const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
+    static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }
+
 protected:
     // Only for loading: the fields are then set by Load.
     FilterCommand()
@@ -89,6 +92,19 @@ protected:
         , m_Params(DefaultParameters(Filter::kParameters)) {}
 
     Params m_Params;
+
+private:
+    // The table's class code, version 1 unless it declares kClassVersion (raise it when the saved form
+    // changes). Constructed when the library loads, which registers the class for reading documents.
+    static constexpr unsigned short ClassVersion() {
+        if constexpr (requires { Filter::kClassVersion; })
+            return Filter::kClassVersion;
+        else
+            return 1;
+    }
+    static inline const Kernel::ClassProperties ms_ClassProperties{
+        Filter::kClassCode, &CreateObject, ClassVersion(), __GetDefaultSerialisation(),
+        &RasterDevicePreviewableFilterLayerCommand::GetTypeClassProperties()};
 };
 
 } // namespace RasterTools

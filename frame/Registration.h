@@ -1,6 +1,7 @@
 #pragma once
 // Load-time registration of the library's command classes and tools with the host, and of each filter with
-// the library's catalogue: one object per filter, in its command's source file.
+// the library's catalogue: one object per filter, in the unit that gives its stage text (or its command's
+// source file, for commands with one).
 
 #include "filters/Catalogue.h"
 #include "frame/KernelTexts.h"

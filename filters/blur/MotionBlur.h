@@ -22,7 +22,8 @@ struct MotionBlurFilter {
     static constexpr std::string_view kName = "motionblur";
     // The host knows the classes by these names (coverage, documents, tool lists).
     static constexpr std::string_view kCommandClass = "RasterMotionBlurCommand";
-    static constexpr std::string_view kToolClass = "MotionBlurTool"; // empty: no tool
+    static constexpr Kernel::FourCC kClassCode = Kernel::MakeFourCC("RMoB"); // in documents
+    static constexpr std::string_view kToolClass = "MotionBlurTool";         // empty: no tool
     static constexpr std::string_view kDescription = "Motion Blur";
     static constexpr std::string_view kHint = "|DRAG| to set radius and direction. |CLICK| to reset.";
     static constexpr ToolID kToolID = ToolID::MotionBlur;

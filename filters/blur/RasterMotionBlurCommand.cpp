@@ -11,11 +11,6 @@
 
 namespace RasterTools {
 
-const Kernel::ClassProperties RasterMotionBlurCommand::ms_ClassProperties(
-    Kernel::MakeFourCC("RMoB"), &RasterMotionBlurCommand::CreateObject, 1,
-    RasterMotionBlurCommand::__GetDefaultSerialisation(),
-    &RasterDevicePreviewableFilterLayerCommand::GetTypeClassProperties());
-
 namespace {
 const FilterRegistration<MotionBlurFilter, &MotionBlurDevice::GetKernelTexts> kRegistration;
 

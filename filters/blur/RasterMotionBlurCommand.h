@@ -40,16 +40,12 @@ public:
     // The whole raster (cut to the selection) on the processor.
     Kernel::RectT<int> DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const override;
 
-    const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
-    static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }
-
     // Effective radii beyond this many pixels are cut to it: the sums of 8- and 16-bit pixels stay exact.
     static constexpr int MaxWholeRadius = 30000;
 
 private:
     friend class FilterCommand<MotionBlurFilter>; // creates the default-constructed command for loading
     RasterMotionBlurCommand() = default;
-    static const Kernel::ClassProperties ms_ClassProperties;
 };
 
 } // namespace RasterTools

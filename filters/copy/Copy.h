@@ -20,7 +20,8 @@ struct CopyFilter {
     static constexpr std::string_view kName = "copy";
     // The host knows the classes by these names (coverage, documents, tool lists).
     static constexpr std::string_view kCommandClass = "RasterCopyCommand";
-    static constexpr std::string_view kToolClass = ""; // empty: no tool
+    static constexpr Kernel::FourCC kClassCode = Kernel::MakeFourCC("RCpy"); // in documents
+    static constexpr std::string_view kToolClass = "";                       // empty: no tool
     static constexpr std::string_view kDescription = "Copy";
     static constexpr ToolID kToolID = ToolID::None;
     // Scales beyond these make no sense for a copy and would only make huge or empty images.

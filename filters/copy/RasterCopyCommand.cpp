@@ -8,11 +8,6 @@
 
 namespace RasterTools {
 
-const Kernel::ClassProperties RasterCopyCommand::ms_ClassProperties(
-    Kernel::MakeFourCC("RCpy"), &RasterCopyCommand::CreateObject, 1,
-    RasterCopyCommand::__GetDefaultSerialisation(),
-    &RasterDevicePreviewableFilterLayerCommand::GetTypeClassProperties());
-
 namespace {
 
 // The four kinds of copy kernel into a layer format from the same format, for checks that compile them.

@@ -35,15 +35,11 @@ public:
     }
     bool PrepareDevice(const RenderTarget& target) const override;
 
-    const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
-    static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }
-
 private:
     friend class FilterCommand<CopyFilter>; // creates the default-constructed command for loading
     RasterCopyCommand() = default;
     // The scale that rendering uses: within the parameter's range.
     Kernel::PointT<double> GetEffectiveScale() const noexcept;
-    static const Kernel::ClassProperties ms_ClassProperties;
 };
 
 } // namespace RasterTools

@@ -1,12 +1,19 @@
 // The twirl and sphere Transform stages as kernel text: DistortMath's source, then a Transform that calls the
 // mapping with the stage's four floats.
 #include "filters/distort/DistortStages.h"
+#include "filters/distort/RasterSphereCommand.h"
+#include "filters/distort/RasterTwirlCommand.h"
+#include "frame/Registration.h"
 
 #include "host/raster/KernelText.h"
 
 #include <string>
 
 namespace RasterTools {
+
+// The filters enter the catalogue and the host's class list when the library loads.
+[[maybe_unused]] const FilterRegistration<TwirlFilter> kTwirlRegistration;
+[[maybe_unused]] const FilterRegistration<SphereFilter> kSphereRegistration;
 
 const char* DistortMath::GetSourceText() {
     static const char* const text = RASTER_KERNEL_STRINGIFY(RT_DISTORT_SOURCE);

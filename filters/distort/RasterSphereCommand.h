@@ -9,8 +9,10 @@ namespace RasterTools {
 
 class RasterSphereCommand final : public DistortCommand<SphereFilter, SphereTransform> {
 public:
-    RasterSphereCommand(bool liveEffect, double intensity, double radius, Kernel::PointT<double> centre);
-    RasterSphereCommand(bool liveEffect, const SphereParameters& params);
+    RasterSphereCommand(bool liveEffect, double intensity, double radius, Kernel::PointT<double> centre)
+        : DistortCommand(liveEffect, SphereParameters{intensity, radius, centre}) {}
+    RasterSphereCommand(bool liveEffect, const SphereParameters& params)
+        : DistortCommand(liveEffect, params) {}
 
     double GetIntensity() const noexcept { return m_Params.intensity; }
 
@@ -19,13 +21,9 @@ public:
         return float(params.intensity / 100.0);
     }
 
-    const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
-    static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }
-
 private:
     friend class FilterCommand<SphereFilter>; // creates the default-constructed command for loading
     RasterSphereCommand() = default;
-    static const Kernel::ClassProperties ms_ClassProperties;
 };
 
 } // namespace RasterTools

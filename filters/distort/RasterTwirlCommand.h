@@ -9,21 +9,19 @@ namespace RasterTools {
 
 class RasterTwirlCommand final : public DistortCommand<TwirlFilter, TwirlTransform> {
 public:
-    RasterTwirlCommand(bool liveEffect, double angle, double radius, Kernel::PointT<double> centre);
-    RasterTwirlCommand(bool liveEffect, const TwirlParameters& params);
+    RasterTwirlCommand(bool liveEffect, double angle, double radius, Kernel::PointT<double> centre)
+        : DistortCommand(liveEffect, TwirlParameters{angle, radius, centre}) {}
+    RasterTwirlCommand(bool liveEffect, const TwirlParameters& params)
+        : DistortCommand(liveEffect, params) {}
 
     double GetAngle() const noexcept { return m_Params.angle; }
 
     // The Transform stage's third float: the angle in degrees.
     static float StrengthOf(const TwirlParameters& params) noexcept { return float(params.angle); }
 
-    const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
-    static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }
-
 private:
     friend class FilterCommand<TwirlFilter>; // creates the default-constructed command for loading
     RasterTwirlCommand() = default;
-    static const Kernel::ClassProperties ms_ClassProperties;
 };
 
 } // namespace RasterTools

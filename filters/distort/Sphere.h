@@ -24,7 +24,8 @@ struct SphereFilter {
     static constexpr std::string_view kName = "sphere";
     // The host knows the classes by these names (coverage, documents, tool lists).
     static constexpr std::string_view kCommandClass = "RasterSphereCommand";
-    static constexpr std::string_view kToolClass = "SphereTool"; // empty: no tool
+    static constexpr Kernel::FourCC kClassCode = Kernel::MakeFourCC("RSpC"); // in documents
+    static constexpr std::string_view kToolClass = "SphereTool";             // empty: no tool
     static constexpr std::string_view kDescription = "Sphere";
     static constexpr std::string_view kHint = "|DRAG| to set sphere centre.";
     static constexpr ToolID kToolID = ToolID::Sphere;

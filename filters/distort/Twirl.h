@@ -35,7 +35,8 @@ struct TwirlFilter {
     static constexpr std::string_view kName = "twirl";
     // The host knows the classes by these names (coverage, documents, tool lists).
     static constexpr std::string_view kCommandClass = "RasterTwirlCommand";
-    static constexpr std::string_view kToolClass = "TwirlTool"; // empty: no tool
+    static constexpr Kernel::FourCC kClassCode = Kernel::MakeFourCC("RTwC"); // in documents
+    static constexpr std::string_view kToolClass = "TwirlTool";              // empty: no tool
     static constexpr std::string_view kDescription = "Twirl";
     static constexpr std::string_view kHint = "|DRAG| to set twirl centre.";
     static constexpr ToolID kToolID = ToolID::Twirl;

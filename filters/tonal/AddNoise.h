@@ -23,7 +23,8 @@ struct AddNoiseFilter {
     static constexpr std::string_view kName = "addnoise";
     // The host knows the classes by these names (coverage, documents, tool lists).
     static constexpr std::string_view kCommandClass = "RasterAddNoiseCommand";
-    static constexpr std::string_view kToolClass = "NoiseTool"; // empty: no tool
+    static constexpr Kernel::FourCC kClassCode = Kernel::MakeFourCC("RANC"); // in documents
+    static constexpr std::string_view kToolClass = "NoiseTool";              // empty: no tool
     static constexpr std::string_view kDescription = "Add Noise";
     static constexpr std::string_view kHint = "|DRAG| to set intensity. |CLICK| to reset.";
     static constexpr ToolID kToolID = ToolID::AddNoise;

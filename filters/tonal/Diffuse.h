@@ -21,7 +21,8 @@ struct DiffuseFilter {
     static constexpr std::string_view kName = "diffuse";
     // The host knows the classes by these names (coverage, documents, tool lists).
     static constexpr std::string_view kCommandClass = "RasterDiffuseCommand";
-    static constexpr std::string_view kToolClass = "DiffuseTool"; // empty: no tool
+    static constexpr Kernel::FourCC kClassCode = Kernel::MakeFourCC("RDf2"); // in documents
+    static constexpr std::string_view kToolClass = "DiffuseTool";            // empty: no tool
     static constexpr std::string_view kDescription = "Diffuse";
     static constexpr std::string_view kHint = "|DRAG| to set diffusion. |CLICK| to reset.";
     static constexpr ToolID kToolID = ToolID::Diffuse;

@@ -2,10 +2,15 @@
 // two offsets and reads the chosen pixel.
 #include "filters/tonal/DiffuseStages.h"
 #include "filters/tonal/NoiseStages.h"
+#include "filters/tonal/RasterDiffuseCommand.h"
+#include "frame/Registration.h"
 
 #include "host/raster/KernelText.h"
 
 namespace RasterTools {
+
+// The filter enters the catalogue and the host's class list when the library loads.
+[[maybe_unused]] const FilterRegistration<DiffuseFilter> kDiffuseRegistration;
 
 namespace {
 

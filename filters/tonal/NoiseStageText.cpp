@@ -1,6 +1,8 @@
 // The add-noise Sample stage as kernel text, per source format and language: the generator text that the
 // processor compiles (NoiseGenerator.h), then the Sample stage that seeds, draws and adds.
 #include "filters/tonal/NoiseStages.h"
+#include "filters/tonal/RasterAddNoiseCommand.h"
+#include "frame/Registration.h"
 
 #include "host/raster/KernelText.h"
 
@@ -9,6 +11,9 @@
 #include <vector>
 
 namespace RasterTools {
+
+// The filter enters the catalogue and the host's class list when the library loads.
+[[maybe_unused]] const FilterRegistration<AddNoiseFilter> kAddNoiseRegistration;
 
 namespace {
 

@@ -14,8 +14,10 @@ public:
     template <Raster::PixelFormat F>
     using MaskedStages = NoiseStages::Masked<F>;
 
-    RasterAddNoiseCommand(bool liveEffect, double intensity, bool mono, bool gaussian);
-    RasterAddNoiseCommand(bool liveEffect, const AddNoiseParameters& params);
+    RasterAddNoiseCommand(bool liveEffect, double intensity, bool mono, bool gaussian)
+        : SinglePassCommand(liveEffect, AddNoiseParameters{intensity, mono, gaussian}) {}
+    RasterAddNoiseCommand(bool liveEffect, const AddNoiseParameters& params)
+        : SinglePassCommand(liveEffect, params) {}
 
     double GetIntensity() const noexcept { return m_Params.intensity; }
     bool GetMono() const noexcept { return m_Params.mono; }
@@ -30,7 +32,20 @@ public:
     // to the view): the inverse of view as the sampler affine (a singular view gives the zero linear part
     // and the negated translation), sigma, the bounds' width truncated, mono and gaussian.
     NoiseSampler::Params GetSamplerParams(const Kernel::RectT<double>& bounds,
-                                          const Raster::AffineTransform::Params& view) const noexcept;
+                                          const Raster::AffineTransform::Params& view) const noexcept {
+        using namespace NoiseGenerator;
+        // Uniform noise is scaled down so that its spread is comparable to the gaussian's at equal intensity.
+        constexpr double UniformSpread = 0.341;
+        const auto inverse = Raster::AffineTransform::Invert(view).m;
+        NoiseSampler::Params params;
+        for (int i = 0; i < 6; ++i)
+            params.block[AffineIndex + i] = float(inverse[std::size_t(i)]);
+        params.block[SigmaIndex] = float((m_Params.gaussian ? 1.0 : UniformSpread) * m_Params.intensity);
+        params.block[WidthIndex] = TruncatedWidth(bounds.left, bounds.right);
+        params.block[MonoIndex] = m_Params.mono ? 1.0f : 0.0f;
+        params.block[GaussianIndex] = m_Params.gaussian ? 1.0f : 0.0f;
+        return params;
+    }
 
     template <class StageParams>
     void FillStageParams(StageParams& params, const Kernel::RectT<double>& bounds,
@@ -38,13 +53,9 @@ public:
         params.sampler = GetSamplerParams(bounds, view);
     }
 
-    const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
-    static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }
-
 private:
     friend class FilterCommand<AddNoiseFilter>; // creates the default-constructed command for loading
     RasterAddNoiseCommand() = default;
-    static const Kernel::ClassProperties ms_ClassProperties;
 };
 
 } // namespace RasterTools

@@ -5,6 +5,8 @@
 #include "filters/tonal/DiffuseStages.h"
 #include "frame/SinglePassCommand.h"
 
+#include <cmath>
+
 namespace RasterTools {
 
 class RasterDiffuseCommand final : public SinglePassCommand<DiffuseFilter> {
@@ -14,8 +16,10 @@ public:
     template <Raster::PixelFormat F>
     using MaskedStages = DiffuseStages::Masked<F>;
 
-    RasterDiffuseCommand(bool liveEffect, double intensity);
-    RasterDiffuseCommand(bool liveEffect, const DiffuseParameters& params);
+    RasterDiffuseCommand(bool liveEffect, double intensity)
+        : SinglePassCommand(liveEffect, DiffuseParameters{intensity}) {}
+    RasterDiffuseCommand(bool liveEffect, const DiffuseParameters& params)
+        : SinglePassCommand(liveEffect, params) {}
 
     double GetIntensity() const noexcept { return m_Params.intensity; }
 
@@ -29,7 +33,18 @@ public:
     // to the view): the inverse of view as the sampler affine (a singular view collapses, see
     // Raster::AffineTransform::Invert), sigma = intensity × the view's scale, the bounds' width truncated.
     DiffuseSampler::Params GetSamplerParams(const Kernel::RectT<double>& bounds,
-                                            const Raster::AffineTransform::Params& view) const noexcept;
+                                            const Raster::AffineTransform::Params& view) const noexcept {
+        const auto inverse = Raster::AffineTransform::Invert(view).m;
+        DiffuseSampler::Params params;
+        for (int i = 0; i < 6; ++i)
+            params.block[DiffuseSampler::AffineIndex + i] = float(inverse[std::size_t(i)]);
+        // The scatter distance follows the view's scale: the length of the view's image of (1, 1), over √2.
+        const auto& m = view.m;
+        const double scale = std::sqrt(((m[0] + m[1]) * (m[0] + m[1]) + (m[3] + m[4]) * (m[3] + m[4])) * 0.5);
+        params.block[DiffuseSampler::SigmaIndex] = float(m_Params.intensity * scale);
+        params.block[DiffuseSampler::WidthIndex] = NoiseGenerator::TruncatedWidth(bounds.left, bounds.right);
+        return params;
+    }
 
     template <class StageParams>
     void FillStageParams(StageParams& params, const Kernel::RectT<double>& bounds,
@@ -37,13 +52,9 @@ public:
         params.sampler = GetSamplerParams(bounds, view);
     }
 
-    const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
-    static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }
-
 private:
     friend class FilterCommand<DiffuseFilter>; // creates the default-constructed command for loading
     RasterDiffuseCommand() = default;
-    static const Kernel::ClassProperties ms_ClassProperties;
 };
 
 } // namespace RasterTools

@@ -10,11 +10,6 @@
 
 namespace RasterTools {
 
-const Kernel::ClassProperties RasterUnsharpMaskCommand::ms_ClassProperties(
-    Kernel::MakeFourCC("RUSC"), &RasterUnsharpMaskCommand::CreateObject, 1,
-    RasterUnsharpMaskCommand::__GetDefaultSerialisation(),
-    &RasterDevicePreviewableFilterLayerCommand::GetTypeClassProperties());
-
 namespace {
 const FilterRegistration<UnsharpMaskFilter, &UnsharpMaskDevice::GetKernelTexts> kRegistration;
 }

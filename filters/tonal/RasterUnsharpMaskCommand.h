@@ -31,13 +31,9 @@ public:
     bool PrepareDevice(const RenderTarget& target) const override;
     Kernel::RectT<int> DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const override;
 
-    const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
-    static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }
-
 private:
     friend class FilterCommand<UnsharpMaskFilter>; // creates the default-constructed command for loading
     RasterUnsharpMaskCommand() = default;
-    static const Kernel::ClassProperties ms_ClassProperties;
 };
 
 } // namespace RasterTools

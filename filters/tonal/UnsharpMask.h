@@ -23,7 +23,8 @@ struct UnsharpMaskFilter {
     static constexpr std::string_view kName = "unsharpmask";
     // The host knows the classes by these names (coverage, documents, tool lists).
     static constexpr std::string_view kCommandClass = "RasterUnsharpMaskCommand";
-    static constexpr std::string_view kToolClass = "UnsharpMaskTool"; // empty: no tool
+    static constexpr Kernel::FourCC kClassCode = Kernel::MakeFourCC("RUSC"); // in documents
+    static constexpr std::string_view kToolClass = "UnsharpMaskTool";        // empty: no tool
     static constexpr std::string_view kDescription = "Unsharp Mask";
     static constexpr std::string_view kHint = "|DRAG| to set radius. |CLICK| to reset.";
     static constexpr ToolID kToolID = ToolID::UnsharpMask;
