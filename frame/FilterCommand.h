@@ -9,10 +9,37 @@
 
 namespace RasterTools {
 
+// Filter::Command's entry in the host's class registry, under the class code its table declares, below the
+// host class Parent. Filter::Command must be default-constructible (for loading, which then sets its fields).
+template <class Filter, class Parent>
+struct FilterClassEntry {
+    static Kernel::Counted<Kernel::Serialisable> CreateObject() {
+        return Kernel::Counted<Kernel::Serialisable>(new typename Filter::Command());
+    }
+    // No property of a filter command declares a default value: one empty item.
+    static const Kernel::ClassPropertiesBase::DefaultItem* DefaultSerialisation() {
+        static const Kernel::ClassPropertiesBase::DefaultItem items[] = {{}};
+        return items;
+    }
+    // Version 1 unless the table declares kClassVersion (raise it when the saved form changes).
+    static constexpr unsigned short Version() {
+        if constexpr (requires { Filter::kClassVersion; })
+            return Filter::kClassVersion;
+        else
+            return 1;
+    }
+    // Constructed when the library loads, which registers the class for reading documents.
+    static inline const Kernel::ClassProperties properties{Filter::kClassCode, &CreateObject, Version(),
+                                                           DefaultSerialisation(),
+                                                           &Parent::GetTypeClassProperties()};
+};
+
 // Filter describes the filter (its Params record, parameter table, description, tool identifier, class code
 // and Command class); Filter::Command derives from FilterCommand<Filter>.
 template <class Filter>
 class FilterCommand : public RasterDevicePreviewableFilterLayerCommand {
+    using Entry = FilterClassEntry<Filter, RasterDevicePreviewableFilterLayerCommand>;
+
 public:
     using Params = typename Filter::Params;
 
@@ -36,7 +63,7 @@ public:
                                            [](const SelectedNode& node) { return node.isFilterLayer; }))
             return false;
         if (!SelectionCommandBase::IsSelectionEqualTo(this, same->GetSelection())) return false;
-        m_Params = same->m_Params;
+        m_Params = same->GetParameters();
         SetRenderCache(same->GetRenderCache());
         return true;
     }
@@ -71,19 +98,8 @@ public:
         return RasterDevicePreviewableFilterLayerCommand::Load(in, store, version);
     }
 
-    // The class registry's factory: a command with default fields, which Load then sets.
-    static Kernel::Counted<Kernel::Serialisable> CreateObject() {
-        return Kernel::Counted<Kernel::Serialisable>(new typename Filter::Command());
-    }
-
-    // No property of a filter command declares a default value: one empty item.
-    static const Kernel::ClassPropertiesBase::DefaultItem* __GetDefaultSerialisation() {
-        static const Kernel::ClassPropertiesBase::DefaultItem items[] = {{}};
-        return items;
-    }
-
-    const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
-    static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }
+    const Kernel::ClassProperties& GetObjectClassProperties() const override { return Entry::properties; }
+    static const Kernel::ClassProperties& GetTypeClassProperties() { return Entry::properties; }
 
 protected:
     // Only for loading: the fields are then set by Load.
@@ -92,19 +108,6 @@ protected:
         , m_Params(DefaultParameters(Filter::kParameters)) {}
 
     Params m_Params;
-
-private:
-    // The table's class code, version 1 unless it declares kClassVersion (raise it when the saved form
-    // changes). Constructed when the library loads, which registers the class for reading documents.
-    static constexpr unsigned short ClassVersion() {
-        if constexpr (requires { Filter::kClassVersion; })
-            return Filter::kClassVersion;
-        else
-            return 1;
-    }
-    static inline const Kernel::ClassProperties ms_ClassProperties{
-        Filter::kClassCode, &CreateObject, ClassVersion(), __GetDefaultSerialisation(),
-        &RasterDevicePreviewableFilterLayerCommand::GetTypeClassProperties()};
 };
 
 } // namespace RasterTools

@@ -10,6 +10,8 @@ namespace RasterTools {
 
 class RasterMotionBlurCommand final : public FilterCommand<MotionBlurFilter>, public PipelineCommand {
 public:
+    // For loading: Load then sets the fields.
+    RasterMotionBlurCommand() = default;
     RasterMotionBlurCommand(bool liveEffect, double radius, double radians);
     RasterMotionBlurCommand(bool liveEffect, const MotionBlurParameters& params);
 
@@ -42,10 +44,6 @@ public:
 
     // Effective radii beyond this many pixels are cut to it: the sums of 8- and 16-bit pixels stay exact.
     static constexpr int MaxWholeRadius = 30000;
-
-private:
-    friend class FilterCommand<MotionBlurFilter>; // creates the default-constructed command for loading
-    RasterMotionBlurCommand() = default;
 };
 
 } // namespace RasterTools

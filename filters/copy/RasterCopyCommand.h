@@ -10,6 +10,8 @@ namespace RasterTools {
 
 class RasterCopyCommand final : public FilterCommand<CopyFilter>, public PipelineCommand {
 public:
+    // For loading: Load then sets the fields.
+    RasterCopyCommand() = default;
     RasterCopyCommand(bool liveEffect, int format, Kernel::PointT<double> scale);
     RasterCopyCommand(bool liveEffect, const CopyParameters& params);
 
@@ -36,8 +38,6 @@ public:
     bool PrepareDevice(const RenderTarget& target) const override;
 
 private:
-    friend class FilterCommand<CopyFilter>; // creates the default-constructed command for loading
-    RasterCopyCommand() = default;
     // The scale that rendering uses: within the parameter's range.
     Kernel::PointT<double> GetEffectiveScale() const noexcept;
 };

@@ -9,6 +9,8 @@ namespace RasterTools {
 
 class RasterSphereCommand final : public DistortCommand<SphereFilter, SphereTransform> {
 public:
+    // For loading: Load then sets the fields.
+    RasterSphereCommand() = default;
     RasterSphereCommand(bool liveEffect, double intensity, double radius, Kernel::PointT<double> centre)
         : DistortCommand(liveEffect, SphereParameters{intensity, radius, centre}) {}
     RasterSphereCommand(bool liveEffect, const SphereParameters& params)
@@ -20,10 +22,6 @@ public:
     static float StrengthOf(const SphereParameters& params) noexcept {
         return float(params.intensity / 100.0);
     }
-
-private:
-    friend class FilterCommand<SphereFilter>; // creates the default-constructed command for loading
-    RasterSphereCommand() = default;
 };
 
 } // namespace RasterTools

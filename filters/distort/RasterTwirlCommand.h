@@ -9,6 +9,8 @@ namespace RasterTools {
 
 class RasterTwirlCommand final : public DistortCommand<TwirlFilter, TwirlTransform> {
 public:
+    // For loading: Load then sets the fields.
+    RasterTwirlCommand() = default;
     RasterTwirlCommand(bool liveEffect, double angle, double radius, Kernel::PointT<double> centre)
         : DistortCommand(liveEffect, TwirlParameters{angle, radius, centre}) {}
     RasterTwirlCommand(bool liveEffect, const TwirlParameters& params)
@@ -18,10 +20,6 @@ public:
 
     // The Transform stage's third float: the angle in degrees.
     static float StrengthOf(const TwirlParameters& params) noexcept { return float(params.angle); }
-
-private:
-    friend class FilterCommand<TwirlFilter>; // creates the default-constructed command for loading
-    RasterTwirlCommand() = default;
 };
 
 } // namespace RasterTools

@@ -1,6 +1,8 @@
 // The vertical edge detect Sample stage as kernel text, per source format: the six weighted neighbours in
 // the accumulator, the magnitude of each colour lane, the format's clamp, and the centre's other channels.
 #include "filters/tonal/EdgeDetectStages.h"
+#include "filters/tonal/RasterVerticalEdgeDetectCommand.h"
+#include "frame/Registration.h"
 
 #include "host/raster/KernelText.h"
 
@@ -10,6 +12,9 @@
 #include <vector>
 
 namespace RasterTools {
+
+// The filter enters the catalogue and the host's class list when the library loads.
+[[maybe_unused]] const FilterRegistration<VerticalEdgeDetectFilter> kVerticalEdgeDetectRegistration;
 
 namespace {
 

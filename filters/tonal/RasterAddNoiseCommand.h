@@ -14,6 +14,8 @@ public:
     template <Raster::PixelFormat F>
     using MaskedStages = NoiseStages::Masked<F>;
 
+    // For loading: Load then sets the fields.
+    RasterAddNoiseCommand() = default;
     RasterAddNoiseCommand(bool liveEffect, double intensity, bool mono, bool gaussian)
         : SinglePassCommand(liveEffect, AddNoiseParameters{intensity, mono, gaussian}) {}
     RasterAddNoiseCommand(bool liveEffect, const AddNoiseParameters& params)
@@ -52,10 +54,6 @@ public:
                          const Raster::AffineTransform::Params& view) const noexcept {
         params.sampler = GetSamplerParams(bounds, view);
     }
-
-private:
-    friend class FilterCommand<AddNoiseFilter>; // creates the default-constructed command for loading
-    RasterAddNoiseCommand() = default;
 };
 
 } // namespace RasterTools

@@ -16,6 +16,8 @@ public:
     template <Raster::PixelFormat F>
     using MaskedStages = DiffuseStages::Masked<F>;
 
+    // For loading: Load then sets the fields.
+    RasterDiffuseCommand() = default;
     RasterDiffuseCommand(bool liveEffect, double intensity)
         : SinglePassCommand(liveEffect, DiffuseParameters{intensity}) {}
     RasterDiffuseCommand(bool liveEffect, const DiffuseParameters& params)
@@ -51,10 +53,6 @@ public:
                          const Raster::AffineTransform::Params& view) const noexcept {
         params.sampler = GetSamplerParams(bounds, view);
     }
-
-private:
-    friend class FilterCommand<DiffuseFilter>; // creates the default-constructed command for loading
-    RasterDiffuseCommand() = default;
 };
 
 } // namespace RasterTools

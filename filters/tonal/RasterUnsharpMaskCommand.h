@@ -10,6 +10,8 @@ namespace RasterTools {
 
 class RasterUnsharpMaskCommand final : public FilterCommand<UnsharpMaskFilter>, public PipelineCommand {
 public:
+    // For loading: Load then sets the fields.
+    RasterUnsharpMaskCommand() = default;
     RasterUnsharpMaskCommand(bool liveEffect, double radius, double factor, double threshold);
     RasterUnsharpMaskCommand(bool liveEffect, const UnsharpMaskParameters& params);
 
@@ -30,10 +32,6 @@ public:
     RenderPath Render(const RenderTarget& target) const override;
     bool PrepareDevice(const RenderTarget& target) const override;
     Kernel::RectT<int> DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const override;
-
-private:
-    friend class FilterCommand<UnsharpMaskFilter>; // creates the default-constructed command for loading
-    RasterUnsharpMaskCommand() = default;
 };
 
 } // namespace RasterTools

@@ -18,28 +18,31 @@ public:
 
     RasterVerticalEdgeDetectCommand() = default;
     // The catalogue's form; a command without parameters has no live form, so liveEffect is ignored.
-    RasterVerticalEdgeDetectCommand(bool liveEffect, const VerticalEdgeDetectParameters& params);
+    RasterVerticalEdgeDetectCommand(bool, const VerticalEdgeDetectParameters& params)
+        : m_Params(params) {}
 
     const VerticalEdgeDetectParameters& GetParameters() const noexcept { return m_Params; }
 
-    Kernel::LocalisedString GetDescription() const override;
-    Kernel::Counted<DocumentCommand> Clone() const override;
+    Kernel::LocalisedString GetDescription() const override {
+        return Kernel::LocalisedString(std::string(VerticalEdgeDetectFilter::kDescription),
+                                       "Command description");
+    }
+    Kernel::Counted<DocumentCommand> Clone() const override {
+        return Kernel::Counted<DocumentCommand>(new RasterVerticalEdgeDetectCommand(false, m_Params));
+    }
     bool CanRepeat() const override { return true; }
+
+    const Kernel::ClassProperties& GetObjectClassProperties() const override { return Entry::properties; }
+    static const Kernel::ClassProperties& GetTypeClassProperties() { return Entry::properties; }
 
     // The stages take no parameters.
     template <class StageParams>
     void FillStageParams(StageParams&, const Kernel::RectT<double>&,
                          const Raster::AffineTransform::Params&) const noexcept {}
 
-    const Kernel::ClassProperties& GetObjectClassProperties() const override { return ms_ClassProperties; }
-    static const Kernel::ClassProperties& GetTypeClassProperties() { return ms_ClassProperties; }
-    static Kernel::Counted<Kernel::Serialisable> CreateObject();
-    // No property declares a default value: one empty item.
-    static const Kernel::ClassPropertiesBase::DefaultItem* __GetDefaultSerialisation();
-
 private:
+    using Entry = FilterClassEntry<VerticalEdgeDetectFilter, RasterCommand>;
     VerticalEdgeDetectParameters m_Params;
-    static const Kernel::ClassProperties ms_ClassProperties;
 };
 
 } // namespace RasterTools

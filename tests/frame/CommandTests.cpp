@@ -42,7 +42,8 @@ Kernel::Counted<T> LoadInto(const std::vector<std::byte>& records, Kernel::Count
 }
 
 Kernel::Counted<RasterAddNoiseCommand> FreshNoise() {
-    return Kernel::CountedCast<RasterAddNoiseCommand>(RasterAddNoiseCommand::CreateObject());
+    return Kernel::CountedCast<RasterAddNoiseCommand>(
+        RasterAddNoiseCommand::GetTypeClassProperties().CreateObject());
 }
 
 } // namespace
@@ -295,7 +296,7 @@ TEST(CommandAnswers, EveryRegisteredCommandGivesTheHostContractsAnswers) {
     }
     EXPECT_EQ(RasterAddNoiseCommand::GetTypeClassProperties().GetClassCode(), 0x52414E43u); // "RANC"
     // No default values are declared for any property.
-    EXPECT_EQ(RasterAddNoiseCommand::__GetDefaultSerialisation()[0].code, 0u);
+    EXPECT_EQ(RasterAddNoiseCommand::GetTypeClassProperties().GetDefaults()[0].code, 0u);
 }
 
 TEST(CommandReflection, TheLiveLayerPanelShowsTheCommandsLabels) {

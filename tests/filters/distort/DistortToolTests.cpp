@@ -170,7 +170,7 @@ TEST(DistortCommands, SaveWritesTheCodesInOrderThenTheBaseAndLoadRestoresThem) {
     AppendRecord(expected, Kernel::MakeFourCC("Live"), 2, &live, 1);
     EXPECT_EQ(out.GetBytes(), expected);
 
-    const auto loaded = RasterTwirlCommand::CreateObject();
+    const auto loaded = RasterTwirlCommand::GetTypeClassProperties().CreateObject();
     Kernel::FileStore store;
     ASSERT_TRUE(loaded->Load(Kernel::InSerialiser(out.GetBytes()), store, 1));
     const auto* back = dynamic_cast<const RasterTwirlCommand*>(loaded.Get());
