@@ -8,6 +8,7 @@
 #include "host/raster/KernelText.h"
 #include "host/raster/device/Hardware.h"
 
+#include <cctype>
 #include <cmath>
 #include <map>
 #include <tuple>
@@ -255,6 +256,73 @@ bool ProceduralTextureCommand::ValidateConfig(const Config::Handle& config,
                             config, values, state);
     if (!valid && error) *error = state.error;
     return valid;
+}
+
+// ---- The short form of equations
+
+std::optional<ProceduralTextureEquation> ProceduralTextureCommand::ParseEquation(Config::ColourFormat format,
+                                                                                 std::string_view text,
+                                                                                 std::string* error) {
+    const auto fail = [&](std::string why) -> std::optional<ProceduralTextureEquation> {
+        if (error) *error = std::move(why);
+        return std::nullopt;
+    };
+    const auto equals = text.find('=');
+    if (equals == std::string_view::npos) return fail("expected CHANNELS=EXPRESSION, e.g. rgb=x/w");
+    const std::string_view channels = text.substr(0, equals);
+    const auto& names = Config::ChannelNames(format);
+    const auto find = [&](std::string_view name) {
+        for (std::size_t c = 0; c < names.size(); ++c) {
+            const std::string& candidate = names[c];
+            if (candidate.size() == name.size() &&
+                std::equal(name.begin(), name.end(), candidate.begin(),
+                           [](char a, char b) { return std::tolower(a) == std::tolower(b); }))
+                return int(c);
+        }
+        return -1;
+    };
+    std::uint32_t mask = 0;
+    const auto add = [&](std::string_view name) {
+        const int c = find(name);
+        if (c < 0) return false;
+        mask |= 1u << c;
+        return true;
+    };
+    std::string all;
+    for (const auto& name : names)
+        all += (all.empty() ? "" : ", ") + name;
+    if (channels.find(',') != std::string_view::npos) {
+        std::size_t start = 0;
+        while (start <= channels.size()) {
+            const auto end = std::min(channels.find(',', start), channels.size());
+            if (!add(channels.substr(start, end - start)))
+                return fail("unknown channel \"" + std::string(channels.substr(start, end - start)) + "\" (" +
+                            Config::ColourFormatString(format) + " has " + all + ")");
+            start = end + 1;
+        }
+    } else if (!add(channels)) {
+        for (char letter : channels)
+            if (!add(std::string_view(&letter, 1)))
+                return fail("unknown channel \"" + std::string(1, letter) + "\" (" +
+                            Config::ColourFormatString(format) + " has " + all + ")");
+    }
+    if (!mask) return fail("no channel before '='");
+    return ProceduralTextureEquation(std::string(text.substr(equals + 1)), mask);
+}
+
+std::string ProceduralTextureCommand::FormatEquation(Config::ColourFormat format,
+                                                     const ProceduralTextureEquation& equation) {
+    const auto& names = Config::ChannelNames(format);
+    const bool letters =
+        std::all_of(names.begin(), names.end(), [](const std::string& n) { return n.size() == 1; });
+    std::string channels;
+    for (std::size_t c = 0; c < names.size(); ++c) {
+        if (!(equation.GetChannelMask() & (1u << c))) continue;
+        if (!letters && !channels.empty()) channels += ',';
+        for (char letter : names[c])
+            channels += char(std::tolower(letter));
+    }
+    return channels + "=" + equation.GetText();
 }
 
 // ---- The device's Sample text

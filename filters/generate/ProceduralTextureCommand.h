@@ -58,6 +58,12 @@ public:
     // null when the device cannot express an equation (the processor then renders).
     static const char* GetSampleText(const Config::Handle& config, const State& state,
                                      Raster::PixelFormat format, HardwareKernelLanguage language);
+    // The short form of an equation, "rgb=EXPR": the channels it writes (single-letter names run together,
+    // otherwise separated by commas, in any case), '=', then its text. Nothing for an unknown channel or no
+    // '='.
+    static std::optional<ProceduralTextureEquation>
+    ParseEquation(Config::ColourFormat format, std::string_view text, std::string* error = nullptr);
+    static std::string FormatEquation(Config::ColourFormat format, const ProceduralTextureEquation& equation);
     // The starter presets (stripes, rings, checkerboard, noise marble, colour gradient), with their inputs.
     static const std::vector<ProceduralTextureConfigProperty>& GetStarterPresets();
 
