@@ -10,6 +10,7 @@
 
 #include <cctype>
 #include <cmath>
+#include <fstream>
 #include <map>
 #include <tuple>
 
@@ -263,66 +264,150 @@ bool ProceduralTextureCommand::ValidateConfig(const Config::Handle& config,
 std::optional<ProceduralTextureEquation> ProceduralTextureCommand::ParseEquation(Config::ColourFormat format,
                                                                                  std::string_view text,
                                                                                  std::string* error) {
-    const auto fail = [&](std::string why) -> std::optional<ProceduralTextureEquation> {
-        if (error) *error = std::move(why);
-        return std::nullopt;
-    };
     const auto equals = text.find('=');
-    if (equals == std::string_view::npos) return fail("expected CHANNELS=EXPRESSION, e.g. rgb=x/w");
-    const std::string_view channels = text.substr(0, equals);
-    const auto& names = Config::ChannelNames(format);
-    const auto find = [&](std::string_view name) {
-        for (std::size_t c = 0; c < names.size(); ++c) {
-            const std::string& candidate = names[c];
-            if (candidate.size() == name.size() &&
-                std::equal(name.begin(), name.end(), candidate.begin(),
-                           [](char a, char b) { return std::tolower(a) == std::tolower(b); }))
-                return int(c);
-        }
-        return -1;
-    };
-    std::uint32_t mask = 0;
-    const auto add = [&](std::string_view name) {
-        const int c = find(name);
-        if (c < 0) return false;
-        mask |= 1u << c;
-        return true;
-    };
-    std::string all;
-    for (const auto& name : names)
-        all += (all.empty() ? "" : ", ") + name;
-    if (channels.find(',') != std::string_view::npos) {
-        std::size_t start = 0;
-        while (start <= channels.size()) {
-            const auto end = std::min(channels.find(',', start), channels.size());
-            if (!add(channels.substr(start, end - start)))
-                return fail("unknown channel \"" + std::string(channels.substr(start, end - start)) + "\" (" +
-                            Config::ColourFormatString(format) + " has " + all + ")");
-            start = end + 1;
-        }
-    } else if (!add(channels)) {
-        for (char letter : channels)
-            if (!add(std::string_view(&letter, 1)))
-                return fail("unknown channel \"" + std::string(1, letter) + "\" (" +
-                            Config::ColourFormatString(format) + " has " + all + ")");
+    if (equals == std::string_view::npos) {
+        if (error) *error = "expected CHANNELS=EXPRESSION, e.g. rgb=x/w";
+        return std::nullopt;
     }
-    if (!mask) return fail("no channel before '='");
-    return ProceduralTextureEquation(std::string(text.substr(equals + 1)), mask);
+    const auto mask = Config::ParseChannels(format, text.substr(0, equals), error);
+    if (!mask) return std::nullopt;
+    return ProceduralTextureEquation(std::string(text.substr(equals + 1)), *mask);
 }
 
 std::string ProceduralTextureCommand::FormatEquation(Config::ColourFormat format,
                                                      const ProceduralTextureEquation& equation) {
-    const auto& names = Config::ChannelNames(format);
-    const bool letters =
-        std::all_of(names.begin(), names.end(), [](const std::string& n) { return n.size() == 1; });
-    std::string channels;
-    for (std::size_t c = 0; c < names.size(); ++c) {
-        if (!(equation.GetChannelMask() & (1u << c))) continue;
-        if (!letters && !channels.empty()) channels += ',';
-        for (char letter : names[c])
-            channels += char(std::tolower(letter));
+    return Config::FormatChannels(format, equation.GetChannelMask()) + "=" + equation.GetText();
+}
+
+Counted<RasterCommand>
+ProceduralTextureCommand::MakeCommandWithText(bool liveEffect, const std::vector<ParameterValue>& values,
+                                              const std::vector<std::pair<std::string, std::string>>& texts,
+                                              std::string& error) {
+    ProceduralTextureParameters params = DefaultParameters(ProceduralTextureFilter::kParameters);
+    for (std::size_t i = 0; i < values.size() && i < ProceduralTextureFilter::kParameters.size(); ++i)
+        SetParameter(params, ProceduralTextureFilter::kParameters[i], values[i]);
+    BoundParameters(params, ProceduralTextureFilter::kParameters);
+    const auto& preset =
+        GetStarterPresets()[std::size_t(std::clamp(params.preset, 0, int(GetStarterPresets().size()) - 1))];
+    Config::Handle config = preset.GetConfig();
+    Counted<const ExpressionConstantValues> inputValues = preset.GetValues();
+
+    std::optional<Config::ColourFormat> colour;
+    std::optional<bool> radians;
+    std::vector<std::string> equations, assignments;
+    bool fromFile = false;
+    for (const auto& [flag, text] : texts) {
+        if (flag == "config") {
+            if (fromFile) {
+                error = "--config is given more than once";
+                return nullptr;
+            }
+            std::ifstream file(text, std::ios::binary);
+            if (!file) {
+                error = text + ": cannot be read";
+                return nullptr;
+            }
+            std::string contents;
+            constexpr std::size_t Limit = 4 << 20; // a texture is a few lines; anything larger is not one
+            contents.resize(Limit + 1);
+            file.read(contents.data(), std::streamsize(contents.size()));
+            contents.resize(std::size_t(file.gcount()));
+            if (contents.size() > Limit) {
+                error = text + ": larger than a texture definition can be";
+                return nullptr;
+            }
+            std::string why;
+            const auto definition = ReadProceduralTextureJson(contents, why);
+            if (!definition) {
+                error = text + ": " + why;
+                return nullptr;
+            }
+            config = definition->config;
+            inputValues = definition->values;
+            fromFile = true;
+        } else if (flag == "eq") {
+            equations.push_back(text);
+        } else if (flag == "input") {
+            assignments.push_back(text);
+        } else if (flag == "colour") {
+            colour = Config::ParseColourFormat(text);
+            if (!colour) {
+                error = "--colour: \"" + text + "\" is not RGB, CMYK, Lab, Intensity or Alpha";
+                return nullptr;
+            }
+        } else if (flag == "angles") {
+            if (text != "deg" && text != "rad") {
+                error = "--angles: expected deg or rad";
+                return nullptr;
+            }
+            radians = text == "rad";
+        } else {
+            error = "--" + flag + " is not a flag of proceduraltexture";
+            return nullptr;
+        }
     }
-    return channels + "=" + equation.GetText();
+    if (!equations.empty()) {
+        if (fromFile) {
+            error = "--eq and --config cannot be used together";
+            return nullptr;
+        }
+        config = Config::CreateEmpty(colour.value_or(Config::RGB));
+        inputValues = Counted<const ExpressionConstantValues>(new ExpressionConstantValues);
+        for (const std::string& text : equations) {
+            std::string why;
+            const auto equation = ParseEquation(config->GetColourFormat(), text, &why);
+            if (!equation) {
+                error = "--eq \"" + text + "\": " + why;
+                return nullptr;
+            }
+            config = config->AddEquation(*equation);
+        }
+        if (!radians) radians = false;
+    } else if (colour && *colour != config->GetColourFormat()) {
+        error = "--colour needs --eq (a preset or config keeps its own colour format)";
+        return nullptr;
+    }
+    if (radians) config = config->ChangeAnglesInRadians(*radians);
+    // --input sets an input's value, adding a real input of that name when there is none.
+    auto valuesCopy =
+        inputValues ? inputValues->Clone() : ExpressionConstantValues::Create(config->GetConstantSet());
+    for (const std::string& assignment : assignments) {
+        const auto equals = assignment.find('=');
+        const auto number = equals == std::string::npos
+                                ? std::nullopt
+                                : ParseParameterValue(ParameterType::Double, assignment.substr(equals + 1));
+        if (!number) {
+            error = "--input \"" + assignment + "\": expected NAME=NUMBER";
+            return nullptr;
+        }
+        const std::string name = assignment.substr(0, equals);
+        const double value = std::get<double>(*number);
+        const int index = config->GetConstantSet().IndexOf(name);
+        if (index < 0) {
+            auto input = ExpressionConstant::Create(ExpressionConstant::Real, name, "", std::min(0.0, value),
+                                                    std::max(1.0, value));
+            config = config->ReplaceConstantSet(config->GetConstantSet().WithAdded(input));
+            auto grown = valuesCopy->GetValues();
+            grown.emplace_back(value);
+            valuesCopy = Kernel::MakeCounted<ExpressionConstantValues>(std::move(grown));
+        } else if (config->GetConstantSet().Get(std::size_t(index)).IsVector()) {
+            error = "--input " + name + ": a vector input is set in a --config file";
+            return nullptr;
+        } else {
+            while (valuesCopy->GetCount() <= std::size_t(index)) {
+                auto grown = valuesCopy->GetValues();
+                grown.emplace_back(0.0);
+                valuesCopy = Kernel::MakeCounted<ExpressionConstantValues>(std::move(grown));
+            }
+            if (config->GetConstantSet().Get(std::size_t(index)).GetKind() == ExpressionConstant::Integer)
+                valuesCopy->Set(std::size_t(index), int(std::lround(value)));
+            else
+                valuesCopy->Set(std::size_t(index), value);
+        }
+    }
+    if (!ValidateConfig(config, valuesCopy, &error)) return nullptr;
+    return Counted<RasterCommand>(
+        new ProceduralTextureCommand(liveEffect, params.origin, params.opacity, 0, config, valuesCopy));
 }
 
 // ---- The device's Sample text

@@ -64,6 +64,10 @@ public:
     static std::optional<ProceduralTextureEquation>
     ParseEquation(Config::ColourFormat format, std::string_view text, std::string* error = nullptr);
     static std::string FormatEquation(Config::ColourFormat format, const ProceduralTextureEquation& equation);
+    // The catalogue's form for the command line: the table's values and the text flags (see kTextFlags).
+    static Kernel::Counted<RasterCommand>
+    MakeCommandWithText(bool liveEffect, const std::vector<ParameterValue>& values,
+                        const std::vector<std::pair<std::string, std::string>>& texts, std::string& error);
     // The starter presets (stripes, rings, checkerboard, noise marble, colour gradient), with their inputs.
     static const std::vector<ProceduralTextureConfigProperty>& GetStarterPresets();
 

@@ -3,6 +3,10 @@
 
 #include "host/raster/PixelFormat.h"
 
+#include <nlohmann/json.hpp>
+
+#include <algorithm>
+#include <cctype>
 #include <cmath>
 #include <functional>
 
@@ -378,6 +382,80 @@ int ProceduralTextureConfig::ChannelCount(ColourFormat format) {
     return int(ChannelNames(format).size());
 }
 
+namespace {
+bool SameLetters(std::string_view a, std::string_view b) {
+    return a.size() == b.size() && std::equal(a.begin(), a.end(), b.begin(), [](char x, char y) {
+               return std::tolower(static_cast<unsigned char>(x)) ==
+                      std::tolower(static_cast<unsigned char>(y));
+           });
+}
+} // namespace
+
+std::optional<std::uint32_t>
+ProceduralTextureConfig::ParseChannels(ColourFormat format, std::string_view text, std::string* error) {
+    const auto& names = ChannelNames(format);
+    std::string all;
+    for (const auto& name : names)
+        all += (all.empty() ? "" : ", ") + name;
+    std::uint32_t mask = 0;
+    const auto add = [&](std::string_view name) {
+        for (std::size_t c = 0; c < names.size(); ++c)
+            if (SameLetters(name, names[c])) {
+                mask |= 1u << c;
+                return true;
+            }
+        if (error)
+            *error = "unknown channel \"" + std::string(name) + "\" (" + ColourFormatString(format) +
+                     " has " + all + ")";
+        return false;
+    };
+    if (text.find(',') != std::string_view::npos) {
+        std::size_t start = 0;
+        while (start <= text.size()) {
+            const auto end = std::min(text.find(',', start), text.size());
+            if (!add(text.substr(start, end - start))) return std::nullopt;
+            start = end + 1;
+        }
+    } else {
+        bool whole = false;
+        for (const auto& name : names)
+            whole = whole || SameLetters(text, name);
+        if (whole) {
+            add(text);
+        } else {
+            for (std::size_t i = 0; i < text.size(); ++i)
+                if (!add(text.substr(i, 1))) return std::nullopt;
+        }
+    }
+    if (!mask) {
+        if (error)
+            *error = "no channel named (" + std::string(ColourFormatString(format)) + " has " + all + ")";
+        return std::nullopt;
+    }
+    return mask;
+}
+
+std::string ProceduralTextureConfig::FormatChannels(ColourFormat format, std::uint32_t mask) {
+    const auto& names = ChannelNames(format);
+    const bool letters =
+        std::all_of(names.begin(), names.end(), [](const std::string& n) { return n.size() == 1; });
+    std::string text;
+    for (std::size_t c = 0; c < names.size(); ++c) {
+        if (!(mask & (1u << c))) continue;
+        if (!letters && !text.empty()) text += ',';
+        for (char letter : names[c])
+            text += char(std::tolower(static_cast<unsigned char>(letter)));
+    }
+    return text;
+}
+
+std::optional<ProceduralTextureConfig::ColourFormat>
+ProceduralTextureConfig::ParseColourFormat(std::string_view text) {
+    for (int f = 0; f < ColourFormatCount; ++f)
+        if (SameLetters(text, ColourFormatString(ColourFormat(f)))) return ColourFormat(f);
+    return std::nullopt;
+}
+
 ProceduralTextureConfig::Handle ProceduralTextureConfig::AddEquation() const {
     return AddEquation(ProceduralTextureEquation({}, (1u << ChannelCount(m_ColourFormat)) - 1));
 }
@@ -543,4 +621,162 @@ bool ProceduralTextureConfigProperty::Load(const Kernel::InSerialiser& in, Kerne
 
 const Kernel::ClassProperties& ProceduralTextureConfigProperty::GetObjectClassProperties() const {
     return s_PropertyClass;
+}
+
+// ---- The JSON form
+
+namespace {
+
+const char* const KindNames[ExpressionConstant::KindCount] = {"real",    "integer", "angle",
+                                                              "percent", "toggle",  "vector"};
+
+} // namespace
+
+std::optional<ProceduralTextureDefinition> ReadProceduralTextureJson(std::string_view text,
+                                                                     std::string& error) {
+    using nlohmann::json;
+    const json document = json::parse(text.begin(), text.end(), nullptr, false);
+    if (document.is_discarded() || !document.is_object()) {
+        error = "not a JSON object";
+        return std::nullopt;
+    }
+    const auto fail = [&](std::string why) -> std::optional<ProceduralTextureDefinition> {
+        error = std::move(why);
+        return std::nullopt;
+    };
+    ProceduralTextureConfig::ColourFormat format = ProceduralTextureConfig::RGB;
+    if (document.contains("colourFormat")) {
+        const auto& value = document["colourFormat"];
+        const auto parsed = value.is_string()
+                                ? ProceduralTextureConfig::ParseColourFormat(value.get<std::string>())
+                                : std::nullopt;
+        if (!parsed) return fail("colourFormat: expected RGB, CMYK, Lab, Intensity or Alpha");
+        format = *parsed;
+    }
+    bool radians = false;
+    if (document.contains("anglesInRadians")) {
+        if (!document["anglesInRadians"].is_boolean()) return fail("anglesInRadians: expected true or false");
+        radians = document["anglesInRadians"].get<bool>();
+    }
+    std::vector<Counted<const ExpressionConstant>> constants;
+    std::vector<ExpressionConstantValue> values;
+    if (document.contains("inputs")) {
+        const auto& inputs = document["inputs"];
+        if (!inputs.is_array() || inputs.size() > ExpressionConstantSet::MaxConstants)
+            return fail("inputs: expected an array of at most " +
+                        std::to_string(ExpressionConstantSet::MaxConstants));
+        for (std::size_t i = 0; i < inputs.size(); ++i) {
+            const auto& input = inputs[i];
+            const std::string where = "inputs[" + std::to_string(i) + "]";
+            if (!input.is_object() || !input.contains("name") || !input["name"].is_string())
+                return fail(where + ": expected an object with a \"name\"");
+            int kind = ExpressionConstant::Real;
+            if (input.contains("kind")) {
+                const auto& k = input["kind"];
+                const auto* found = k.is_string() ? std::find(std::begin(KindNames), std::end(KindNames),
+                                                              k.get<std::string>())
+                                                  : std::end(KindNames);
+                if (found == std::end(KindNames))
+                    return fail(where + ".kind: expected real, integer, angle, percent, toggle or vector");
+                kind = int(found - std::begin(KindNames));
+            }
+            const auto number = [&](const char* key, double fallback, double& out) {
+                if (!input.contains(key)) {
+                    out = fallback;
+                    return true;
+                }
+                if (!input[key].is_number()) return false;
+                out = input[key].get<double>();
+                return std::isfinite(out);
+            };
+            double minimum = 0.0, maximum = 1.0;
+            if (!number("min", 0.0, minimum) || !number("max", 1.0, maximum))
+                return fail(where + ": min and max must be numbers");
+            const std::string description = input.contains("description") && input["description"].is_string()
+                                                ? input["description"].get<std::string>()
+                                                : "";
+            constants.push_back(ExpressionConstant::Create(kind, input["name"].get<std::string>(),
+                                                           description, minimum, maximum));
+            if (kind == ExpressionConstant::Vector) {
+                ExpressionConstantValueVec angles;
+                if (input.contains("value")) {
+                    const auto& v = input["value"];
+                    if (!v.is_array() || v.size() != 2 || !v[0].is_number() || !v[1].is_number())
+                        return fail(where + ".value: a vector takes [a, e], two angles in radians");
+                    angles = {v[0].get<double>(), v[1].get<double>()};
+                }
+                values.emplace_back(angles);
+            } else {
+                double value = kind == ExpressionConstant::Real && !input.contains("value") ? 1.0 : minimum;
+                if (!number("value", value, value)) return fail(where + ".value: expected a number");
+                if (kind == ExpressionConstant::Integer)
+                    values.emplace_back(int(std::clamp(std::round(value), -2147483648.0, 2147483647.0)));
+                else
+                    values.emplace_back(value);
+            }
+        }
+    }
+    Counted<const ExpressionConstantSet> set(new ExpressionConstantSet(std::move(constants)));
+    auto config =
+        ProceduralTextureConfig::CreateEmpty(format)->ReplaceConstantSet(set)->ChangeAnglesInRadians(radians);
+    if (!document.contains("equations") || !document["equations"].is_array())
+        return fail("equations: expected an array");
+    const auto& equations = document["equations"];
+    if (equations.size() > ProceduralTextureConfig::MaxEquations)
+        return fail("equations: at most " + std::to_string(ProceduralTextureConfig::MaxEquations));
+    for (std::size_t i = 0; i < equations.size(); ++i) {
+        const auto& equation = equations[i];
+        const std::string where = "equations[" + std::to_string(i) + "]";
+        if (!equation.is_object() || !equation.contains("text") || !equation["text"].is_string())
+            return fail(where + ": expected an object with a \"text\"");
+        std::uint32_t mask = (1u << ProceduralTextureConfig::ChannelCount(format)) - 1;
+        if (equation.contains("channels")) {
+            std::string why;
+            const auto parsed = equation["channels"].is_string()
+                                    ? ProceduralTextureConfig::ParseChannels(
+                                          format, equation["channels"].get<std::string>(), &why)
+                                    : std::nullopt;
+            if (!parsed) return fail(where + ".channels: " + (why.empty() ? "expected a string" : why));
+            mask = *parsed;
+        }
+        config = config->AddEquation(ProceduralTextureEquation(equation["text"].get<std::string>(), mask));
+    }
+    return ProceduralTextureDefinition{
+        config, Counted<ExpressionConstantValues>(new ExpressionConstantValues(std::move(values)))};
+}
+
+std::string WriteProceduralTextureJson(const ProceduralTextureConfig& config,
+                                       const ExpressionConstantValues* values) {
+    using nlohmann::json;
+    json document;
+    document["colourFormat"] = ProceduralTextureConfig::ColourFormatString(config.GetColourFormat());
+    document["anglesInRadians"] = config.GetAnglesInRadians();
+    json equations = json::array();
+    for (const auto& equation : config.GetEquations())
+        equations.push_back({{"channels", ProceduralTextureConfig::FormatChannels(
+                                              config.GetColourFormat(), equation->GetChannelMask())},
+                             {"text", equation->GetText()}});
+    document["equations"] = equations;
+    json inputs = json::array();
+    const auto& set = config.GetConstantSet();
+    for (std::size_t i = 0; i < set.GetCount(); ++i) {
+        const auto& constant = set.Get(i);
+        json input = {{"name", constant.GetConstant()},
+                      {"kind", KindNames[constant.GetKind()]},
+                      {"description", constant.GetDescription()}};
+        if (!constant.IsVector()) {
+            input["min"] = constant.GetRangeMinimum();
+            input["max"] = constant.GetRangeMaximum();
+        }
+        if (values && i < values->GetCount()) {
+            const auto& value = values->Get(i);
+            if (const auto* vec = std::get_if<ExpressionConstantValueVec>(&value))
+                input["value"] = {vec->a, vec->e};
+            else
+                input["value"] = ExpressionConstantValues::ToDouble(value);
+        }
+        inputs.push_back(input);
+    }
+    document["inputs"] = inputs;
+    return document.dump(2) + "\n";
 }

@@ -230,6 +230,13 @@ public:
     // Channel names in mask order ("R", "G", "B", "A" for RGB), and their count.
     static const std::vector<std::string>& ChannelNames(ColourFormat format);
     static int ChannelCount(ColourFormat format);
+    // A channel list as people type it: single-letter names run together ("rgb"), otherwise separated by
+    // commas ("l,lb"), in any case. Nothing (error says why) for an unknown channel or an empty list.
+    static std::optional<std::uint32_t> ParseChannels(ColourFormat format, std::string_view text,
+                                                      std::string* error = nullptr);
+    static std::string FormatChannels(ColourFormat format, std::uint32_t mask);
+    // "RGB", "CMYK", "Lab", "Intensity", "Alpha" in any case.
+    static std::optional<ColourFormat> ParseColourFormat(std::string_view text);
 
     ColourFormat GetColourFormat() const noexcept { return m_ColourFormat; }
     const Equations& GetEquations() const noexcept { return m_Equations; }
@@ -301,3 +308,19 @@ private:
     Kernel::Counted<const ExpressionConstantValues> m_Values;
     std::vector<InputsPreset> m_Presets;
 };
+
+// A texture as a JSON document, for files people write by hand:
+//   {"colourFormat": "RGB", "anglesInRadians": false,
+//    "equations": [{"channels": "rgb", "text": "sin(x / 8) * 0.5 + 0.5"}],
+//    "inputs": [{"name": "period", "kind": "real", "description": "...", "min": 1, "max": 100, "value": 8},
+//               {"name": "light", "kind": "vector", "value": [0.5, 0.3]}]}
+// Kinds: real, integer, angle, percent, toggle, vector (value: the angles a and e in radians).
+struct ProceduralTextureDefinition {
+    ProceduralTextureConfig::Handle config;
+    Kernel::Counted<ExpressionConstantValues> values;
+};
+// Nothing, with error naming the place and the problem, for text that is not such a document.
+std::optional<ProceduralTextureDefinition> ReadProceduralTextureJson(std::string_view text,
+                                                                     std::string& error);
+std::string WriteProceduralTextureJson(const ProceduralTextureConfig& config,
+                                       const ExpressionConstantValues* values);
