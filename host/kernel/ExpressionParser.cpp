@@ -653,6 +653,11 @@ const std::map<std::string_view, FunctionInfo>& Functions() {
 
 constexpr double Pi = 3.14159265358979323846;
 
+// A name as a message quotes it: long names are cut.
+std::string Quote(std::string_view name) {
+    return "\"" + std::string(name.substr(0, 40)) + (name.size() > 40 ? "...\"" : "\"");
+}
+
 std::string Plural(int n, const char* word) {
     return std::to_string(n) + " " + word + (n == 1 ? "" : "s");
 }
@@ -903,7 +908,7 @@ private:
         const UnitInfo* found = nullptr;
         for (const auto& u : Units)
             if (same(unit, u.name)) found = &u;
-        if (!found) throw CompileError("unknown unit \"" + unit + "\"", offset);
+        if (!found) throw CompileError("unknown unit " + Quote(unit), offset);
         if (!m_Allowed[found->category])
             throw CompileError("unit \"" + unit + "\" is not allowed here", offset);
         using L = Ep::UnitConverter::LengthUnit;
@@ -1017,7 +1022,7 @@ private:
             if (Functions().count(name) || name == "pi" || name == "tau" || name == "e")
                 throw CompileError("cannot assign to \"" + name + "\", a built-in name", first.offset);
             if (m_Constants.IndexOf(name) >= 0 && !m_Locals.count(name))
-                throw CompileError("cannot assign to constant \"" + name + "\"", first.offset);
+                throw CompileError("cannot assign to constant " + Quote(name), first.offset);
             Next();
             Next();
             Val v = Ternary();
@@ -1132,6 +1137,7 @@ private:
         Val base = Postfix();
         if (Peek().kind != Tok::Caret) return base;
         const Token& op = Next();
+        Depth depth(*this, op.offset);
         Val exponent = Unary();
         return Map(Op::Pow, {&base, &exponent}, op.offset, Dimension::Plain);
     }
@@ -1237,12 +1243,12 @@ private:
         if (name == "e") return LiteralValue(2.71828182845904524f, offset);
         if (Functions().count(name))
             throw CompileError("function \"" + name + "\" needs arguments in parentheses", offset);
-        throw CompileError("unknown name \"" + name + "\"", offset);
+        throw CompileError("unknown name " + Quote(name), offset);
     }
 
     Val Call(const std::string& name, std::size_t offset) {
         const auto found = Functions().find(name);
-        if (found == Functions().end()) throw CompileError("unknown function \"" + name + "\"", offset);
+        if (found == Functions().end()) throw CompileError("unknown function " + Quote(name), offset);
         const FunctionInfo& f = found->second;
         Expect(Tok::LParen, "(");
         std::vector<Val> args;
@@ -1356,7 +1362,7 @@ private:
         default:
             break;
         }
-        throw CompileError("unknown function \"" + name + "\"", offset);
+        throw CompileError("unknown function " + Quote(name), offset);
     }
 
     Val Dot(const Val& a, const Val& b, std::size_t offset) {
