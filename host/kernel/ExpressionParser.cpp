@@ -880,7 +880,8 @@ private:
         if (i >= m_Text.size()) return true;
         const char c = m_Text[i];
         const bool operandStart = (c >= '0' && c <= '9') || (c >= 'a' && c <= 'z') ||
-                                  (c >= 'A' && c <= 'Z') || c == '_' || c == '.' || c == '(' || c == '!';
+                                  (c >= 'A' && c <= 'Z') || c == '_' || c == '.' || c == '(' ||
+                                  (c == '!' && !(i + 1 < m_Text.size() && m_Text[i + 1] == '='));
         return !operandStart;
     }
 

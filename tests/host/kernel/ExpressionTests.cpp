@@ -199,6 +199,9 @@ TEST(ExpressionValues, UnitsThroughTheConverter) {
             {"(50%)", {0.5}},
             {"7%2", {1}},
             {"7% - 2", {-1.93}},
+            {"50% != 1", {1}},
+            {"50%!=0.5", {0}},
+            {"!50%", {0}},
         },
         &at300);
     // Without a converter, 72 pixels to the inch.
