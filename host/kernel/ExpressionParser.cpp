@@ -1668,13 +1668,15 @@ std::string BuildPrelude(int language) {
     std::string text = "#ifndef KERNEL_EXPRESSIONS\n#define KERNEL_EXPRESSIONS\n";
     if (language == 0) {
         text += "namespace Expressions {\n"
+                "#define ex_inline inline\n"
                 "typedef unsigned int ex_uint;\n"
                 "inline ex_uint ex_bits(float v) { return __float_as_uint(v); }\n"
                 "inline float ex_from_bits(ex_uint v) { return __uint_as_float(v); }\n"
                 "inline float ex_floor_p(float v) { return floorf(v); }\n"
                 "inline float ex_sqrt_p(float v) { return sqrtf(v); }\n";
     } else {
-        text += "typedef uint ex_uint;\n"
+        text += "#define ex_inline inline\n"
+                "typedef uint ex_uint;\n"
                 "inline ex_uint ex_bits(float v) { return as_uint(v); }\n"
                 "inline float ex_from_bits(ex_uint v) { return as_float(v); }\n"
                 "inline float ex_floor_p(float v) { return floor(v); }\n"
@@ -1696,6 +1698,42 @@ const char* Ep::GetDevicePrelude(int language) noexcept {
     return texts[language].c_str();
 }
 
+namespace {
+
+// One instruction over n lanes, one function per operation so that each is inlined and vectorised on its
+// own. The destination may be one of the arguments: each lane is read before it is written.
+using SpanFunction = void (*)(float* dest, const float* A, const float* B, const float* C, int count);
+
+#define EXPRESSION_SPAN(name, arity, form, text, expr)                                                       \
+    template <int Fixed>                                                                                     \
+    void Span##name(float* dest, const float* A, const float* B, const float* C, int count) {                \
+        const int n = Fixed > 0 ? Fixed : count;                                                             \
+        _Pragma("omp simd") for (int i = 0; i < n; ++i) {                                                    \
+            const float a = A[i];                                                                            \
+            [[maybe_unused]] const float b = B[i];                                                           \
+            [[maybe_unused]] const float c = C[i];                                                           \
+            dest[i] = expr;                                                                                  \
+        }                                                                                                    \
+    }
+EXPRESSION_OPERATIONS(EXPRESSION_SPAN)
+#undef EXPRESSION_SPAN
+
+// The functions for a whole span and for fewer lanes.
+std::pair<SpanFunction, SpanFunction> SpanFunctionsOf(Op op) {
+    switch (op) {
+#define EXPRESSION_SPAN_CASE(name, arity, form, text, expr)                                                  \
+    case Op::name:                                                                                           \
+        return {&Span##name<Ep::Lanes>, &Span##name<0>};
+        EXPRESSION_OPERATIONS(EXPRESSION_SPAN_CASE)
+#undef EXPRESSION_SPAN_CASE
+    default:
+        break;
+    }
+    return {nullptr, nullptr};
+}
+
+} // namespace
+
 // ---- Sessions --------------------------------------------------------------------------------------------
 
 struct Ep::ByteCode::Session::State {
@@ -1704,7 +1742,8 @@ struct Ep::ByteCode::Session::State {
     std::vector<Counted<Constant>> inputs; // keeps the constants whose lanes are read alive
     std::vector<float> storage;            // registers, literal lanes, zeros; 64-byte aligned within
     struct Bound {
-        Op op;
+        void (*whole)(float*, const float*, const float*, const float*, int);
+        void (*part)(float*, const float*, const float*, const float*, int);
         float* dest;
         const float* args[3];
     };
@@ -1756,49 +1795,27 @@ Ep::ByteCode::Session::CreateForThread(Counted<const ByteCode> byteCode, Counted
         }
         return zeros;
     };
-    for (const auto& in : program.code)
-        state->code.push_back({in.op,
+    for (const auto& in : program.code) {
+        const auto functions = SpanFunctionsOf(in.op);
+        if (!functions.first) return nullptr;
+        state->code.push_back({functions.first,
+                               functions.second,
                                registers + std::size_t(in.dest) * Lanes,
                                {resolve(in.args[0]), resolve(in.args[1]), resolve(in.args[2])}});
+    }
     for (int c = 0; c < program.components; ++c)
         state->outputs[c] = resolve(program.outputs[c]);
     return std::unique_ptr<Session>(new Session(std::move(state)));
 }
 
-namespace {
-
-// One instruction over n lanes. The destination may be one of the arguments: each lane is read before it
-// is written.
-template <int Fixed>
-void Run(Op op, float* dest, const float* A, const float* B, const float* C, int count) {
-    const int n = Fixed > 0 ? Fixed : count;
-    switch (op) {
-#define EXPRESSION_RUN(name, arity, form, text, expr)                                                        \
-    case Op::name:                                                                                           \
-        _Pragma("omp simd") for (int i = 0; i < n; ++i) {                                                    \
-            const float a = A[i];                                                                            \
-            [[maybe_unused]] const float b = B[i];                                                           \
-            [[maybe_unused]] const float c = C[i];                                                           \
-            dest[i] = expr;                                                                                  \
-        }                                                                                                    \
-        break;
-        EXPRESSION_OPERATIONS(EXPRESSION_RUN)
-#undef EXPRESSION_RUN
-    default:
-        break;
-    }
-}
-
-} // namespace
-
 bool Ep::ByteCode::Session::ExecuteSpan(int count) noexcept {
     if (!m_State || count < 1 || count > Lanes) return false;
-    for (const auto& in : m_State->code) {
-        if (count == Lanes)
-            Run<Lanes>(in.op, in.dest, in.args[0], in.args[1], in.args[2], count);
-        else
-            Run<0>(in.op, in.dest, in.args[0], in.args[1], in.args[2], count);
-    }
+    if (count == Lanes)
+        for (const auto& in : m_State->code)
+            in.whole(in.dest, in.args[0], in.args[1], in.args[2], count);
+    else
+        for (const auto& in : m_State->code)
+            in.part(in.dest, in.args[0], in.args[1], in.args[2], count);
     return true;
 }
 
