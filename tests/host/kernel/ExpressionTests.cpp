@@ -678,3 +678,44 @@ TEST(ExpressionKernelText, ReadsConstantsByNameAndRefusesReservedNames) {
 }
 
 } // namespace
+
+namespace {
+
+// The README's textures, in degrees, at points worked out by hand.
+TEST(ExpressionValues, ReadmeTextures) {
+    Table table(0.0, 0.0); // w = 100, h = 200
+    auto at = [&](const char* text, double x, double y) {
+        table.x->SetValue(x);
+        table.y->SetValue(y);
+        return Evaluate(table, text, true);
+    };
+    const char* stripes = "s = x * cos(30) + y * sin(30); fract(s / 32) < 0.5";
+    EXPECT_EQ(at(stripes, 0.5, 0.5).values[0], 1.0f);
+    EXPECT_EQ(at(stripes, 20.0, 0.0).values[0], 0.0f) << "s = 17.3: the second half of the period";
+    EXPECT_EQ(at(stripes, 0.0, 20.0).values[0], 1.0f) << "s = 10";
+    EXPECT_EQ(at(stripes, 0.0, 40.0).values[0], 0.0f) << "s = 20";
+    const char* rings = "r = hypot(x - w / 2, y - h / 2); 0.5 + 0.5 * sin(r * 18)";
+    EXPECT_FLOAT_EQ(at(rings, 50.0, 100.0).values[0], 0.5f);
+    EXPECT_NEAR(at(rings, 55.0, 100.0).values[0], 1.0f, 1e-6) << "r = 5: 90 degrees";
+    EXPECT_NEAR(at(rings, 50.0, 115.0).values[0], 0.0f, 1e-6) << "r = 15: 270 degrees";
+    const char* checker = "(floor(x / 32) + floor(y / 32)) % 2";
+    EXPECT_EQ(at(checker, 16.0, 16.0).values[0], 0.0f);
+    EXPECT_EQ(at(checker, 48.0, 16.0).values[0], 1.0f);
+    EXPECT_EQ(at(checker, -16.0, 16.0).values[0], 1.0f) << "squares continue across zero";
+    EXPECT_EQ(at(checker, 48.0, 40.0).values[0], 0.0f);
+    const char* marble = "t = fbm(x / 120, y / 120, 6); v = 0.5 + 0.5 * sin(x * 0.9 + 400 * t); "
+                         "vec3(0.9, 0.85, 0.8) * (0.35 + 0.65 * v)";
+    for (double x : {0.0, 13.5, 77.25, 512.0}) {
+        const auto v = at(marble, x, x * 0.7);
+        ASSERT_EQ(v.components, 3);
+        EXPECT_GE(v.values[0], 0.9f * 0.35f - 1e-6f);
+        EXPECT_LE(v.values[0], 0.9f + 1e-6f);
+        EXPECT_NEAR(v.values[1] / v.values[0], 0.85f / 0.9f, 1e-6f);
+    }
+    const char* spot = "d = distance(vec2(x, y), vec2(w, h) / 2) / w; 1 - smoothstep(0.1, 0.4, d)";
+    EXPECT_EQ(at(spot, 50.0, 100.0).values[0], 1.0f);
+    EXPECT_EQ(at(spot, 50.0, 150.0).values[0], 0.0f) << "d = 0.5";
+    EXPECT_NEAR(at(spot, 50.0, 125.0).values[0], 0.5f, 1e-6) << "d = 0.25, halfway";
+}
+
+} // namespace
