@@ -235,11 +235,15 @@ inline ex_uint ex_bits(float v) noexcept {
 inline float ex_from_bits(ex_uint v) noexcept {
     return std::bit_cast<float>(v);
 }
-// Exact, and written out so that loops over it vectorise without SSE4.1's rounding instruction.
+// Exact, and written out so that loops over it vectorise without SSE4.1's rounding instruction: adding and
+// subtracting 2^23 rounds to a whole number, one is taken off where that rounded up, and the sign of the
+// argument is kept (floor(-0) is -0). Whole numbers, infinities and NaN pass through.
 inline float ex_floor_p(float v) noexcept {
-    const bool whole = !(std::fabs(v) < 8388608.0f) || v == 0.0f;
-    const float truncated = float(int(whole ? 0.0f : v));
-    return whole ? v : truncated - float(truncated > v);
+    const float m = v < 0.0f ? -8388608.0f : 8388608.0f;
+    const float r = (v + m) - m;
+    const float t = r > v ? r - 1.0f : r;
+    const float s = ex_from_bits(ex_bits(t) | (ex_bits(v) & 0x80000000u));
+    return std::fabs(v) < 8388608.0f ? s : v;
 }
 inline float ex_sqrt_p(float v) noexcept {
     return std::sqrt(v);

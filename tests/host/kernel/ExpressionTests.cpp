@@ -719,3 +719,30 @@ TEST(ExpressionValues, ReadmeTextures) {
 }
 
 } // namespace
+
+namespace {
+
+// Fractal noise runs octave by octave across a span, each lane with its own octave count; every lane must
+// still be exactly the shared function's value.
+TEST(ExpressionExecution, FractalNoiseSpansMatchTheSharedFunction) {
+    Table table;
+    const auto c = Compile(table, "fbm(x / 9, y / 9, 1 + fract(x / 17) * 12)");
+    ASSERT_TRUE(c.code);
+    auto info = Ep::ExecuteInfo::Create(table.constants);
+    auto session = Ep::ByteCode::Session::CreateForThread(c.code, info);
+    for (int n : {Ep::Lanes, 7}) {
+        for (int lane = 0; lane < Ep::Lanes; ++lane) {
+            table.x->GetLanes()[lane] = static_cast<float>(lane) * 5.3f - 40.0f;
+            table.y->GetLanes()[lane] = static_cast<float>(lane) * -2.1f + 3.0f;
+        }
+        ASSERT_TRUE(session->ExecuteSpan(n));
+        for (int lane = 0; lane < n; ++lane) {
+            using namespace Kernel::ExpressionMath;
+            const float x = table.x->GetLanes()[lane], y = table.y->GetLanes()[lane];
+            const float expected = ex_fbm(x / 9.0f, y / 9.0f, 1.0f + ex_fract(x / 17.0f) * 12.0f);
+            EXPECT_EQ(session->GetResultLanes(0)[lane], expected) << "lane " << lane << " of " << n;
+        }
+    }
+}
+
+} // namespace
