@@ -223,3 +223,39 @@ TEST(ProceduralTextureModel, BrokenStoredFormsAreRefused) {
     }
     EXPECT_FALSE(ExpressionConstant::Create(42, "n", "", 0, 1));
 }
+
+TEST(ProceduralTextureModel, JsonFormRoundTripsAndRefusesWhatItCannotRead) {
+    auto values = ExpressionConstantValues::Create(*SampleSet());
+    values->Set(0, 12.5);
+    values->Set(1, 4);
+    values->Set(2, ExpressionConstantValueVec{0.5, 0.25});
+    const Config::Handle config = SampleConfig()->ChangeAnglesInRadians(true);
+    std::string error;
+    const auto read = ReadProceduralTextureJson(WriteProceduralTextureJson(*config, values.Get()), error);
+    ASSERT_TRUE(read) << error;
+    EXPECT_EQ(read->config, config);
+    EXPECT_TRUE(*read->values == *values);
+
+    const std::pair<const char*, const char*> refused[] = {
+        {"[]", "not a JSON object"},
+        {"{\"equations\": 3}", "equations: expected an array"},
+        {"{\"colourFormat\": \"HSV\", \"equations\": []}", "colourFormat"},
+        {"{\"equations\": [{\"channels\": \"rgz\", \"text\": \"1\"}]}", "unknown channel \"z\""},
+        {"{\"equations\": [], \"inputs\": [{\"name\": \"v\", \"kind\": \"vector\", \"value\": 3}]}",
+         "inputs[0].value"},
+        {"{\"equations\": [], \"inputs\": [{\"name\": \"k\", \"kind\": \"complex\"}]}", "inputs[0].kind"},
+        {"{\"equations\": [{\"text\": \"1\"}", "not a JSON object"},
+    };
+    for (const auto& [text, message] : refused) {
+        error.clear();
+        EXPECT_FALSE(ReadProceduralTextureJson(text, error)) << text;
+        EXPECT_NE(error.find(message), std::string::npos) << text << ": " << error;
+    }
+    // Channels default to all of the colour format's; Lab names run with commas.
+    const auto lab = ReadProceduralTextureJson("{\"colourFormat\": \"lab\", \"equations\": [{\"text\": "
+                                               "\"1\"}, {\"channels\": \"l,LB\", \"text\": \"0\"}]}",
+                                               error);
+    ASSERT_TRUE(lab) << error;
+    EXPECT_EQ(lab->config->GetEquations()[0]->GetChannelMask(), 15u);
+    EXPECT_EQ(lab->config->GetEquations()[1]->GetChannelMask(), 5u);
+}
