@@ -143,7 +143,7 @@ TEST(ProceduralTextureValues, InputsAnglesAndUnits) {
         RenderPixel(*MakeCommand(MakeConfig(Config::RGB, {{"sin(90)", 1}}, {}, false)), source, 0, 0)[0],
         255);
     EXPECT_EQ(RenderPixel(*MakeCommand(MakeConfig(Config::RGB, {{"sin(90)", 1}}, {}, true)), source, 0, 0)[0],
-              228);
+              227);
 }
 
 TEST(ProceduralTextureValues, OpacityMixesWithTheLayer) {
