@@ -80,7 +80,8 @@ struct ProceduralTextureFilter {
           .commandLabel = "Opacity",
           .minimum = 0.0,
           .maximum = 1.0,
-          .defaultValue = 1.0},
+          .defaultValue = 1.0,
+          .persisted = false},
          &Params::opacity},
     }};
 };
