@@ -685,6 +685,16 @@ const std::vector<ProceduralTextureConfigProperty>& ProceduralTextureCommand::Ge
 
 // ---- The command
 
+namespace {
+// The starter preset a config is, for the table's "preset"; 0 for a config of its own.
+int StarterIndex(const Config::Handle& config) {
+    const auto& presets = ProceduralTextureCommand::GetStarterPresets();
+    for (std::size_t i = 0; i < presets.size(); ++i)
+        if (presets[i].GetConfig() == config) return int(i);
+    return 0;
+}
+} // namespace
+
 ProceduralTextureCommand::ProceduralTextureCommand()
     : m_Config(GetStarterPresets()[0].GetConfig())
     , m_Values(GetStarterPresets()[0].GetValues()) {}
@@ -696,7 +706,9 @@ ProceduralTextureCommand::ProceduralTextureCommand(bool liveEffect, const Kernel
     : SinglePassCommand(liveEffect, ProceduralTextureParameters{0, origin, opacity})
     , m_BlendMode(blendMode >= 0 && blendMode < BlendModeCount ? blendMode : 0)
     , m_Config(config)
-    , m_Values(values) {}
+    , m_Values(values) {
+    m_Params.preset = StarterIndex(m_Config);
+}
 
 ProceduralTextureCommand::ProceduralTextureCommand(bool liveEffect, const ProceduralTextureParameters& params)
     : SinglePassCommand(liveEffect, params) {
@@ -881,6 +893,7 @@ bool ProceduralTextureCommand::Load(const Kernel::InSerialiser& in, Kernel::File
     const auto* loadedConfig = dynamic_cast<const Config*>(config.Get());
     if (!loadedConfig) return false;
     m_Config = Config::Consolidate(*loadedConfig);
+    m_Params.preset = StarterIndex(m_Config);
     // A stored object of another class is no value set: the defaults are used.
     const Counted<Kernel::Serialisable> values = in.LoadObject(Kernel::MakeFourCC("CVls"), store);
     m_Values =
