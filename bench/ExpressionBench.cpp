@@ -11,6 +11,7 @@
 #include <cmath>
 #include <cstdint>
 #include <cstdio>
+#include <cstdlib>
 #include <string>
 #include <thread>
 #include <vector>
@@ -22,11 +23,13 @@ using Ep = Kernel::ExpressionParser;
 
 constexpr int Size = 4096;
 
-// (a) one sine; (b) three components from about fifteen operations, one of them noise.
+// (a) one sine; (b) three components from about fifteen operations, one of them noise; (c) one division,
+// which shows what a pixel costs besides its equation.
 const char* const Expressions[] = {
     "sin(x / 20) * 0.5 + 0.5",
     "n = noise(x / 64, y / 64); r = hypot(x - w / 2, y - h / 2) / w; "
     "vec3(n * 0.5 + 0.5, fract(r * 8), (x + y) / (w + h) * (1 - abs(n)))",
+    "x / w",
 };
 
 struct Compiled {
@@ -36,6 +39,8 @@ struct Compiled {
     Counted<Ep::ByteCode> code;
 
     explicit Compiled(const char* text) {
+        // EXPRESSION in the environment replaces (c), to time any other text.
+        if (text == Expressions[2] && std::getenv("EXPRESSION")) text = std::getenv("EXPRESSION");
         x = constants->AddVolatile("x", 0.0);
         y = constants->AddVolatile("y", 0.0);
         constants->Add("w", Size);
@@ -50,6 +55,10 @@ struct Compiled {
         code = compiled->ConvertToNumeric(*info, Ep::UnitTypeNumber, true);
     }
 };
+
+std::string Name(std::int64_t index) {
+    return index == 0 ? "(a) " : index == 1 ? "(b) " : "(c) ";
+}
 
 inline std::uint8_t ToByte(float v) {
     const float s = v * 255.0f;
@@ -101,7 +110,7 @@ void Processor(benchmark::State& state) {
     }
     state.counters["Mpix/s"] = benchmark::Counter(double(Size) * Size * double(state.iterations()) / 1e6,
                                                   benchmark::Counter::kIsRate);
-    state.SetLabel(std::string(state.range(0) == 0 ? "(a) " : "(b) ") +
+    state.SetLabel(Name(state.range(0)) +
                    std::to_string(compiled.code->GetInstructionCount()) + " instructions, " +
                    std::to_string(threads) + " thread" + (threads > 1 ? "s" : ""));
 }
@@ -149,12 +158,12 @@ void OpenCL(benchmark::State& state) {
         ExecuteKernel(device.Get(), descriptor, Size, Size, arguments);
     state.counters["Mpix/s"] = benchmark::Counter(double(Size) * Size * double(state.iterations()) / 1e6,
                                                   benchmark::Counter::kIsRate);
-    state.SetLabel(std::string(state.range(0) == 0 ? "(a) " : "(b) ") + device->GetName());
+    state.SetLabel(Name(state.range(0)) + device->GetName());
 }
 
 } // namespace
 
-BENCHMARK(Processor)->ArgsProduct({{0, 1}, {1, 2}})->Unit(benchmark::kMillisecond)->UseRealTime();
-BENCHMARK(OpenCL)->Arg(0)->Arg(1)->Unit(benchmark::kMillisecond)->UseRealTime();
+BENCHMARK(Processor)->ArgsProduct({{0, 1, 2}, {1, 2}})->Unit(benchmark::kMillisecond)->UseRealTime();
+BENCHMARK(OpenCL)->Arg(0)->Arg(1)->Arg(2)->Unit(benchmark::kMillisecond)->UseRealTime();
 
 BENCHMARK_MAIN();

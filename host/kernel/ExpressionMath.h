@@ -71,19 +71,24 @@
         return ((2.443315711809948e-5f * z - 1.388731625493765e-3f) * z + 4.166664568298827e-2f) * z * z -   \
                0.5f * z + 1.0f;                                                                              \
     }                                                                                                        \
-    /* Quadrant q (0..3) and remainder r of |a|; |a| beyond 2^23 carries no phase and reduces to 0. */       \
-    ex_inline float ex_reduce_quarter(float a, int* q) {                                                        \
+    /* |a| = j pi/4 + r with j even and |r| <= pi/4; |a| beyond 2^23 carries no phase and reduces to 0. */  \
+    ex_inline float ex_reduced(float a) {                                                                    \
         const float x = ex_abs(a);                                                                           \
-        const float xs = x < 8388608.0f ? x : 0.0f;                                                          \
-        int j = ex_to_int(ex_floor_p(xs * 1.27323954473516268f));                                            \
-        j = j + (j & 1);                                                                                     \
+        return x < 8388608.0f ? x : 0.0f;                                                                    \
+    }                                                                                                        \
+    ex_inline int ex_octant(float a) {                                                                       \
+        const int j = ex_to_int(ex_floor_p(ex_reduced(a) * 1.27323954473516268f));                           \
+        return j + (j & 1);                                                                                  \
+    }                                                                                                        \
+    ex_inline float ex_remainder(float a, int j) {                                                           \
         const float y = (float)j;                                                                            \
-        *q = (j >> 1) & 3;                                                                                   \
-        return ((xs - y * 0.78515625f) - y * 2.4187564849853515625e-4f) - y * 3.77489497744594108e-8f;       \
+        return ((ex_reduced(a) - y * 0.78515625f) - y * 2.4187564849853515625e-4f) -                         \
+               y * 3.77489497744594108e-8f;                                                                  \
     }                                                                                                        \
     ex_inline float ex_sin(float a) {                                                                           \
-        int q = 0;                                                                                           \
-        const float r = ex_reduce_quarter(a, &q);                                                            \
+        const int j = ex_octant(a);                                                                          \
+        const int q = (j >> 1) & 3;                                                                          \
+        const float r = ex_remainder(a, j);                                                                  \
         const float z = r * r;                                                                               \
         const float s = ex_sin_poly(r, z), c = ex_cos_poly(z);                                               \
         const float v = (q & 1) ? c : s;                                                                     \
@@ -92,8 +97,9 @@
         return a - a != 0.0f ? a - a : res;                                                                  \
     }                                                                                                        \
     ex_inline float ex_cos(float a) {                                                                           \
-        int q = 0;                                                                                           \
-        const float r = ex_reduce_quarter(a, &q);                                                            \
+        const int j = ex_octant(a);                                                                          \
+        const int q = (j >> 1) & 3;                                                                          \
+        const float r = ex_remainder(a, j);                                                                  \
         const float z = r * r;                                                                               \
         const float s = ex_sin_poly(r, z), c = ex_cos_poly(z);                                               \
         const float v = (q & 1) ? s : c;                                                                     \
