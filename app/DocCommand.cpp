@@ -113,13 +113,6 @@ std::chrono::milliseconds LockTimeout() {
     return std::chrono::milliseconds(std::llround(seconds * 1000));
 }
 
-// Holds the document against other commands from before it is read until it has been written back.
-Kernel::FileLock LockDocument(const std::string& path) {
-    Kernel::FileLock lock;
-    if (auto busy = lock.Acquire(path, LockTimeout(), false)) throw Error(*busy);
-    return lock;
-}
-
 // "copy format=-1 scale=1,1", or the command's description for commands the library does not know.
 std::string DescribeFilterCommand(const Command& command) {
     const RasterTools::FilterInfo* info = RasterTools::FindFilterOf(command);
@@ -355,6 +348,12 @@ int RunUndoRedo(const DocArguments& arguments, bool undo) {
 }
 
 } // namespace
+
+Kernel::FileLock LockDocument(const std::string& path) {
+    Kernel::FileLock lock;
+    if (auto busy = lock.Acquire(path, LockTimeout(), false)) throw Error(*busy);
+    return lock;
+}
 
 int RunDoc(const std::vector<std::string>& args) {
     if (args.empty()) throw UsageError(std::string(kDocUsage));

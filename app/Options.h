@@ -1,6 +1,8 @@
 #pragma once
 // Small helpers shared by the rastertools subcommands: errors with exit codes, argument parsing.
 
+#include "host/kernel/AtomicFile.h"
+
 #include <iosfwd>
 #include <stdexcept>
 #include <string>
@@ -30,6 +32,10 @@ public:
     explicit UsageError(std::string message)
         : Error(std::move(message), kExitUsage) {}
 };
+
+// Holds the document at path against other commands that change it, from before it is read until it has
+// been written back; waits RASTERTOOLS_LOCK_TIMEOUT seconds (default 10), then fails saying it is in use.
+Kernel::FileLock LockDocument(const std::string& path);
 
 // How a play script runs: whether the verbs that read or write files (save, load, render) are allowed, and
 // the size of the document's background layer.

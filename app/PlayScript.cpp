@@ -118,6 +118,8 @@ public:
             Show(words[1]);
         } else if (verb == "save") {
             arguments(1, 1, "save FILE");
+            // Not in the middle of another command's change to the same document.
+            const Kernel::FileLock lock = LockDocument(words[1]);
             if (auto error = DocumentFile::Save(*m_Controller->GetDocument(), words[1]))
                 throw ScriptError(*error);
             m_Out << "  saved " << words[1] << '\n';

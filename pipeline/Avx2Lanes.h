@@ -3,7 +3,7 @@
 // narrowing, and the transposes between pixels and planes. Only shuffles and conversions of whole values, so
 // they keep every bit. For functions built with RT_TARGET_AVX2.
 
-#include "pipeline/Cpu.h"
+#include "host/kernel/Simd.h"
 
 #if RT_AVX2_BUILD
 #include <immintrin.h>

@@ -7,8 +7,8 @@
 // Planar's own loops, built for AVX2 by their caller. SpanConversions.cpp and the tests include this, and
 // call it where the processor has AVX2.
 
+#include "host/kernel/Simd.h"
 #include "pipeline/Avx2Lanes.h"
-#include "pipeline/Cpu.h"
 #include "pipeline/PlanarConversions.h"
 
 #include <array>

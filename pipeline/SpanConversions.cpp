@@ -1,6 +1,6 @@
 // The span conversions of every pair of planar formats, each built for AVX2 (with the AVX2 kit where a format
 // has one) and for any x86-64, with the arithmetic inlined into both; the processor's features pick one.
-#include "pipeline/Cpu.h"
+#include "host/kernel/Simd.h"
 #include "pipeline/PlanarConversions.h"
 #if RT_AVX2_BUILD
 #include "pipeline/PlanarAvx2.h"
@@ -34,7 +34,7 @@ template <PixelFormat Source, PixelFormat Dest>
     void ConvertSpan<PixelFormat::S, PixelFormat::D>(const Raster::StoredPixel<PixelFormat::S>* in,          \
                                                      Raster::StoredPixel<PixelFormat::D>* out,               \
                                                      int n) noexcept {                                       \
-        if (HasAvx2())                                                                                       \
+        if (Kernel::HasAvx2())                                                                               \
             ConvertSpanAvx2<PixelFormat::S, PixelFormat::D>(in, out, n);                                     \
         else                                                                                                 \
             ConvertSpanBaseline<PixelFormat::S, PixelFormat::D>(in, out, n);                                 \

@@ -5,9 +5,9 @@
 // fetched with gathers. Also the running sums' resolve of four-component integer formats, eight rows at once.
 // Called only where the processor has AVX2.
 
+#include "host/kernel/Simd.h"
 #include "host/raster/PixelFormat.h"
 #include "pipeline/Avx2Lanes.h"
-#include "pipeline/Cpu.h"
 
 #include <cstddef>
 #include <cstdint>

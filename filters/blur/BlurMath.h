@@ -16,7 +16,8 @@
 #include <type_traits>
 
 // rt_premultiply: colour c of a pixel whose alpha is a; 16-bit colour × alpha / 65535 in integers, the colour
-// itself where alpha is full. rt_store rounds half up after clamping to the range (NaN gives 0). rt_resolve
+// itself where alpha is full; rt_premultiplied is component c of pixel p so (alpha as it is), as a float.
+// rt_store rounds half up after clamping to the range (NaN gives 0). rt_resolve
 // writes premultiplied sums over a total weight (inverse is 1 / weight): colour is divided by the normalised
 // alpha unless that is exactly 1 or within 1e-20 of 0. rt_sharpen moves each colour of pixel p away from its
 // premultiplied blur by factor where the difference (in colour units) exceeds threshold and alpha lets the
@@ -32,6 +33,9 @@
         return RT_KIND == 0   ? (ACC)c * (ACC)a                                                              \
                : RT_KIND == 1 ? (a < (T)RT_MAX ? (ACC)c * (ACC)a / (ACC)65535 : (ACC)c)                      \
                               : (ACC)(c * a);                                                                \
+    }                                                                                                        \
+    RT_BLUR_FUNCTION float rt_premultiplied(GLOBAL const T* p, int c) {                                      \
+        return c == RT_A ? (float)p[c] : (float)rt_premultiply(p[c], p[RT_A]);                               \
     }                                                                                                        \
     RT_BLUR_FUNCTION void rt_accumulate(ACC* sum, GLOBAL const T* p) {                                       \
         for (int c = 0; c < RT_N; ++c)                                                                       \

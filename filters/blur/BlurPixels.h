@@ -330,7 +330,7 @@ inline void SampleBilinearRun(const Grid& grid, int first, int last, const Posit
     constexpr int N = Layout<F>::N;
     int i = first;
 #if RT_AVX2_BUILD
-    if (HasAvx2()) {
+    if (Kernel::HasAvx2()) {
         Avx2::SampleRun<F>(grid.Locations(), first, last, position, out);
         return;
     }

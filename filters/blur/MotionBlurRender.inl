@@ -186,7 +186,7 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
             const int start = sampledRows(j).first;
 #if RT_AVX2_BUILD
             if constexpr (!L::IsFloat && N == 4 && L::A == 3) {
-                if (HasAvx2()) {
+                if (Kernel::HasAvx2()) {
                     BlurLineAvx2<F>(in, out, start, range.first, range.last, plan, weight);
                     continue;
                 }

@@ -1,7 +1,7 @@
 // The distortions' span mappings, built for AVX2 and for any x86-64: eight lanes instead of four for the
 // square roots, divisions and polynomials, with the same floats (no fused multiply-add in either).
 #include "filters/distort/DistortStages.h"
-#include "pipeline/Cpu.h"
+#include "host/kernel/Simd.h"
 
 namespace RasterTools::DistortStages {
 

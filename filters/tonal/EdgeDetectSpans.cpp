@@ -1,7 +1,7 @@
 // The vertical edge detect's span kernels: the gradient across the components of a span, so that the
 // compiler vectorises it whatever the channel count.
 #include "filters/tonal/EdgeDetectStages.h"
-#include "pipeline/Cpu.h"
+#include "host/kernel/Simd.h"
 
 #include <algorithm>
 #include <cstdlib>

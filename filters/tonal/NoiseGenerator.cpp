@@ -1,8 +1,8 @@
 // The add-noise generator as kernel text, and its span kernels for the processor.
 #include "filters/tonal/NoiseGenerator.h"
 
+#include "host/kernel/Simd.h"
 #include "host/raster/KernelText.h"
-#include "pipeline/Cpu.h"
 
 #include <array>
 #include <bit>

@@ -25,7 +25,7 @@ KERNEL(unsharp_mask_across)(GLOBAL const T* source, int width, int height, GLOBA
         x = x < 0 ? 0 : (x > width - 1 ? width - 1 : x);
         GLOBAL const T* p = source + ((rt_index)y * width + x) * RT_N;
         for (int c = 0; c < RT_N; ++c)
-            sum[c] += taps[k] * (c == RT_A ? (float)p[c] : (float)rt_premultiply(p[c], p[RT_A]));
+            sum[c] += taps[k] * rt_premultiplied(p, c);
     }
     GLOBAL float* to = across + ((rt_index)row * columns + i) * RT_N;
     for (int c = 0; c < RT_N; ++c)

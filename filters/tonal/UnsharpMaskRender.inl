@@ -31,8 +31,7 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
         for (int i = 0; i < width + 2 * margin; ++i) {
             const T* p = in + std::size_t(std::clamp(rect.left - margin + i, 0, lastX)) * N;
             for (int c = 0; c < N; ++c)
-                strip[std::size_t(i) * N + c] =
-                    c == L::A ? float(p[c]) : float(L::Premultiply(p[c], p[L::A]));
+                strip[std::size_t(i) * N + c] = L::M::rt_premultiplied(p, c);
         }
         float* out = &across[std::size_t(row) * std::size_t(width) * N];
         for (int i = 0; i < width; ++i) {

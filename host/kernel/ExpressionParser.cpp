@@ -5,6 +5,7 @@
 #include "host/kernel/ExpressionParser.h"
 
 #include "host/kernel/ExpressionMath.h"
+#include "host/kernel/Simd.h"
 
 #include <algorithm>
 #include <charconv>
@@ -1704,19 +1705,33 @@ namespace {
 // own. The destination may be one of the arguments: each lane is read before it is written.
 using SpanFunction = void (*)(float* dest, const float* A, const float* B, const float* C, int count);
 
-// Built for AVX2 and for any x86-64, picked when the library loads. AVX2 brings no fused multiply-add, so
-// both builds round as the kernel text does.
-#if defined(__x86_64__) && defined(__GNUC__) && !defined(__clang__) && !defined(__SANITIZE_ADDRESS__) &&     \
-    !defined(__SANITIZE_THREAD__)
-#define EXPRESSION_SPAN_TARGETS __attribute__((target_clones("avx2", "default")))
+// Each operation is built for any x86-64 and, where the compiler can, for AVX2 (Kernel::HasAvx2 picks when a
+// session is made, so RASTERTOOLS_NO_SIMD turns it off). AVX2 brings no fused multiply-add, so both builds
+// round as the kernel text does.
+#if RT_AVX2_BUILD && !defined(__SANITIZE_ADDRESS__)
+#define EXPRESSION_HAS_AVX2 1
+#define EXPRESSION_AVX2_BUILD(name)                                                                          \
+    template <int Fixed>                                                                                     \
+    RT_TARGET_AVX2 __attribute__((flatten)) void name##Avx2(float* dest, const float* A, const float* B,     \
+                                                            const float* C, int count) {                     \
+        name##Body<Fixed>(dest, A, B, C, count);                                                             \
+    }
 #else
-#define EXPRESSION_SPAN_TARGETS
+#define EXPRESSION_HAS_AVX2 0
+#define EXPRESSION_AVX2_BUILD(name)
 #endif
+
+#define EXPRESSION_BUILDS(name)                                                                              \
+    template <int Fixed>                                                                                     \
+    void name(float* dest, const float* A, const float* B, const float* C, int count) {                      \
+        name##Body<Fixed>(dest, A, B, C, count);                                                             \
+    }                                                                                                        \
+    EXPRESSION_AVX2_BUILD(name)
 
 #define EXPRESSION_SPAN(name, arity, form, text, expr)                                                       \
     template <int Fixed>                                                                                     \
-    EXPRESSION_SPAN_TARGETS void Span##name(float* dest, const float* A, const float* B, const float* C,     \
-                                            int count) {                                                     \
+    inline __attribute__((always_inline)) void Span##name##Body(float* dest, const float* A, const float* B, \
+                                                                const float* C, int count) {                 \
         const int n = Fixed > 0 ? Fixed : count;                                                             \
         _Pragma("omp simd") for (int i = 0; i < n; ++i) {                                                    \
             const float a = A[i];                                                                            \
@@ -1724,15 +1739,16 @@ using SpanFunction = void (*)(float* dest, const float* A, const float* B, const
             [[maybe_unused]] const float c = C[i];                                                           \
             dest[i] = expr;                                                                                  \
         }                                                                                                    \
-    }
+    }                                                                                                        \
+    EXPRESSION_BUILDS(Span##name)
 EXPRESSION_OPERATIONS(EXPRESSION_SPAN)
 #undef EXPRESSION_SPAN
 
 // Fractal noise octave by octave across the lanes, so that each octave's noise vectorises; every lane adds
 // the same terms in the same order as ex_fbm, so the values are its values.
 template <int Fixed>
-EXPRESSION_SPAN_TARGETS void SpanFbmByOctave(float* dest, const float* A, const float* B, const float* C,
-                                             int count) {
+inline __attribute__((always_inline)) void SpanFbmByOctaveBody(float* dest, const float* A, const float* B,
+                                                               const float* C, int count) {
     const int n = Fixed > 0 ? Fixed : count;
     alignas(64) float sum[Ep::Lanes];
     alignas(64) float total[Ep::Lanes];
@@ -1761,15 +1777,34 @@ EXPRESSION_SPAN_TARGETS void SpanFbmByOctave(float* dest, const float* A, const 
         dest[i] = sum[i] / total[i];
 }
 
-// The functions for a whole span and for fewer lanes.
-std::pair<SpanFunction, SpanFunction> SpanFunctionsOf(Op op) {
-    if (op == Op::Fbm) return {&SpanFbmByOctave<Ep::Lanes>, &SpanFbmByOctave<0>};
+EXPRESSION_BUILDS(SpanFbmByOctave)
+
+// The functions for a whole span and for fewer lanes, in the AVX2 build when avx2 is true.
+std::pair<SpanFunction, SpanFunction> SpanFunctionsOf(Op op, bool avx2) {
+#if EXPRESSION_HAS_AVX2
+#define EXPRESSION_PICK(name)                                                                                \
+    return avx2 ? std::pair<SpanFunction, SpanFunction>{&name##Avx2<Ep::Lanes>, &name##Avx2<0>}              \
+                : std::pair<SpanFunction, SpanFunction> {                                                    \
+        &name<Ep::Lanes>, &name<0>                                                                           \
+    }
+#else
+#define EXPRESSION_PICK(name)                                                                                \
+    (void)avx2;                                                                                              \
+    return std::pair<SpanFunction, SpanFunction> {                                                           \
+        &name<Ep::Lanes>, &name<0>                                                                           \
+    }
+#endif
+    if (op == Op::Fbm) {
+        EXPRESSION_PICK(SpanFbmByOctave);
+    }
     switch (op) {
 #define EXPRESSION_SPAN_CASE(name, arity, form, text, expr)                                                  \
-    case Op::name:                                                                                           \
-        return {&Span##name<Ep::Lanes>, &Span##name<0>};
+    case Op::name: {                                                                                         \
+        EXPRESSION_PICK(Span##name);                                                                         \
+    }
         EXPRESSION_OPERATIONS(EXPRESSION_SPAN_CASE)
 #undef EXPRESSION_SPAN_CASE
+#undef EXPRESSION_PICK
     default:
         break;
     }
@@ -1839,8 +1874,9 @@ Ep::ByteCode::Session::CreateForThread(Counted<const ByteCode> byteCode, Counted
         }
         return zeros;
     };
+    const bool avx2 = Kernel::HasAvx2();
     for (const auto& in : program.code) {
-        const auto functions = SpanFunctionsOf(in.op);
+        const auto functions = SpanFunctionsOf(in.op, avx2);
         if (!functions.first) return nullptr;
         state->code.push_back({functions.first,
                                functions.second,

@@ -1,5 +1,6 @@
 #include "host/raster/ICCManager.h"
 
+#include "host/kernel/Simd.h"
 #include "host/raster/LabMath.h"
 
 #include <algorithm>
@@ -21,9 +22,9 @@ struct Planes {
 };
 
 // The LabA16 Convert bodies' expressions, so that the colour manager gives the kernels' values: stored /
-// 65535 in, and scaled, 0.5 added and truncated (saturating) out. Built for AVX2 and for any x86-64, picked
-// when the library loads.
-__attribute__((target_clones("avx2", "default"))) void ToStored(Planes& p, int n) noexcept {
+// 65535 in, and scaled, 0.5 added and truncated (saturating) out. Built for AVX2 and for any x86-64 (see
+// Kernel::HasAvx2).
+inline void ToStoredBody(Planes& p, int n) noexcept {
 #pragma omp simd
     for (int i = 0; i < n; ++i) {
         const ushort4 lab = convert_ushort4(
@@ -35,7 +36,7 @@ __attribute__((target_clones("avx2", "default"))) void ToStored(Planes& p, int n
     }
 }
 
-__attribute__((target_clones("avx2", "default"))) void FromStored(Planes& p, int n) noexcept {
+inline void FromStoredBody(Planes& p, int n) noexcept {
 #pragma omp simd
     for (int i = 0; i < n; ++i) {
         const float4 rgb = labaf_to_rgbauf(make_float4(p.c[0][i] / 65535.0f, p.c[1][i] / 65535.0f,
@@ -46,6 +47,9 @@ __attribute__((target_clones("avx2", "default"))) void FromStored(Planes& p, int
         p.c[3][i] = rgb.w;
     }
 }
+
+RT_AVX2_DISPATCH(ToStored, ToStoredBody, (Planes & p, int n), (p, n))
+RT_AVX2_DISPATCH(FromStored, FromStoredBody, (Planes & p, int n), (p, n))
 
 // Runs convert over count pixels a chunk at a time: each In pixel spread over the planes, each Out pixel
 // gathered from them (whole numbers 0..65535 are exact in float, so the narrowing to ushort4 loses nothing).

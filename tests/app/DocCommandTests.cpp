@@ -236,8 +236,10 @@ TEST_F(DocCommand, ADocumentInUseIsRefusedAfterTheWait) {
     const std::string saved = ReadBytes(m_Folder / "d.rtd");
     Kernel::FileLock held;
     ASSERT_FALSE(held.Acquire(m_Folder / "d.rtd", std::chrono::milliseconds(0), false));
-    for (const std::string& arguments : {"doc filter d.rtd " + kFilter, std::string("doc undo d.rtd"),
-                                         std::string("doc new in.png -o d.rtd")}) {
+    Write("save.play", "save d.rtd\n");
+    for (const std::string& arguments :
+         {"doc filter d.rtd " + kFilter, std::string("doc undo d.rtd"),
+          std::string("doc new in.png -o d.rtd"), std::string("play save.play")}) {
         const Result result = Run(arguments, "RASTERTOOLS_LOCK_TIMEOUT=0.2");
         EXPECT_EQ(result.exitCode, 1) << arguments;
         EXPECT_TRUE(Contains(result.output, "d.rtd: is in use by another process (still locked after 0.2 s)"))

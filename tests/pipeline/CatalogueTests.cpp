@@ -5,7 +5,7 @@
 #include "PipelineTestSupport.h"
 
 #include "filters/Catalogue.h"
-#include "pipeline/Cpu.h"
+#include "host/kernel/Simd.h"
 #include "pipeline/Formats.h"
 
 using namespace RasterTools;
@@ -39,17 +39,17 @@ TEST(CatalogueKernels, LanguageZeroTextsCompileWithNvrtcForEveryFilterAndFormat)
 
 // Restores the SIMD switch however the test ends.
 struct SimdGuard {
-    ~SimdGuard() { SetSimdEnabled(true); }
+    ~SimdGuard() { Kernel::SetSimdEnabled(true); }
 };
 
 TEST(CatalogueSimd, PlainAndSimdBuildsGiveTheSameBytesForEveryFilterAndFormat) {
-    SetSimdEnabled(true);
-    if (!HasAvx2())
+    Kernel::SetSimdEnabled(true);
+    if (!Kernel::HasAvx2())
         GTEST_SKIP() << "this processor has no AVX2 (or RASTERTOOLS_NO_SIMD is set): there is only the plain "
                         "build to run";
     const SimdGuard guard;
-    SetSimdEnabled(false);
-    ASSERT_FALSE(HasAvx2()) << "the switch must turn the AVX2 builds off";
+    Kernel::SetSimdEnabled(false);
+    ASSERT_FALSE(Kernel::HasAvx2()) << "the switch must turn the AVX2 builds off";
     for (const auto& filter : GetFilterCatalogue()) {
         const auto command = filter.makeCommand(false, SampleOf(filter));
         const auto* pipeline = dynamic_cast<const PipelineCommand*>(command.Get());
@@ -57,9 +57,9 @@ TEST(CatalogueSimd, PlainAndSimdBuildsGiveTheSameBytesForEveryFilterAndFormat) {
         for (const PixelFormat format : LayerFormats) {
             // Wider than two spans and an odd height, so that both the span loops and their tails run.
             const auto source = PipelineTest::MakeImage(format, 77, 21, 5u);
-            SetSimdEnabled(true);
+            Kernel::SetSimdEnabled(true);
             const auto simd = PipelineTest::Render(*pipeline, source, 0);
-            SetSimdEnabled(false);
+            Kernel::SetSimdEnabled(false);
             const auto plain = PipelineTest::Render(*pipeline, source, 0);
             ASSERT_TRUE(simd && plain) << filter.name << " " << Raster::GetPixelFormatName(format);
             const auto difference = PipelineTest::Compare(*simd, *plain);

@@ -3,8 +3,8 @@
 // just below a rounding half, negative zero, far out of range). The AVX2 kits against the portable loops
 // one step at a time, where the processor has AVX2.
 
+#include "host/kernel/Simd.h"
 #include "pipeline/Conversions.h"
-#include "pipeline/Cpu.h"
 #if RT_AVX2_BUILD
 #include "pipeline/PlanarAvx2.h"
 #endif
@@ -249,7 +249,7 @@ void ExpectKitMatchesPlanar() {
 }
 
 TEST(PlanarConversions, Avx2KitsEqualThePortableLoops) {
-    if (!RasterTools::HasAvx2()) GTEST_SKIP() << "no AVX2";
+    if (!Kernel::HasAvx2()) GTEST_SKIP() << "no AVX2";
     ExpectKitMatchesPlanar<PixelFormat::RGBA8>();
     ExpectKitMatchesPlanar<PixelFormat::RGBA16>();
     ExpectKitMatchesPlanar<PixelFormat::RGBAUF>();
@@ -278,7 +278,7 @@ RT_TARGET_AVX2 std::uint32_t FirstRoundingDifference(std::uint32_t first, std::u
 // Every float from a quarter up (below it both round to 0, the sum with the near half staying under 1; a
 // sample of them is checked too).
 TEST(PlanarConversions, Avx2RoundingEqualsThePortableOneOverTheWholeRange) {
-    if (!RasterTools::HasAvx2()) GTEST_SKIP() << "no AVX2";
+    if (!Kernel::HasAvx2()) GTEST_SKIP() << "no AVX2";
     constexpr std::uint32_t None = std::numeric_limits<std::uint32_t>::max();
     const std::uint32_t quarter = std::bit_cast<std::uint32_t>(0.25f);
     const std::uint32_t below = FirstRoundingDifference(0, quarter, 97);

@@ -4,6 +4,8 @@
 
 #include "ColourTestSupport.h"
 
+#include "host/kernel/Simd.h"
+
 #include <gtest/gtest.h>
 #include <lcms2.h>
 
@@ -278,6 +280,31 @@ TEST(ColourProcessor, CallsOfAnyLengthAndAlignmentMatchSinglePixels) {
         for (std::size_t b = 1 + std::size_t(count) * 8; b < back.size(); ++b)
             ASSERT_EQ(back[b], 0x5A) << "count " << count << " wrote past its end";
     }
+}
+
+// RASTERTOOLS_NO_SIMD reaches the colour manager too, and its portable build gives the AVX2 build's bytes
+// both ways.
+TEST(ColourProcessor, PlainAndSimdBuildsGiveTheSameBytes) {
+    Kernel::SetSimdEnabled(true);
+    if (!Kernel::HasAvx2()) GTEST_SKIP() << "this processor has no AVX2: only the portable build runs";
+    auto grid = LabGrid(7919, 16411);
+    const int count = static_cast<int>(grid.size());
+    std::vector<RGBPixel> rgb[2];
+    std::vector<LabPixel> lab[2];
+    for (int simd = 0; simd < 2; ++simd) {
+        Kernel::SetSimdEnabled(simd == 1);
+        ASSERT_EQ(Kernel::HasAvx2(), simd == 1);
+        rgb[simd].resize(grid.size());
+        lab[simd].resize(grid.size());
+        auto& icc = ICCManager::GetInstance();
+        icc.DoLABA16ToRGBAFTransform(reinterpret_cast<unsigned char*>(grid.data()),
+                                     reinterpret_cast<unsigned char*>(rgb[simd].data()), count);
+        icc.DoRGBAFToLABA16Transform(reinterpret_cast<unsigned char*>(rgb[simd].data()),
+                                     reinterpret_cast<unsigned char*>(lab[simd].data()), count);
+    }
+    Kernel::SetSimdEnabled(true);
+    EXPECT_EQ(std::memcmp(rgb[0].data(), rgb[1].data(), grid.size() * sizeof(RGBPixel)), 0);
+    EXPECT_EQ(lab[0], lab[1]);
 }
 
 TEST(ColourProcessor, ManyThreadsGiveTheResultsOfOne) {

@@ -2,6 +2,7 @@
 // hostile texts, span evaluation against single evaluation, and independent per-thread sessions.
 #include "host/kernel/ExpressionMath.h"
 #include "host/kernel/ExpressionParser.h"
+#include "host/kernel/Simd.h"
 
 #include <gtest/gtest.h>
 
@@ -742,6 +743,38 @@ TEST(ExpressionExecution, FractalNoiseSpansMatchTheSharedFunction) {
             const float expected = ex_fbm(x / 9.0f, y / 9.0f, 1.0f + ex_fract(x / 17.0f) * 12.0f);
             EXPECT_EQ(session->GetResultLanes(0)[lane], expected) << "lane " << lane << " of " << n;
         }
+    }
+}
+
+} // namespace
+
+namespace {
+
+// The AVX2 build of every operation gives the bits of the portable build (both round as the kernel text).
+TEST(ExpressionExecution, Avx2AndPortableBuildsAgree) {
+    Table table;
+    auto info = Ep::ExecuteInfo::Create(table.constants);
+    const char* texts[] = {
+        "sin(x / 7) + cos(y / 3) * tan(x / 50)", "exp(x / 40) + log(abs(y) + 1) + pow(abs(x), 0.3)",
+        "atan2(y, x) + asin(x / 400) + acos(y / 400) + hypot(x, y)",
+        "noise(x / 5, y / 5) + fbm(x / 30, y / 30, 1 + fract(y / 11) * 12) + rand(x, y)",
+        "round(x / 3) + fract(y / 3) + x % 7 + smoothstep(-9, 9, y) + sign(x) * sqrt(abs(y))"};
+    for (const char* text : texts) {
+        const auto c = Compile(table, text);
+        ASSERT_TRUE(c.code) << text;
+        for (int lane = 0; lane < Ep::Lanes; ++lane) {
+            table.x->GetLanes()[lane] = static_cast<float>(lane) * 13.7f - 200.0f;
+            table.y->GetLanes()[lane] = static_cast<float>(lane * lane) * 0.41f - 150.0f;
+        }
+        std::vector<float> results[2];
+        for (int simd = 0; simd < 2; ++simd) {
+            Kernel::SetSimdEnabled(simd == 1);
+            auto session = Ep::ByteCode::Session::CreateForThread(c.code, info);
+            ASSERT_TRUE(session->ExecuteSpan(Ep::Lanes));
+            results[simd].assign(session->GetResultLanes(0), session->GetResultLanes(0) + Ep::Lanes);
+        }
+        Kernel::SetSimdEnabled(true);
+        EXPECT_EQ(std::memcmp(results[0].data(), results[1].data(), Ep::Lanes * sizeof(float)), 0) << text;
     }
 }
 

@@ -22,7 +22,7 @@
         Body Arguments;                                                                                      \
     }                                                                                                        \
     void Name Parameters noexcept {                                                                          \
-        if (::RasterTools::HasAvx2())                                                                        \
+        if (::Kernel::HasAvx2())                                                                             \
             Name##Avx2 Arguments;                                                                            \
         else                                                                                                 \
             Body Arguments;                                                                                  \
@@ -34,7 +34,7 @@
     }
 #endif
 
-namespace RasterTools {
+namespace Kernel {
 
 // False when RASTERTOOLS_NO_SIMD was set (to anything but "" or "0") when the library loaded, or after
 // SetSimdEnabled(false).
@@ -55,4 +55,4 @@ inline bool HasAvx2() noexcept {
 #endif
 }
 
-} // namespace RasterTools
+} // namespace Kernel

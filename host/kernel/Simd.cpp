@@ -1,10 +1,10 @@
-#include "pipeline/Cpu.h"
+#include "host/kernel/Simd.h"
 
 #include <atomic>
 #include <cstdlib>
 #include <string_view>
 
-namespace RasterTools {
+namespace Kernel {
 
 namespace {
 
@@ -26,4 +26,4 @@ void SetSimdEnabled(bool enabled) noexcept {
     SimdSwitch().store(enabled, std::memory_order_relaxed);
 }
 
-} // namespace RasterTools
+} // namespace Kernel
