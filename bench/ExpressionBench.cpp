@@ -110,12 +110,11 @@ void Processor(benchmark::State& state) {
     }
     state.counters["Mpix/s"] = benchmark::Counter(double(Size) * Size * double(state.iterations()) / 1e6,
                                                   benchmark::Counter::kIsRate);
-    state.SetLabel(Name(state.range(0)) +
-                   std::to_string(compiled.code->GetInstructionCount()) + " instructions, " +
-                   std::to_string(threads) + " thread" + (threads > 1 ? "s" : ""));
+    state.SetLabel(Name(state.range(0)) + std::to_string(compiled.code->GetInstructionCount()) +
+                   " instructions, " + std::to_string(threads) + " thread" + (threads > 1 ? "s" : ""));
 }
 
-// The same kernel text the procedural texture pastes, in a loop kernel over the image.
+// The kernel text an equation filter pastes, in a loop kernel over the image.
 void OpenCL(benchmark::State& state) {
     using namespace Raster;
     const auto device = Hardware::GetDevice("opencl");

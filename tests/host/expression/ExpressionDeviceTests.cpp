@@ -232,7 +232,7 @@ std::string ReturnType(int components) {
 }
 
 // One kernel computing every expression at every point. Language 0 puts the functions into a local struct
-// of static functions under "using namespace Expressions", as the procedural texture's sample stage does;
+// of static functions under "using namespace Expressions", as a generated sample stage does;
 // language 1 defines them at file level.
 std::string KernelText(int language, const std::vector<Expression>& expressions) {
     std::ostringstream text;
