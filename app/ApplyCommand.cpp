@@ -71,7 +71,8 @@ ApplyOptions ParseArguments(const std::vector<std::string>& args) {
         }
         if (i + 1 >= args.size()) throw UsageError(QuoteExcerpt(arg) + " needs a value");
         // Which of two values was meant cannot be guessed.
-        if (!seen.insert(arg).second) throw UsageError(QuoteExcerpt(arg) + " is given more than once");
+        if (!seen.insert(arg).second && !IsTextFlag(options.filter, arg.substr(2)))
+            throw UsageError(QuoteExcerpt(arg) + " is given more than once");
         const std::string& value = args[++i];
         if (arg == "--device")
             options.device = value;
@@ -156,10 +157,8 @@ CheckedApply CheckApplyArguments(const std::vector<std::string>& args) {
             throw UsageError("--format: " + QuoteExcerpt(text) + " is not a layer format (" +
                              LayerFormatNames() + ")");
     }
-    const std::vector<RasterTools::ParameterValue> values = ParseFilterParameters(*filter, parameters);
-
     CheckedApply checked;
-    checked.command = filter->makeCommand(false, values);
+    checked.command = MakeFilterCommand(*filter, false, parameters);
     if (!dynamic_cast<const RasterTools::PipelineCommand*>(checked.command.Get()))
         throw Error(options.filter + " cannot be applied from the command line yet");
     checked.loadFormat = loadFormat ? int(*loadFormat) : -1;

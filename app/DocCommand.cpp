@@ -174,8 +174,7 @@ int RunFilter(const DocArguments& arguments) {
         throw UsageError("usage: rastertools doc filter DOC FILTER [--PARAM VALUE]... [--live]");
     const std::string& path = arguments.positional[0];
     const RasterTools::FilterInfo& filter = RequireFilter(arguments.positional[1]);
-    const auto values = ParseFilterParameters(filter, arguments.options);
-    const auto command = filter.makeCommand(arguments.live, values);
+    const auto command = MakeFilterCommand(filter, arguments.live, arguments.options);
     if (!command) throw Error(std::string(filter.name) + ": the command could not be made");
     if (arguments.force) throw UsageError("--force belongs to doc new");
     const Kernel::FileLock lock = LockDocument(path);

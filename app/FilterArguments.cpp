@@ -4,6 +4,7 @@
 #include "app/Options.h"
 #include "pipeline/Formats.h"
 
+#include <algorithm>
 #include <charconv>
 #include <optional>
 
@@ -125,6 +126,30 @@ std::string DescribeParameterValues(const RasterTools::FilterInfo& filter,
         text += (text.empty() ? "" : " ") + std::string(filter.parameters[i].name) + "=" +
                 RasterTools::FormatParameterValue(values[i]);
     return text;
+}
+
+} // namespace App
+
+namespace App {
+
+bool IsTextFlag(const std::string& filterName, std::string_view flag) {
+    const RasterTools::FilterInfo* filter = RasterTools::FindFilter(filterName);
+    return filter &&
+           std::find(filter->textFlags.begin(), filter->textFlags.end(), flag) != filter->textFlags.end();
+}
+
+Kernel::Counted<RasterCommand>
+MakeFilterCommand(const RasterTools::FilterInfo& filter, bool liveEffect,
+                  const std::vector<std::pair<std::string, std::string>>& parameters) {
+    std::vector<std::pair<std::string, std::string>> table, texts;
+    for (const auto& parameter : parameters)
+        (IsTextFlag(std::string(filter.name), parameter.first) ? texts : table).push_back(parameter);
+    const auto values = ParseFilterParameters(filter, table);
+    if (!filter.makeCommandWithText) return filter.makeCommand(liveEffect, values);
+    std::string error;
+    auto command = filter.makeCommandWithText(liveEffect, values, texts, error);
+    if (!command) throw Error(std::string(filter.name) + ": " + error);
+    return command;
 }
 
 } // namespace App

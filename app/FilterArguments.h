@@ -19,6 +19,15 @@ std::vector<RasterTools::ParameterValue>
 ParseFilterParameters(const RasterTools::FilterInfo& filter,
                       const std::vector<std::pair<std::string, std::string>>& parameters);
 
+// The filter's command from (name, text) pairs: the table's parameters as ParseFilterParameters reads them,
+// and the text flags of filters that have them (which may repeat). An Error saying why when the command
+// cannot be made from the texts (an equation that does not compile, a file that cannot be read).
+Kernel::Counted<RasterCommand>
+MakeFilterCommand(const RasterTools::FilterInfo& filter, bool liveEffect,
+                  const std::vector<std::pair<std::string, std::string>>& parameters);
+// Whether flag (without dashes) is a text flag of the filter named filterName.
+bool IsTextFlag(const std::string& filterName, std::string_view flag);
+
 // "--format rgba16 --scale 1,1": a command's parameters as they would be typed.
 std::string DescribeParameterValues(const RasterTools::FilterInfo& filter,
                                     const std::vector<RasterTools::ParameterValue>& values);

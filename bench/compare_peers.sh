@@ -18,6 +18,7 @@ work=${WORK:-${TMPDIR:-/tmp}/rastertools-peers}
 size=4096
 OPERATIONS=(noise-gaussian noise-uniform diffuse edge twirl-90 sphere-50)
 OPERATIONS+=(motionblur-10 motionblur-50 motionblur-200)
+OPERATIONS+=(texture-1 texture-3)
 [ $# -gt 0 ] && OPERATIONS=("$@")
 
 # ---- Peers from Debian
@@ -81,6 +82,9 @@ rastertools_command() {
   # Up to 512 × 0.01 = 5 pixels, as far as -spread 5.
   diffuse) echo "$rastertools apply diffuse --intensity 0.01 $common $input $2" ;;
   edge) echo "$rastertools apply verticaledgedetect $common $input $2" ;;
+  # Procedural textures: R from x alone, and three channels of about fifteen operations with one noise call.
+  texture-1) echo "$rastertools apply proceduraltexture --angles rad --eq 'r=sin(x / 20) * 0.5 + 0.5' $common $input $2" ;;
+  texture-3) echo "$rastertools apply proceduraltexture --angles rad --eq 'rgb=t = noise(x / 64, y / 64); vec3(fract(x / 37 + t), abs(sin(y / 23 - t * 2)), clamp(x / w * 0.5 + t * 0.5, 0, 1))' $common $input $2" ;;
   esac
 }
 imagemagick_command() {
@@ -94,6 +98,10 @@ imagemagick_command() {
   sphere-50) echo "/usr/bin/convert $common $input -implode -0.5 -compress none $2" ;;
   diffuse) echo "/usr/bin/convert $common $input -spread 5 -compress none $2" ;;
   edge) echo "/usr/bin/convert $common $input -morphology Convolve '3x3: -1,0,1 -2,0,2 -1,0,1' -compress none $2" ;;
+  # -fx has no coherent noise of this kind: its three-channel texture uses a sine in its place, which costs
+  # about as much per pixel.
+  texture-1) echo "/usr/bin/convert $common $input -channel R -fx 'sin((i+0.5)/20)*0.5+0.5' +channel -compress none $2" ;;
+  texture-3) echo "/usr/bin/convert $common $input -channel RGB -fx 't=sin((i+0.5)/64+(j+0.5)/64); c==0 ? frac((i+0.5)/37+t) : (c==1 ? abs(sin((j+0.5)/23-t*2)) : min(max((i+0.5)/w*0.5+t*0.5,0),1))' +channel -compress none $2" ;;
   esac
 }
 vips_command() {
@@ -106,6 +114,9 @@ vips_command() {
   motionblur-*) echo "$env vips conv $input $2 $(line_matrix "${1#motionblur-}") --precision integer" ;;
   # The 3 × 3 horizontal gradient as an integer convolution (negative sums clip to 0 in 8 bits).
   edge) echo "$env vips conv $input $2 $work/gradient.mat --precision integer" ;;
+  # The one-channel texture as an operation chain: x, scaled into degrees (vips's sin takes degrees), the sine,
+  # then into 0..255, put in place of the red band.
+  texture-1) echo "$env sh -c 'vips xyz $work/xy.v $size $size && vips extract_band $work/xy.v $work/x.v 0 && vips linear $work/x.v $work/deg.v 2.8647889756541161 1.4323944878270580 && vips math $work/deg.v $work/s.v sin && vips linear $work/s.v $work/r.v 127.5 127.5 --uchar && vips extract_band $input $work/gba.v 1 --n 3 && vips bandjoin \"$work/r.v $work/gba.v\" $2'" ;;
   esac
 }
 gegl_command() {

@@ -8,7 +8,9 @@
 
 #include <functional>
 #include <span>
+#include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 namespace RasterTools {
@@ -31,6 +33,14 @@ struct FilterInfo {
     // Values worth rendering besides the parameter table's corners and defaults (a filter's kSamples), in
     // parameter order; used by the conformance tests.
     std::vector<std::vector<ParameterValue>> samples;
+    // Flags that carry text (equations, files) rather than a table value, and may be given more than once; a
+    // filter with any makes its commands through makeCommandWithText, from the table's values and these
+    // (flag without dashes, text) in order. Null when something does not fit; error says what.
+    std::vector<std::string_view> textFlags;
+    std::function<Kernel::Counted<RasterCommand>(
+        bool liveEffect, const std::vector<ParameterValue>& values,
+        const std::vector<std::pair<std::string, std::string>>& texts, std::string& error)>
+        makeCommandWithText;
     // The device kernels of the filter for a language and layer format, as texts, for checks that compile
     // them; empty for a filter that declares none.
     std::function<std::vector<DeviceKernelText>(Raster::HardwareKernelLanguage language,

@@ -56,6 +56,10 @@ FilterInfo Describe() {
                 values.push_back(GetParameter(own->GetParameters(), parameter));
         return values;
     };
+    if constexpr (requires { Filter::kTextFlags; }) {
+        info.textFlags.assign(Filter::kTextFlags.begin(), Filter::kTextFlags.end());
+        info.makeCommandWithText = &CommandClass::MakeCommandWithText;
+    }
     if constexpr (requires { typename CommandClass::template PlainStages<Raster::PixelFormat::RGBA8>; })
         info.kernelTexts = &GetSinglePassKernelTexts<CommandClass>;
     else if constexpr (!std::is_null_pointer_v<decltype(KernelTexts)>)

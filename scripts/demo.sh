@@ -31,6 +31,8 @@ render coffee-unsharpmask.png unsharpmask --radius 9 --factor 1 --threshold 0.02
 render coffee-motionblur.png motionblur --radius 20 --radians 0.5
 render coffee-twirl.png twirl --angle 90 --radius 200
 render coffee-sphere.png sphere --intensity 50 --radius 200
+render coffee-texture-rings.png proceduraltexture --eq 'rgb=fract(hypot(rx, ry) / 24)' --eq 'a=1' --origin 300,200
+render coffee-texture-marble.png proceduraltexture --preset 3 --opacity 0.6
 
 # A document: the photo as a layer, noise applied to its pixels, then a live noise layer on top.
 doc=out/coffee.rtd

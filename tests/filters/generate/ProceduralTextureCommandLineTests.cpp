@@ -1,0 +1,145 @@
+// rastertools with procedural textures as a user runs it: equations on the command line and in a JSON file,
+// refusals that name the equation and the column, the same file from the processor and the OpenCL device, a
+// live layer saved, loaded and rendered, and the tool's history and presets through play.
+
+#include "host/kernel/AtomicFile.h"
+
+#include <cstdio>
+#include <filesystem>
+#include <fstream>
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace {
+
+struct Result {
+    int exitCode = -1;
+    std::string output;
+};
+
+class ProceduralTextureCommandLine : public ::testing::Test {
+protected:
+    void SetUp() override {
+        m_Folder = std::filesystem::temp_directory_path() /
+                   ("rastertools-texture-" + std::to_string(::getpid()) + "-" +
+                    ::testing::UnitTest::GetInstance()->current_test_info()->name());
+        std::filesystem::remove_all(m_Folder);
+        std::filesystem::create_directories(m_Folder);
+    }
+    void TearDown() override { std::filesystem::remove_all(m_Folder); }
+
+    Result Run(const std::string& arguments) {
+        const std::string command = "cd '" + m_Folder.string() + "' && RASTERTOOLS_SETTINGS='" +
+                                    (m_Folder / "settings.json").string() + "' '" RASTERTOOLS_PROGRAM "' " +
+                                    arguments + " 2>&1";
+        Result result;
+        FILE* pipe = ::popen(command.c_str(), "r");
+        if (!pipe) return result;
+        char buffer[4096];
+        for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
+            result.output.append(buffer, n);
+        const int status = ::pclose(pipe);
+        result.exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+        return result;
+    }
+
+    std::string Bytes(const std::string& name) {
+        std::string bytes;
+        const auto error = Kernel::ReadWholeFile(m_Folder / name, bytes, 1 << 24);
+        EXPECT_FALSE(error) << name << ": " << error.value_or("");
+        return bytes;
+    }
+
+    void Write(const std::string& name, const std::string& text) { std::ofstream(m_Folder / name) << text; }
+
+    std::filesystem::path m_Folder;
+};
+
+constexpr const char* Equations = "--eq 'rgb=sin(rx / 7) * 0.5 + 0.5' --eq 'g=fract(hypot(rx, ry) / 13)' "
+                                  "--eq 'a=1' --angles rad --origin 40,30";
+
+TEST_F(ProceduralTextureCommandLine, EquationsRenderAlikeOnBothPathsAndInEveryTiling) {
+    const std::string in = "'" EXAMPLE_IMAGE "'";
+    ASSERT_EQ(Run(std::string("apply proceduraltexture ") + Equations + " --device cpu " + in + " cpu.png")
+                  .exitCode,
+              0);
+    ASSERT_EQ(Run(std::string("apply proceduraltexture ") + Equations + " --device cpu --tile 37 " + in +
+                  " tiles.png")
+                  .exitCode,
+              0);
+    EXPECT_EQ(Bytes("cpu.png"), Bytes("tiles.png"));
+    const Result device =
+        Run(std::string("apply proceduraltexture ") + Equations + " --device opencl " + in + " device.png");
+    if (device.output.find("on opencl") == std::string::npos) GTEST_SKIP() << "no OpenCL device";
+    ASSERT_EQ(device.exitCode, 0) << device.output;
+    EXPECT_NE(device.output.find(", 0 on the processor"), std::string::npos) << device.output;
+    EXPECT_EQ(Bytes("cpu.png"), Bytes("device.png"));
+}
+
+TEST_F(ProceduralTextureCommandLine, ConfigFilesAndRefusals) {
+    const std::string in = "'" EXAMPLE_IMAGE "'";
+    Write("rings.json", "{\"colourFormat\": \"RGB\", \"anglesInRadians\": true, \"equations\": ["
+                        "{\"channels\": \"rgb\", \"text\": \"fract(hypot(rx, ry) / spacing)\"}, "
+                        "{\"channels\": \"a\", \"text\": \"1\"}], \"inputs\": [{\"name\": \"spacing\", "
+                        "\"kind\": \"real\", \"min\": 2, \"max\": 100, \"value\": 30}]}");
+    const Result ok = Run("apply proceduraltexture --config rings.json --device cpu " + in + " rings.png");
+    EXPECT_EQ(ok.exitCode, 0) << ok.output;
+    // The input's value from the command line gives another picture.
+    EXPECT_EQ(
+        Run("apply proceduraltexture --config rings.json --input spacing=9 --device cpu " + in + " other.png")
+            .exitCode,
+        0);
+    EXPECT_NE(Bytes("rings.png"), Bytes("other.png"));
+
+    const Result bad =
+        Run("apply proceduraltexture --eq 'rgb=x / w' --eq 'a=x + foo' --device cpu " + in + " x.png");
+    EXPECT_EQ(bad.exitCode, 1);
+    EXPECT_NE(bad.output.find("equation 2"), std::string::npos) << bad.output;
+    EXPECT_NE(bad.output.find("unknown name \"foo\" at column 5"), std::string::npos) << bad.output;
+    EXPECT_FALSE(std::filesystem::exists(m_Folder / "x.png"));
+
+    Write("broken.json", "{\"equations\": [{\"channels\": \"rgq\", \"text\": \"1\"}]}");
+    const Result broken = Run("apply proceduraltexture --config broken.json --device cpu " + in + " y.png");
+    EXPECT_EQ(broken.exitCode, 1) << broken.output;
+    EXPECT_NE(broken.output.find("equations[0].channels"), std::string::npos) << broken.output;
+    EXPECT_EQ(Run("apply proceduraltexture --config missing.json " + in + " x.png").exitCode, 1);
+    EXPECT_EQ(Run("apply proceduraltexture --eq 'rgb=1' --config rings.json " + in + " x.png").exitCode, 1);
+    EXPECT_NE(Run("apply proceduraltexture --eq 'nonsense' " + in + " x.png").exitCode, 0);
+}
+
+TEST_F(ProceduralTextureCommandLine, LiveLayerSavesLoadsAndRendersAsApplied) {
+    const std::string in = "'" EXAMPLE_IMAGE "'";
+    ASSERT_EQ(
+        Run(std::string("apply proceduraltexture ") + Equations + " --device cpu " + in + " applied.png")
+            .exitCode,
+        0);
+    ASSERT_EQ(Run("doc new " + in + " -o t.rtd").exitCode, 0);
+    const Result added = Run(std::string("doc filter t.rtd proceduraltexture ") + Equations + " --live");
+    ASSERT_EQ(added.exitCode, 0) << added.output;
+    const Result rendered = Run("doc render t.rtd live.png --device cpu");
+    ASSERT_EQ(rendered.exitCode, 0) << rendered.output;
+    // The texture is opaque, so the live layer shows exactly what apply wrote.
+    EXPECT_EQ(Bytes("applied.png"), Bytes("live.png"));
+}
+
+TEST_F(ProceduralTextureCommandLine, ToolHistoryAndPresetsThroughPlay) {
+    Write("t.play", "tool proceduraltexture\nstart\nshow hint\nset Prst 3\nset AdEq x\nset Eq03 a=x/w\n"
+                    "click 40,30\nset TUnd x\nshow reflected\nset TRed x\ncommit\nshow history\n");
+    const Result play = Run("play t.play");
+    ASSERT_EQ(play.exitCode, 0) << play.output;
+    EXPECT_NE(play.output.find("|CLICK| or |DRAG| to set texture origin (ox, oy)."), std::string::npos);
+    EXPECT_NE(
+        play.output.find("Hist \"History\" string = Start | Apply preset | Add equation | *Change equation | "
+                         "Set origin"),
+        std::string::npos)
+        << play.output;
+    EXPECT_NE(play.output.find("Eq01 \"Equation\" string = rgb=mod(floor(rx / size) + floor(ry / size), 2)"),
+              std::string::npos)
+        << play.output;
+    EXPECT_NE(play.output.find("Orgn=40,30"), std::string::npos) << "redo restores the origin\n"
+                                                                 << play.output;
+    EXPECT_NE(play.output.find("history: Procedural Texture applied"), std::string::npos) << play.output;
+}
+
+} // namespace
