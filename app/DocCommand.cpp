@@ -65,6 +65,7 @@ DocArguments ParseDoc(const std::string& subcommand, std::vector<std::string> wo
     auto app = MakeDocApp(subcommand, arguments.flags);
     app->allow_extras();
     std::vector<TextOption> values;
+    std::string filterWord;
     const bool help = std::any_of(words.begin(), words.end(),
                                   [](const std::string& word) { return word == "--help" || word == "-h"; });
     if (subcommand == "filter") {
@@ -76,7 +77,7 @@ DocArguments ParseDoc(const std::string& subcommand, std::vector<std::string> wo
                 return arguments;
             }
             AddFilterParameters(*app, *arguments.filter, values);
-            arguments.flags.positional.push_back(words[*at]);
+            filterWord = words[*at];
             words.erase(words.begin() + std::ptrdiff_t(*at));
         }
     }
@@ -87,8 +88,8 @@ DocArguments ParseDoc(const std::string& subcommand, std::vector<std::string> wo
     if (arguments.filter) {
         // The filter's name was taken out before parsing; it goes back to its place after the document's.
         auto& positional = arguments.flags.positional;
-        std::rotate(positional.begin(), positional.end() - 1, positional.end());
-        if (positional.size() >= 2) std::swap(positional[0], positional[1]);
+        positional.insert(positional.begin() + std::ptrdiff_t(std::min<std::size_t>(1, positional.size())),
+                          filterWord);
     }
     for (const auto& extra : app->remaining())
         if (extra.starts_with("-") && extra != "-") {

@@ -77,7 +77,7 @@ int RunList(const std::vector<std::string>& args) {
             << info->toolClass << "  tool id " << int(tool->GetToolID()) << "  name " << info->name << '\n';
         PrintCommand(out, *info);
         out << "    " << std::left << std::setw(12) << "parameter" << std::setw(6) << "id" << std::setw(14)
-            << "label" << std::setw(12) << "type" << std::setw(14) << "range" << std::setw(32)
+            << "label" << std::setw(12) << "type" << std::setw(20) << "range" << std::setw(32)
             << "settings key" << std::setw(9) << "default"
             << "serialised\n";
         const auto reflecteds = tool->EnumerateReflecteds();
