@@ -137,8 +137,9 @@ TEST(DeviceEnumeration, FindsTheOpenCLCpuDevice) {
     EXPECT_EQ(device->GetBackEnd(), HardwareBackEnd::OpenCL);
     EXPECT_EQ(device->GetLanguage(), HardwareKernelLanguage::OpenCLC);
     // Auto takes an OpenCL device only when it is a GPU.
-    if (device->GetKind() == HardwareDeviceKind::Cpu && Hardware::GetDevice("cuda") == nullptr)
+    if (device->GetKind() == HardwareDeviceKind::Cpu && Hardware::GetDevice("cuda") == nullptr) {
         EXPECT_EQ(Hardware::GetDevice("auto"), nullptr);
+    }
     std::cout << "[ info     ] OpenCL device: " << device->Describe() << "\n";
 }
 
