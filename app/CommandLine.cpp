@@ -59,6 +59,13 @@ pixel formats: rgba8 and rgba16 (red, green, blue, alpha; 8 or 16 bits), rgbauf 
   ia8 and ia16 (grey and alpha), cmyka8 (inks and alpha), laba16 (CIE L*a*b* and alpha, 16 bits)
 )";
 
+// CLI11 marks options that may be repeated with "..."; ours may not (a repeat is an error), so the mark goes.
+std::string Tidy(std::string help) {
+    for (std::size_t at; (at = help.find(" ...")) != std::string::npos;)
+        help.erase(at, 4);
+    return help;
+}
+
 // CLI11 says "--tile: 1 required TEXT missing"; people read "--tile needs a value".
 std::string Translate(const CLI::ParseError& error) {
     const std::string what = error.what();
@@ -134,7 +141,7 @@ bool ParseArguments(CLI::App& app, const std::vector<std::string>& args) {
     try {
         app.parse(reversed);
     } catch (const CLI::CallForHelp&) {
-        std::cout << app.help();
+        std::cout << Tidy(app.help());
         return true;
     } catch (const CLI::ParseError& error) {
         throw UsageError(Translate(error));
@@ -273,7 +280,7 @@ std::string FilterHelp(const RasterTools::FilterInfo& filter) {
             filter.parameters[i].name != "format")
             example += " --" + GetShownParameter(filter.parameters[i]).flag + " " + Example(filter, i);
     app->footer("example:\n  " + example + " photo.jpg result.jpg\n");
-    return app->help();
+    return Tidy(app->help());
 }
 
 std::string FilterList() {
@@ -293,7 +300,7 @@ std::string TopLevelHelp() {
 std::string CommandHelp(const std::string& command) {
     if (command == "apply") {
         ApplyFlags flags;
-        return MakeApplyApp(flags)->help();
+        return Tidy(MakeApplyApp(flags)->help());
     }
     if (command.starts_with("doc ")) {
         const std::string sub = command.substr(4);
@@ -301,7 +308,7 @@ std::string CommandHelp(const std::string& command) {
             std::end(kDocSubcommands))
             return {};
         DocFlags flags;
-        return MakeDocApp(sub, flags)->help();
+        return Tidy(MakeDocApp(sub, flags)->help());
     }
     if (command == "doc") {
         std::string text = "usage: rastertools doc SUBCOMMAND ... (rastertools doc SUBCOMMAND --help)\n\n";

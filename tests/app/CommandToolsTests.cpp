@@ -273,6 +273,38 @@ TEST_F(CommandTools, AnInterruptedWriteLeavesNoTemporaryFile) {
             std::filesystem::remove(m_Folder / "out.tif");
         }
     }
+    // A document saved by doc filter, interrupted while it writes.
+    ASSERT_EQ(Run("doc new big.png -o big.rtd").exitCode, 0);
+    for (const int delay : {100, 300, 600, 1000}) {
+        const pid_t child = ::fork();
+        ASSERT_GE(child, 0);
+        if (child == 0) {
+            ::chdir(m_Folder.c_str());
+            ::execl(RASTERTOOLS_PROGRAM, RASTERTOOLS_PROGRAM, "--quiet", "doc", "filter", "big.rtd", "copy",
+                    static_cast<char*>(nullptr));
+            ::_exit(127);
+        }
+        std::this_thread::sleep_for(std::chrono::milliseconds(delay));
+        ::kill(child, SIGINT);
+        int status = 0;
+        ::waitpid(child, &status, 0);
+        for (const auto& entry : std::filesystem::directory_iterator(m_Folder))
+            EXPECT_FALSE(entry.path().filename().string().starts_with(".big.rtd."))
+                << entry.path() << " left after an interrupt at " << delay << " ms";
+    }
+    EXPECT_EQ(Run("doc show big.rtd").exitCode, 0) << "the document is whole";
+}
+
+// Temporaries that earlier builds named ".NAME.XXXXXX" are cleared by the next write once they are old; a
+// fresh one may be a writer's at work and stays.
+TEST_F(CommandTools, AnOldStyleLeftoverIsClearedByTheNextWrite) {
+    Write(".out.png.Ab12Cd", "partial");
+    Write(".out.png.Zz99yy", "partial");
+    std::filesystem::last_write_time(m_Folder / ".out.png.Ab12Cd",
+                                     std::filesystem::file_time_type::clock::now() - std::chrono::hours(2));
+    ASSERT_EQ(Run("apply copy in.png out.png").exitCode, 0);
+    EXPECT_FALSE(std::filesystem::exists(m_Folder / ".out.png.Ab12Cd"));
+    EXPECT_TRUE(std::filesystem::exists(m_Folder / ".out.png.Zz99yy"));
 }
 
 // Scripts name their files relative to themselves, so they run from any folder.
