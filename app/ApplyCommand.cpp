@@ -328,7 +328,7 @@ FileReport ProcessFile(const ApplyPlan& plan, const RenderDevice& device, const 
         if (!plan.channels.empty()) {
             const auto mask = RasterTools::ParseChannelMask(shape.format, plan.channels);
             if (!mask)
-                throw UsageError("--channels " + plan.channels + ": not a channel mask of " +
+                throw UsageError("--channels " + QuoteExcerpt(plan.channels) + ": not a channel mask of " +
                                  std::string(Raster::GetPixelFormatName(shape.format)) +
                                  " (a number, or channels named " +
                                  RasterTools::DescribeChannelNames(shape.format) + ")");

@@ -77,9 +77,11 @@ std::string Translate(const CLI::ParseError& error) {
     }
     if (name == "ExtrasError") {
         const auto colon = what.find(':');
-        return "unexpected argument" + (colon == std::string::npos ? what : what.substr(colon));
+        return "unexpected argument" +
+               EscapeBytes(
+                   std::string_view(colon == std::string::npos ? what : what.substr(colon)).substr(0, 200));
     }
-    return EscapeBytes(what);
+    return EscapeBytes(std::string_view(what).substr(0, 200));
 }
 
 std::string Example(const RasterTools::FilterInfo& filter, std::size_t index) {

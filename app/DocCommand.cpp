@@ -259,12 +259,14 @@ int RunFilter(const DocArguments& arguments) {
     if (targets.empty()) throw Error(path + ": the document has no raster layer to filter");
     ProgressBar progress(std::string(filter.name));
     PixelEffectOptions options;
-    options.progress = progress.Callback();
+    // The bar covers the filter (nine tenths) and saving the document.
+    options.progress = [&progress](double fraction) { progress.Update(0.9 * fraction); };
     const std::size_t droppedBefore = document->GetDroppedHistoryCount();
     const auto error = ApplyPixelCommand(*document, command, options);
-    progress.Finish();
     if (error) throw Error(path + ": " + *error);
     SaveDocument(*document, path);
+    progress.Update(1.0);
+    progress.Finish();
     const auto& entry = document->GetHistory().back();
     if (entry.patches.empty() && !IsQuiet())
         std::cerr << "rastertools: note: " << path << ": " << filter.name
@@ -312,14 +314,19 @@ int RunRender(const DocArguments& arguments) {
                     std::string(Raster::GetPixelFormatName(IO::GetWritableFormat(*type, *flatten.format))) +
                     ")");
     }
+    // The bar covers rendering (nine tenths) and writing.
     ProgressBar progress("render");
-    flatten.progress = progress.Callback();
+    flatten.progress = [&progress](double fraction) { progress.Update(0.9 * fraction); };
     const FlattenResult result = FlattenDocument(*document, flatten);
+    if (!result.image) {
+        progress.Finish();
+        throw Error(path + ": " + result.error);
+    }
+    WriteOutput(output, outputType, *result.image, files);
+    progress.Update(1.0);
     progress.Finish();
     for (const auto& warning : result.warnings)
-        std::cerr << "rastertools: warning: " << path << ": " << warning << '\n';
-    if (!result.image) throw Error(path + ": " + result.error);
-    WriteOutput(output, outputType, *result.image, files);
+        if (!IsQuiet()) std::cerr << "rastertools: warning: " << path << ": " << warning << '\n';
     if (!IsQuiet())
         (output == "-" ? std::cerr : std::cout)
             << output << ": " << DescribeSize(*result.image) << " from " << document->GetLayers().size()
