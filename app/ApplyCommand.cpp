@@ -1,7 +1,9 @@
 // rastertools apply FILTER [--PARAM VALUE]... INPUT OUTPUT: one filter on one image, through the pixel
 // pipeline on the chosen device or the processor.
 
+#include "app/CommandLine.h"
 #include "app/FilterArguments.h"
+#include "app/ImageFiles.h"
 #include "app/Options.h"
 #include "app/Progress.h"
 #include "filters/Catalogue.h"
@@ -14,26 +16,18 @@
 #include <chrono>
 #include <cmath>
 #include <cstring>
+#include <filesystem>
 #include <iomanip>
 #include <iostream>
+#include <map>
 #include <optional>
 #include <set>
+#include <sstream>
 #include <thread>
 
 namespace App {
 
 namespace {
-
-struct ApplyOptions {
-    std::string filter;
-    std::vector<std::pair<std::string, std::string>> parameters; // --name value, in order
-    std::string device;                                          // --device, empty: the environment or auto
-    std::optional<int> tileSize; // --tile; by default chosen for the filter (see DefaultTileSize)
-    int threads = 0;
-    std::string mask;
-    std::string channels;
-    std::vector<std::string> files;
-};
 
 // How many times its own area a tile of this side reads (a blur's margin, a rotation's corners).
 double ReadFactor(const RasterCommand& command, int tile) {
@@ -57,46 +51,9 @@ int DefaultTileSize(const RasterCommand& command, int width, int height, int thr
     return tile;
 }
 
-ApplyOptions ParseArguments(const std::vector<std::string>& args) {
-    ApplyOptions options;
-    std::set<std::string> seen;
-    for (std::size_t i = 0; i < args.size(); ++i) {
-        const std::string& arg = args[i];
-        if (!arg.starts_with("--")) {
-            if (options.filter.empty())
-                options.filter = arg;
-            else
-                options.files.push_back(arg);
-            continue;
-        }
-        if (i + 1 >= args.size()) throw UsageError(QuoteExcerpt(arg) + " needs a value");
-        // Which of two values was meant cannot be guessed.
-        if (!seen.insert(arg).second && !IsTextFlag(options.filter, arg.substr(2)))
-            throw UsageError(QuoteExcerpt(arg) + " is given more than once");
-        const std::string& value = args[++i];
-        if (arg == "--device")
-            options.device = value;
-        else if (arg == "--tile")
-            options.tileSize = ParseTileSize(value);
-        else if (arg == "--threads")
-            options.threads = ParseThreadCount(value);
-        else if (arg == "--mask")
-            options.mask = value;
-        else if (arg == "--channels")
-            options.channels = value;
-        else
-            options.parameters.emplace_back(arg.substr(2), value);
-    }
-    if (options.filter.empty())
-        throw UsageError("apply needs a filter name (for example: apply copy IN OUT)");
-    if (options.files.size() != 2)
-        throw UsageError("apply needs an input and an output file, after the filter name");
-    return options;
-}
-
 // The selection: an 8-bit grey image whose intensity is the weight (white selects).
 Kernel::Counted<Raster::DynamicBuffer> ReadMask(const std::string& path, int width, int height) {
-    IO::ReadResult read = IO::ReadImage(path, Raster::PixelFormat::IA8);
+    IO::ReadResult read = ReadInput(path, Raster::PixelFormat::IA8, {});
     if (!read) throw Error(read.error);
     const auto& image = *read.image;
     if (image.GetFormat() != Raster::PixelFormat::IA8)
@@ -135,116 +92,360 @@ Kernel::Counted<Raster::DynamicBuffer> ConvertOnLoad(Kernel::Counted<Raster::Dyn
     return converted;
 }
 
+// Everything apply was told, checked.
+struct ApplyPlan {
+    CheckedApply checked;
+    std::string device, mask, channels;
+    FileSettings files;
+    std::vector<std::string> inputs;
+    std::string output; // a file, "-", a folder ending in '/' or a pattern with {stem}, {name} or {ext}
+    bool named = false; // -o given
+    bool help = false;  // help was asked for and printed
+};
+
+const std::set<std::string, std::less<>> kValueOptions = {
+    "--device", "--tile",   "--threads",       "--mask",    "--channels",   "--format",
+    "-o",       "--output", "--output-format", "--quality", "--compression"};
+
+// Where the filter's name stands in one link of the chain: the first word that is not an option or an
+// option's value (an unknown --name takes a value, as parameters do).
+std::optional<std::size_t> FindFilterWord(const std::vector<std::string>& words) {
+    for (std::size_t i = 0; i < words.size(); ++i) {
+        const std::string& word = words[i];
+        if (word == "-" || !word.starts_with("-")) return i;
+        if (word.find('=') != std::string::npos || word == "--auto-orient" || word == "--help" ||
+            word == "-h")
+            continue;
+        ++i; // its value
+    }
+    return std::nullopt;
+}
+
+void Append(TextOption& into, const TextOption& from) {
+    into.values.insert(into.values.end(), from.values.begin(), from.values.end());
+}
+
+ApplyPlan Plan(const std::vector<std::string>& args, bool printHelp) {
+    std::vector<std::vector<std::string>> links(1);
+    for (const auto& arg : args)
+        if (arg == ":")
+            links.emplace_back();
+        else
+            links.back().push_back(arg);
+
+    ApplyPlan plan;
+    ApplyFlags all;
+    std::optional<Raster::PixelFormat> loadFormat;
+    for (std::size_t link = 0; link < links.size(); ++link) {
+        const auto& words = links[link];
+        const bool help = std::any_of(words.begin(), words.end(), [](const std::string& word) {
+            return word == "--help" || word == "-h";
+        });
+        const auto at = FindFilterWord(words);
+        if (!at) {
+            if (help && printHelp) {
+                std::cout << CommandHelp("apply");
+                plan.help = true;
+                return plan;
+            }
+            if (link == 0) throw UsageError("apply needs a filter name (for example: apply copy IN OUT)");
+            throw UsageError("a \":\" must be followed by a filter name (for example: twirl : unsharpmask)");
+        }
+        const RasterTools::FilterInfo& filter = RequireFilter(words[*at]);
+        if (help) {
+            if (!printHelp) throw UsageError("--help asks for help, not for work");
+            std::cout << FilterHelp(filter);
+            plan.help = true;
+            return plan;
+        }
+        const bool hasFormat =
+            std::any_of(filter.parameters.begin(), filter.parameters.end(),
+                        [](const RasterTools::ParameterSpec& spec) { return spec.name == "format"; });
+        ApplyFlags flags;
+        auto app = MakeApplyApp(flags, !hasFormat);
+        app->allow_extras();
+        std::vector<TextOption> values;
+        AddFilterParameters(*app, filter, values);
+        std::vector<std::string> rest(words);
+        rest.erase(rest.begin() + std::ptrdiff_t(*at));
+        ParseArguments(*app, rest);
+        for (const auto& extra : app->remaining())
+            if (extra.starts_with("-") && extra != "-") {
+                const std::string known = ParameterFlags(filter);
+                throw UsageError(std::string(filter.name) + " has no parameter " +
+                                 EscapeBytes(std::string_view(extra).substr(
+                                     0, std::min<std::size_t>(40, extra.find('=')))) +
+                                 " (it takes " + (known.empty() ? std::string("none") : known) + ")");
+            }
+        auto command = MakeFilterCommand(filter, false, FilterParameterTexts(filter, values));
+        if (!dynamic_cast<const RasterTools::PipelineCommand*>(command.Get()))
+            throw Error(std::string(filter.name) + " cannot be applied from the command line yet");
+        plan.checked.chain.push_back(command);
+        plan.checked.names.emplace_back(filter.name);
+
+        if (flags.format.Given()) {
+            Once(flags.format, "--format");
+            if (loadFormat || link > 0)
+                throw UsageError("--format converts the input, so it belongs to the first filter of a chain");
+            loadFormat = Raster::ParsePixelFormat(flags.format.Value());
+            if (!loadFormat || !Raster::IsLayerFormat(*loadFormat))
+                throw UsageError("--format: " + QuoteExcerpt(flags.format.Value()) +
+                                 " is not a layer format (" + LayerFormatNames() + ")");
+        }
+        Append(all.render.device, flags.render.device);
+        Append(all.render.tile, flags.render.tile);
+        Append(all.render.threads, flags.render.threads);
+        Append(all.mask, flags.mask);
+        Append(all.channels, flags.channels);
+        Append(all.output, flags.output);
+        Append(all.files.quality, flags.files.quality);
+        Append(all.files.compression, flags.files.compression);
+        Append(all.files.outputFormat, flags.files.outputFormat);
+        all.files.autoOrient = all.files.autoOrient || flags.files.autoOrient;
+        plan.inputs.insert(plan.inputs.end(), flags.positional.begin(), flags.positional.end());
+    }
+    Once(all.render.device, "--device");
+    Once(all.render.tile, "--tile");
+    Once(all.render.threads, "--threads");
+    Once(all.mask, "--mask");
+    Once(all.channels, "--channels");
+    Once(all.output, "--output");
+    plan.checked.command = plan.checked.chain.front();
+    plan.checked.loadFormat = loadFormat ? int(*loadFormat) : -1;
+    if (all.render.tile.Given()) plan.checked.tileSize = ParseTileSize(all.render.tile.Value());
+    if (all.render.threads.Given()) plan.checked.threads = ParseThreadCount(all.render.threads.Value());
+    if (all.render.device.Given()) plan.device = all.render.device.Value();
+    if (all.mask.Given()) plan.mask = all.mask.Value();
+    if (all.channels.Given()) plan.channels = all.channels.Value();
+    plan.files = CheckFileFlags(all.files);
+
+    if (all.output.Given()) {
+        plan.named = true;
+        plan.output = all.output.Value();
+        if (plan.inputs.empty()) throw UsageError("apply needs an input file, after the filter name");
+    } else {
+        if (plan.inputs.size() != 2)
+            throw UsageError(
+                plan.inputs.size() > 2
+                    ? "apply takes one input and one output, or several inputs with -o FOLDER/ or "
+                      "-o '{stem}-new.png'"
+                    : "apply needs an input and an output file, after the filter name");
+        plan.output = plan.inputs.back();
+        plan.inputs.pop_back();
+    }
+    return plan;
+}
+
+bool IsPattern(const std::string& output) {
+    return output.find("{stem}") != std::string::npos || output.find("{name}") != std::string::npos ||
+           output.find("{ext}") != std::string::npos;
+}
+
+bool IsFolder(const std::string& output) {
+    std::error_code error;
+    return output.ends_with('/') || std::filesystem::is_directory(output, error);
+}
+
+// The output file of input: the folder's file of the same name, or the pattern filled in.
+std::string OutputFor(const std::string& input, const std::string& output) {
+    const std::filesystem::path path(input);
+    if (IsFolder(output)) return (std::filesystem::path(output) / path.filename()).string();
+    if (!IsPattern(output)) return output;
+    std::string ext = path.extension().string();
+    if (!ext.empty()) ext.erase(0, 1);
+    std::string result;
+    for (std::size_t i = 0; i < output.size();) {
+        bool replaced = false;
+        for (const auto& [key, value] : {std::pair<std::string, std::string>{"{stem}", path.stem().string()},
+                                         {"{name}", path.filename().string()},
+                                         {"{ext}", ext}})
+            if (output.compare(i, key.size(), key) == 0) {
+                result += value;
+                i += key.size();
+                replaced = true;
+                break;
+            }
+        if (!replaced) result += output[i++];
+    }
+    // A pattern without a folder puts each result beside its input.
+    if (output.find('/') == std::string::npos && path.has_parent_path())
+        return (path.parent_path() / result).string();
+    return result;
+}
+
+struct FileReport {
+    std::string line; // what was done
+    bool unchanged = false;
+};
+
+FileReport ProcessFile(const ApplyPlan& plan, const RenderDevice& device, const std::string& input,
+                       const std::string& output) {
+    const auto& checked = plan.checked;
+    const std::optional<Raster::PixelFormat> loadFormat =
+        checked.loadFormat >= 0 ? std::optional(Raster::PixelFormat(checked.loadFormat)) : std::nullopt;
+    const IO::FileType outputType = OutputType(output, plan.files);
+    std::string label;
+    for (const auto& name : checked.names)
+        label += (label.empty() ? "" : " : ") + name;
+
+    ProgressBar progress(label);
+    IO::ReadResult read = ReadInput(input, loadFormat, plan.files);
+    if (!read) throw Error(read.error);
+    const std::string inputName = input == "-" ? "standard input" : input;
+    const auto source = loadFormat ? ConvertOnLoad(read.image, *loadFormat, inputName) : read.image;
+    progress.Update(0.05);
+
+    // Every link's output shape first, so that an output the file cannot hold is refused before the work.
+    std::vector<RasterTools::OutputShape> shapes;
+    int width = source->GetWidth(), height = source->GetHeight();
+    Raster::PixelFormat format = source->GetFormat();
+    for (const auto& command : checked.chain) {
+        const auto* pipeline = dynamic_cast<const RasterTools::PipelineCommand*>(command.Get());
+        shapes.push_back(pipeline->GetOutputShape(width, height, format));
+        width = shapes.back().width;
+        height = shapes.back().height;
+        format = shapes.back().format;
+    }
+    const std::string outputName = output == "-" ? "standard output" : output;
+    if (!IO::CanWrite(outputType, format))
+        throw Error(outputName + ": " + std::string(IO::GetFileTypeName(outputType)) + " cannot hold " +
+                    std::string(Raster::GetPixelFormatName(format)) + " pixels (choose another --format or " +
+                    std::string(Raster::GetPixelFormatName(IO::GetWritableFormat(outputType, format))) + ")");
+
+    Kernel::Counted<Raster::DynamicBuffer> current = source;
+    long deviceTiles = 0, processorTiles = 0;
+    const auto started = std::chrono::steady_clock::now();
+    for (std::size_t i = 0; i < checked.chain.size(); ++i) {
+        const auto& command = checked.chain[i];
+        const auto* pipeline = dynamic_cast<const RasterTools::PipelineCommand*>(command.Get());
+        const auto& shape = shapes[i];
+        int channelMask = -1;
+        if (!plan.channels.empty()) {
+            const auto mask = RasterTools::ParseChannelMask(shape.format, plan.channels);
+            if (!mask)
+                throw UsageError("--channels " + QuoteExcerpt(plan.channels) + ": not a channel mask of " +
+                                 std::string(Raster::GetPixelFormatName(shape.format)) +
+                                 " (a number, or channels named " +
+                                 RasterTools::DescribeChannelNames(shape.format) + ")");
+            channelMask = *mask;
+        }
+        // Channels the write mask keeps come from the input where the output has its size and format.
+        auto destination = Raster::DynamicBuffer::Create(shape.width, shape.height, shape.format);
+        if (destination && shape.width == current->GetWidth() && shape.height == current->GetHeight() &&
+            shape.format == current->GetFormat() && channelMask >= 0)
+            for (int y = 0; y < shape.height; ++y)
+                std::memcpy(destination->RowBytes(y), current->RowBytes(y), current->GetRowBytes());
+        if (!destination)
+            throw Error(outputName + ": a " + std::to_string(shape.width) + "x" +
+                        std::to_string(shape.height) + " " +
+                        std::string(Raster::GetPixelFormatName(shape.format)) + " image is too large");
+        Kernel::Counted<Raster::DynamicBuffer> mask;
+        if (!plan.mask.empty()) mask = ReadMask(plan.mask, shape.width, shape.height);
+
+        RasterTools::RenderJobOptions job;
+        job.tileSize = checked.tileSize
+                           ? checked.tileSize
+                           : DefaultTileSize(*command, shape.width, shape.height, checked.threads);
+        job.threads = checked.threads;
+        job.device = device.device;
+        job.channelMask = channelMask;
+        const double first = 0.1 + 0.8 * double(i) / double(checked.chain.size());
+        const double share = 0.8 / double(checked.chain.size());
+        job.progress = [&progress, first, share](double fraction) {
+            progress.Update(first + share * fraction);
+        };
+        const auto result = RasterTools::RenderImage(*pipeline, current, destination, mask, job);
+        if (!result.complete) throw Error(checked.names[i] + ": " + result.error);
+        deviceTiles += result.deviceTiles;
+        processorTiles += result.processorTiles;
+        current = destination;
+    }
+    const std::chrono::duration<double, std::milli> renderTime = std::chrono::steady_clock::now() - started;
+
+    FileReport report;
+    if (current->GetWidth() == source->GetWidth() && current->GetHeight() == source->GetHeight() &&
+        current->GetFormat() == source->GetFormat()) {
+        report.unchanged = true;
+        for (int y = 0; y < current->GetHeight() && report.unchanged; ++y)
+            report.unchanged =
+                std::memcmp(current->RowBytes(y), source->RowBytes(y), source->GetRowBytes()) == 0;
+    }
+    WriteOutput(output, outputType, *current, plan.files);
+    progress.Update(1.0);
+    progress.Finish();
+
+    std::ostringstream line;
+    line << label << ": " << (input == "-" ? std::string("standard input") : input) << " "
+         << source->GetWidth() << "x" << source->GetHeight() << " "
+         << Raster::GetPixelFormatName(source->GetFormat()) << " -> " << outputName << " "
+         << current->GetWidth() << "x" << current->GetHeight() << " "
+         << Raster::GetPixelFormatName(current->GetFormat()) << "; " << deviceTiles << " tiles on "
+         << (device.device ? device.device->GetIdentifier() : std::string("the device")) << ", "
+         << processorTiles << " on the processor; rendered in " << std::fixed << std::setprecision(1)
+         << renderTime.count() << " ms";
+    report.line = line.str();
+    return report;
+}
+
 } // namespace
 
 CheckedApply CheckApplyArguments(const std::vector<std::string>& args) {
-    const ApplyOptions options = ParseArguments(args);
-    const RasterTools::FilterInfo* filter = &RequireFilter(options.filter);
-    // A filter without a format parameter of its own takes --format as the format to convert the input to
-    // when it is read.
-    std::optional<Raster::PixelFormat> loadFormat;
-    const bool hasFormatParameter =
-        std::any_of(filter->parameters.begin(), filter->parameters.end(),
-                    [](const RasterTools::ParameterSpec& spec) { return spec.name == "format"; });
-    std::vector<std::pair<std::string, std::string>> parameters;
-    for (const auto& [name, text] : options.parameters) {
-        if (name != "format" || hasFormatParameter) {
-            parameters.emplace_back(name, text);
-            continue;
-        }
-        loadFormat = Raster::ParsePixelFormat(text);
-        if (!loadFormat || !Raster::IsLayerFormat(*loadFormat))
-            throw UsageError("--format: " + QuoteExcerpt(text) + " is not a layer format (" +
-                             LayerFormatNames() + ")");
-    }
-    CheckedApply checked;
-    checked.command = MakeFilterCommand(*filter, false, parameters);
-    if (!dynamic_cast<const RasterTools::PipelineCommand*>(checked.command.Get()))
-        throw Error(options.filter + " cannot be applied from the command line yet");
-    checked.loadFormat = loadFormat ? int(*loadFormat) : -1;
-    checked.tileSize = options.tileSize.value_or(0);
-    checked.threads = options.threads;
-    return checked;
+    return Plan(args, false).checked;
 }
 
 int RunApply(const std::vector<std::string>& args) {
-    const CheckedApply checked = CheckApplyArguments(args);
-    const ApplyOptions options = ParseArguments(args);
-    const auto& command = checked.command;
-    const auto* pipeline = dynamic_cast<const RasterTools::PipelineCommand*>(command.Get());
-    const std::optional<Raster::PixelFormat> loadFormat =
-        checked.loadFormat >= 0 ? std::optional(Raster::PixelFormat(checked.loadFormat)) : std::nullopt;
-
-    const std::string& input = options.files[0];
-    const std::string& output = options.files[1];
-    const auto outputType = IO::GetFileTypeForExtension(output);
-    if (!outputType) throw UsageError(output + ": unknown file type (use .png, .jpg, .jpeg, .tif or .tiff)");
-
-    IO::ReadResult read = IO::ReadImage(input, loadFormat);
-    if (!read) throw Error(read.error);
-    const auto source = loadFormat ? ConvertOnLoad(read.image, *loadFormat, input) : read.image;
-    const auto shape = pipeline->GetOutputShape(source->GetWidth(), source->GetHeight(), source->GetFormat());
-    if (!IO::CanWrite(*outputType, shape.format))
-        throw Error(
-            output + ": " + std::string(IO::GetFileTypeName(*outputType)) + " cannot hold " +
-            std::string(Raster::GetPixelFormatName(shape.format)) + " pixels (choose another --format or " +
-            std::string(Raster::GetPixelFormatName(IO::GetWritableFormat(*outputType, shape.format))) + ")");
-
-    int channelMask = -1;
-    if (!options.channels.empty()) {
-        const auto mask = RasterTools::ParseChannelMask(shape.format, options.channels);
-        if (!mask)
-            throw UsageError("--channels " + options.channels + ": not a channel mask of " +
-                             std::string(Raster::GetPixelFormatName(shape.format)) +
-                             " (a number, or channels named " +
-                             RasterTools::DescribeChannelNames(shape.format) + ")");
-        channelMask = *mask;
-    }
-
-    // Channels the write mask keeps come from the input where the output has its size and format.
-    Kernel::Counted<Raster::DynamicBuffer> destination;
-    if (shape.width == source->GetWidth() && shape.height == source->GetHeight() &&
-        shape.format == source->GetFormat() && channelMask >= 0) {
-        destination = Raster::DynamicBuffer::Create(shape.width, shape.height, shape.format);
-        if (destination)
-            for (int y = 0; y < shape.height; ++y)
-                std::memcpy(destination->RowBytes(y), source->RowBytes(y), source->GetRowBytes());
-    } else {
-        destination = Raster::DynamicBuffer::Create(shape.width, shape.height, shape.format);
-    }
-    if (!destination)
-        throw Error(output + ": a " + std::to_string(shape.width) + "x" + std::to_string(shape.height) + " " +
-                    std::string(Raster::GetPixelFormatName(shape.format)) + " image is too large");
-
-    Kernel::Counted<Raster::DynamicBuffer> mask;
-    if (!options.mask.empty()) mask = ReadMask(options.mask, shape.width, shape.height);
-
-    const RenderDevice device = FindRenderDevice(ResolveDeviceSelector(options.device));
+    const ApplyPlan plan = Plan(args, true);
+    if (plan.help) return 0;
+    const RenderDevice device = FindRenderDevice(ResolveDeviceSelector(plan.device));
     if (!device.IsValid()) throw UsageError(device.error);
 
-    RasterTools::RenderJobOptions job;
-    job.tileSize = options.tileSize ? *options.tileSize
-                                    : DefaultTileSize(*command, shape.width, shape.height, options.threads);
-    job.threads = options.threads;
-    job.device = device.device;
-    job.channelMask = channelMask;
-    ProgressBar progress(options.filter);
-    job.progress = progress.Callback();
-    const auto started = std::chrono::steady_clock::now();
-    const auto result = RasterTools::RenderImage(*pipeline, source, destination, mask, job);
-    const std::chrono::duration<double, std::milli> renderTime = std::chrono::steady_clock::now() - started;
-    progress.Finish();
-    if (!result.complete) throw Error(options.filter + ": " + result.error);
+    // Every output decided before any work, so that a typing error costs nothing and no two inputs overwrite
+    // one output.
+    const bool batch = plan.inputs.size() > 1;
+    if (batch && !IsFolder(plan.output) && !IsPattern(plan.output))
+        throw UsageError("several inputs need -o FOLDER/ or a pattern such as -o '{stem}-new.png', not " +
+                         QuoteExcerpt(plan.output));
+    std::vector<std::string> outputs;
+    std::map<std::string, std::string> writers;
+    for (const auto& input : plan.inputs) {
+        if (batch && input == "-") throw UsageError("\"-\" (standard input) can only be the one input");
+        if (plan.named && (IsFolder(plan.output) || IsPattern(plan.output)) && input == "-")
+            throw UsageError("standard input has no name for -o " + QuoteExcerpt(plan.output) + " to use");
+        outputs.push_back(plan.named ? OutputFor(input, plan.output) : plan.output);
+        OutputType(outputs.back(), plan.files);
+        const auto [at, inserted] = writers.emplace(outputs.back(), input);
+        if (!inserted)
+            throw UsageError(QuoteExcerpt(at->second) + " and " + QuoteExcerpt(input) +
+                             " would both be written to " + QuoteExcerpt(outputs.back()));
+    }
+    if (batch && IsFolder(plan.output)) {
+        std::error_code error;
+        std::filesystem::create_directories(plan.output, error);
+        if (error) throw Error(plan.output + ": cannot make the folder (" + error.message() + ")");
+    }
 
-    const IO::WriteResult written = IO::WriteImage(output, *destination);
-    if (!written) throw Error(written.error);
-
-    std::cout << options.filter << ": " << source->GetWidth() << "x" << source->GetHeight() << " "
-              << Raster::GetPixelFormatName(source->GetFormat()) << " -> " << shape.width << "x"
-              << shape.height << " " << Raster::GetPixelFormatName(shape.format) << "; " << result.deviceTiles
-              << " tiles on " << (device.device ? device.device->GetIdentifier() : std::string("the device"))
-              << ", " << result.processorTiles << " on the processor; rendered in " << std::fixed
-              << std::setprecision(1) << renderTime.count() << " ms\n";
+    int failed = 0;
+    for (std::size_t i = 0; i < plan.inputs.size(); ++i) {
+        try {
+            const FileReport report = ProcessFile(plan, device, plan.inputs[i], outputs[i]);
+            // Standard output may carry the picture: the report goes to standard error then.
+            if (!IsQuiet()) (outputs[i] == "-" ? std::cerr : std::cout) << report.line << '\n';
+            if (report.unchanged && !IsQuiet())
+                std::cerr << "rastertools: note: " << plan.inputs[i]
+                          << ": these parameters change no pixel; the output is a copy of the input\n";
+        } catch (const UsageError&) {
+            throw;
+        } catch (const std::exception& error) {
+            // One bad file in a batch does not stop the others.
+            if (!batch) throw;
+            ++failed;
+            std::cerr << "rastertools: " << error.what() << '\n';
+        }
+    }
+    if (failed) {
+        std::cerr << "rastertools: " << failed << " of " << plan.inputs.size() << " files failed\n";
+        return kExitFailure;
+    }
     return 0;
 }
 

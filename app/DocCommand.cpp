@@ -2,7 +2,9 @@
 // it, loads it, changes it in memory and writes it back atomically before letting go, so an error leaves the
 // file as it was and concurrent commands on one document each see the others' changes.
 
+#include "app/CommandLine.h"
 #include "app/FilterArguments.h"
+#include "app/ImageFiles.h"
 #include "app/Options.h"
 #include "app/Progress.h"
 #include "filters/Catalogue.h"
@@ -15,11 +17,13 @@
 #include "host/raster/device/Hardware.h"
 #include "pipeline/RenderJob.h"
 
+#include <algorithm>
 #include <chrono>
 #include <cmath>
 #include <cstdlib>
 #include <filesystem>
 #include <iostream>
+#include <optional>
 #include <set>
 
 namespace App {
@@ -28,59 +32,95 @@ namespace {
 
 constexpr std::string_view kDocUsage =
     "usage: rastertools doc new IMAGE -o DOC [--format F] [--force]\n"
-    "       rastertools doc filter DOC FILTER [--PARAM VALUE]... [--live]\n"
+    "       rastertools doc filter DOC FILTER [--PARAM VALUE]... [--live] [--device D]\n"
     "       rastertools doc render DOC OUTPUT [--format F] [--device D] [--tile N] [--threads N]\n"
     "       rastertools doc show DOC\n"
-    "       rastertools doc undo DOC | doc redo DOC";
+    "       rastertools doc undo DOC | doc redo DOC\n"
+    "       (rastertools doc SUBCOMMAND --help says more)";
 
+// A doc subcommand's arguments, parsed; filter is set for doc filter.
 struct DocArguments {
-    std::vector<std::string> positional;
-    std::vector<std::pair<std::string, std::string>> options; // --name value, in order
-    bool live = false;
-    bool force = false;
+    DocFlags flags;
+    const RasterTools::FilterInfo* filter = nullptr;
+    std::vector<std::pair<std::string, std::string>> parameters; // the filter's, as typed
+    bool help = false;
 };
 
-// Splits arguments into positional ones and `--name value` pairs; only `--live` and `--force` stand alone.
-DocArguments SplitArguments(const std::vector<std::string>& args) {
-    DocArguments result;
-    for (std::size_t i = 0; i < args.size(); ++i) {
-        const std::string& arg = args[i];
-        if (arg == "--live") {
-            result.live = true;
-        } else if (arg == "--force") {
-            result.force = true;
-        } else if (arg.starts_with("--") || arg == "-o") {
-            if (i + 1 >= args.size()) throw UsageError(arg + " needs a value");
-            result.options.emplace_back(arg == "-o" ? "o" : arg.substr(2), args[++i]);
-        } else {
-            result.positional.push_back(arg);
+// Where doc filter's FILTER stands: the second word that is not an option or an option's value.
+std::optional<std::size_t> FindFilterWord(const std::vector<std::string>& words) {
+    int bare = 0;
+    for (std::size_t i = 0; i < words.size(); ++i) {
+        const std::string& word = words[i];
+        if (word == "-" || !word.starts_with("-")) {
+            if (++bare == 2) return i;
+            continue;
         }
+        if (word.find('=') == std::string::npos && word != "--live" && word != "--help" && word != "-h") ++i;
     }
-    return result;
+    return std::nullopt;
 }
 
-// The value of each option in allowed; any other option is a usage error.
-std::map<std::string, std::string> TakeOptions(const DocArguments& arguments, const std::string& subcommand,
-                                               const std::set<std::string>& allowed) {
-    std::map<std::string, std::string> values;
-    for (const auto& [name, value] : arguments.options) {
-        if (!allowed.contains(name)) {
-            std::string known;
-            for (const auto& option : allowed)
-                known += (known.empty() ? "" : ", ") + std::string(option == "o" ? "-o" : "--" + option);
-            throw UsageError("doc " + subcommand + " has no option " + (name == "o" ? "-o" : "--" + name) +
-                             " (it takes " + (known.empty() ? std::string("none") : known) + ")");
+DocArguments ParseDoc(const std::string& subcommand, std::vector<std::string> words) {
+    DocArguments arguments;
+    auto app = MakeDocApp(subcommand, arguments.flags);
+    app->allow_extras();
+    std::vector<TextOption> values;
+    std::string filterWord;
+    const bool help = std::any_of(words.begin(), words.end(),
+                                  [](const std::string& word) { return word == "--help" || word == "-h"; });
+    if (subcommand == "filter") {
+        if (const auto at = FindFilterWord(words)) {
+            arguments.filter = &RequireFilter(words[*at]);
+            if (help) {
+                std::cout << FilterHelp(*arguments.filter);
+                arguments.help = true;
+                return arguments;
+            }
+            AddFilterParameters(*app, *arguments.filter, values);
+            filterWord = words[*at];
+            words.erase(words.begin() + std::ptrdiff_t(*at));
         }
-        if (!values.emplace(name, value).second)
-            throw UsageError((name == "o" ? "-o" : "--" + name) + " is given more than once");
     }
-    if (arguments.live) throw UsageError("--live belongs to doc filter");
-    if (arguments.force && subcommand != "new") throw UsageError("--force belongs to doc new");
-    return values;
+    if (ParseArguments(*app, words)) {
+        arguments.help = true;
+        return arguments;
+    }
+    if (arguments.filter) {
+        // The filter's name was taken out before parsing; it goes back to its place after the document's.
+        auto& positional = arguments.flags.positional;
+        positional.insert(positional.begin() + std::ptrdiff_t(std::min<std::size_t>(1, positional.size())),
+                          filterWord);
+    }
+    for (const auto& extra : app->remaining())
+        if (extra.starts_with("-") && extra != "-") {
+            const std::string name =
+                EscapeBytes(std::string_view(extra).substr(0, std::min<std::size_t>(40, extra.find('='))));
+            if (arguments.filter) {
+                const std::string known = ParameterFlags(*arguments.filter);
+                throw UsageError(std::string(arguments.filter->name) + " has no parameter " + name +
+                                 " (it takes " + (known.empty() ? std::string("none") : known) + ")");
+            }
+            std::string known;
+            for (const auto* option : app->get_options())
+                if (!option->get_group().empty() && option->get_name() != "-h,--help" &&
+                    !option->get_lnames().empty())
+                    known += (known.empty() ? "--" : ", --") + option->get_lnames().front();
+            throw UsageError("doc " + subcommand + " has no option " + name + " (it takes " +
+                             (known.empty() ? std::string("none") : known) + ")");
+        }
+    if (arguments.flags.live && subcommand != "filter") throw UsageError("--live belongs to doc filter");
+    if (arguments.flags.force && subcommand != "new") throw UsageError("--force belongs to doc new");
+    Once(arguments.flags.render.device, "--device");
+    Once(arguments.flags.render.tile, "--tile");
+    Once(arguments.flags.render.threads, "--threads");
+    Once(arguments.flags.output, "-o");
+    Once(arguments.flags.format, "--format");
+    if (arguments.filter) arguments.parameters = FilterParameterTexts(*arguments.filter, values);
+    return arguments;
 }
 
 void RequirePositional(const DocArguments& arguments, std::size_t count, const std::string& usage) {
-    if (arguments.positional.size() != count) throw UsageError("usage: rastertools doc " + usage);
+    if (arguments.flags.positional.size() != count) throw UsageError("usage: rastertools doc " + usage);
 }
 
 Raster::PixelFormat ParseLayerFormat(const std::string& text) {
@@ -126,61 +166,73 @@ std::string DescribeSize(const Raster::DynamicBuffer& image) {
            std::string(Raster::GetPixelFormatName(image.GetFormat()));
 }
 
+// The device for live filters and pixel commands, which pick theirs from the process's selection: --device
+// overrides it. A device that is not there is refused before any work.
+RenderDevice UseDevice(const TextOption& option) {
+    const DeviceSelection selection = ResolveDeviceSelector(option.Given() ? option.Value() : std::string());
+    const RenderDevice device = FindRenderDevice(selection);
+    if (!device.IsValid()) throw UsageError(device.error);
+    if (option.Given()) ::setenv(Raster::Hardware::SelectorVariable, selection.selector.c_str(), 1);
+    return device;
+}
+
 int RunNew(const DocArguments& arguments) {
-    const auto options = TakeOptions(arguments, "new", {"o", "format"});
     RequirePositional(arguments, 1, "new IMAGE -o DOC [--format F] [--force]");
-    if (!options.contains("o")) throw UsageError("doc new needs the document to write: -o DOC");
-    const std::string& input = arguments.positional[0];
-    const std::string& output = options.at("o");
+    const auto& flags = arguments.flags;
+    if (!flags.output.Given()) throw UsageError("doc new needs the document to write: -o DOC");
+    const FileSettings files = CheckFileFlags(flags.files);
+    const std::string& input = flags.positional[0];
+    const std::string& output = flags.output.Value();
     const Kernel::FileLock lock = LockDocument(output);
     // Replacing a document is what new is for; replacing anything else (the picture itself, say) is asked
     // for.
     std::error_code error;
-    if (std::filesystem::exists(output, error) && !arguments.force && !DocumentFile::IsDocument(output))
+    if (std::filesystem::exists(output, error) && !flags.force && !DocumentFile::IsDocument(output))
         throw Error(output +
                     ": exists and is not a RasterTools document; not replaced (--force replaces it)");
 
-    IO::ReadResult read = IO::ReadImage(input);
+    IO::ReadResult read = ReadInput(input, std::nullopt, files);
     if (!read) throw Error(read.error);
     Kernel::Counted<Raster::DynamicBuffer> pixels = read.image;
-    if (options.contains("format")) {
-        const Raster::PixelFormat format = ParseLayerFormat(options.at("format"));
+    if (flags.format.Given()) {
+        const Raster::PixelFormat format = ParseLayerFormat(flags.format.Value());
         if (format != pixels->GetFormat()) {
             // Converting is the pixel pipeline's work: a copy into the chosen format.
             const auto& copy = RequireFilter("copy");
             const auto command =
-                copy.makeCommand(false, ParseFilterParameters(copy, {{"format", options.at("format")}}));
+                copy.makeCommand(false, ParseFilterParameters(copy, {{"format", flags.format.Value()}}));
             const auto* pipeline = dynamic_cast<const RasterTools::PipelineCommand*>(command.Get());
             auto converted = Raster::DynamicBuffer::Create(pixels->GetWidth(), pixels->GetHeight(), format);
             if (!pipeline || !converted)
-                throw Error(input + ": cannot convert the image to " + options.at("format"));
+                throw Error(input + ": cannot convert the image to " + flags.format.Value());
             const auto result = RasterTools::RenderImage(*pipeline, pixels, converted, nullptr, {});
             if (!result.complete) throw Error(input + ": " + result.error);
             pixels = std::move(converted);
         }
     }
     auto document = Kernel::MakeCounted<Document>();
-    const std::string name = std::filesystem::path(input).stem().string();
+    const std::string name = input == "-" ? std::string() : std::filesystem::path(input).stem().string();
     document->InsertLayer(0,
                           Kernel::Counted<Node>(new RasterNode(name.empty() ? "Background" : name, pixels)));
     SaveDocument(*document, output);
-    std::cout << output << ": new document, raster layer \"" << document->GetLayer(0)->GetName() << "\" "
-              << DescribeSize(*pixels) << '\n';
+    if (!IsQuiet())
+        std::cout << output << ": new document, raster layer \"" << document->GetLayer(0)->GetName() << "\" "
+                  << DescribeSize(*pixels) << '\n';
     return 0;
 }
 
 int RunFilter(const DocArguments& arguments) {
-    if (arguments.positional.size() != 2)
-        throw UsageError("usage: rastertools doc filter DOC FILTER [--PARAM VALUE]... [--live]");
-    const std::string& path = arguments.positional[0];
-    const RasterTools::FilterInfo& filter = RequireFilter(arguments.positional[1]);
-    const auto command = MakeFilterCommand(filter, arguments.live, arguments.options);
+    if (arguments.flags.positional.size() != 2 || !arguments.filter)
+        throw UsageError("usage: rastertools doc filter DOC FILTER [--PARAM VALUE]... [--live] [--device D]");
+    const std::string& path = arguments.flags.positional[0];
+    const RasterTools::FilterInfo& filter = *arguments.filter;
+    const auto command = MakeFilterCommand(filter, arguments.flags.live, arguments.parameters);
     if (!command) throw Error(std::string(filter.name) + ": the command could not be made");
-    if (arguments.force) throw UsageError("--force belongs to doc new");
+    UseDevice(arguments.flags.render.device);
     const Kernel::FileLock lock = LockDocument(path);
     auto document = LoadDocument(path);
 
-    if (arguments.live) {
+    if (arguments.flags.live) {
         auto live = Kernel::CountedCast<RasterDevicePreviewableFilterLayerCommand>(command);
         if (!live) throw Error(std::string(filter.name) + " cannot be the filter of a live filter layer");
         live->SetSelection(document->GetSelection());
@@ -190,8 +242,9 @@ int RunFilter(const DocArguments& arguments) {
                                .layer = node,
                                .index = document->GetLayers().size()});
         SaveDocument(*document, path);
-        std::cout << path << ": live filter layer \"" << node->GetName()
-                  << "\" added on top: " << DescribeFilterCommand(*command) << '\n';
+        if (!IsQuiet())
+            std::cout << path << ": live filter layer \"" << node->GetName()
+                      << "\" added on top: " << DescribeFilterCommand(*command) << '\n';
         return 0;
     }
 
@@ -201,13 +254,19 @@ int RunFilter(const DocArguments& arguments) {
     if (targets.empty()) throw Error(path + ": the document has no raster layer to filter");
     ProgressBar progress(std::string(filter.name));
     PixelEffectOptions options;
-    options.progress = progress.Callback();
+    // The bar covers the filter (nine tenths) and saving the document.
+    options.progress = [&progress](double fraction) { progress.Update(0.9 * fraction); };
     const std::size_t droppedBefore = document->GetDroppedHistoryCount();
     const auto error = ApplyPixelCommand(*document, command, options);
-    progress.Finish();
     if (error) throw Error(path + ": " + *error);
     SaveDocument(*document, path);
+    progress.Update(1.0);
+    progress.Finish();
     const auto& entry = document->GetHistory().back();
+    if (entry.patches.empty() && !IsQuiet())
+        std::cerr << "rastertools: note: " << path << ": " << filter.name
+                  << " with these parameters changes no pixel\n";
+    if (IsQuiet()) return 0;
     std::cout << path << ": " << DescribeFilterCommand(*command);
     if (entry.patches.empty()) std::cout << ", no pixels changed";
     for (const auto& patch : entry.patches)
@@ -221,24 +280,18 @@ int RunFilter(const DocArguments& arguments) {
 }
 
 int RunRender(const DocArguments& arguments) {
-    const auto options = TakeOptions(arguments, "render", {"format", "device", "tile", "threads"});
     RequirePositional(arguments, 2, "render DOC OUTPUT [--format F] [--device D] [--tile N] [--threads N]");
-    const std::string& path = arguments.positional[0];
-    const std::string& output = arguments.positional[1];
-    const auto type = IO::GetFileTypeForExtension(output);
-    if (!type) throw UsageError(output + ": unknown file type (use .png, .jpg, .jpeg, .tif or .tiff)");
+    const auto& flags = arguments.flags;
+    const std::string& path = flags.positional[0];
+    const std::string& output = flags.positional[1];
+    const FileSettings files = CheckFileFlags(flags.files);
+    const IO::FileType outputType = OutputType(output, files);
+    const auto* type = &outputType;
     FlattenOptions flatten;
-    if (options.contains("format")) flatten.format = ParseLayerFormat(options.at("format"));
-    if (options.contains("tile")) flatten.tileSize = ParseTileSize(options.at("tile"));
-    if (options.contains("threads")) flatten.threads = ParseThreadCount(options.at("threads"));
-
-    const DeviceSelection selection =
-        ResolveDeviceSelector(options.contains("device") ? options.at("device") : std::string());
-    const RenderDevice device = FindRenderDevice(selection);
-    if (!device.IsValid()) throw UsageError(device.error);
-    // Live filters pick their device from the process's selection, which --device overrides.
-    if (options.contains("device"))
-        ::setenv(Raster::Hardware::SelectorVariable, selection.selector.c_str(), 1);
+    if (flags.format.Given()) flatten.format = ParseLayerFormat(flags.format.Value());
+    if (flags.render.tile.Given()) flatten.tileSize = ParseTileSize(flags.render.tile.Value());
+    if (flags.render.threads.Given()) flatten.threads = ParseThreadCount(flags.render.threads.Value());
+    const RenderDevice device = UseDevice(flags.render.device);
 
     const auto document = LoadDocument(path);
     if (!flatten.format) {
@@ -256,25 +309,30 @@ int RunRender(const DocArguments& arguments) {
                     std::string(Raster::GetPixelFormatName(IO::GetWritableFormat(*type, *flatten.format))) +
                     ")");
     }
+    // The bar covers rendering (nine tenths) and writing.
     ProgressBar progress("render");
-    flatten.progress = progress.Callback();
+    flatten.progress = [&progress](double fraction) { progress.Update(0.9 * fraction); };
     const FlattenResult result = FlattenDocument(*document, flatten);
+    if (!result.image) {
+        progress.Finish();
+        throw Error(path + ": " + result.error);
+    }
+    WriteOutput(output, outputType, *result.image, files);
+    progress.Update(1.0);
     progress.Finish();
     for (const auto& warning : result.warnings)
-        std::cerr << "rastertools: warning: " << path << ": " << warning << '\n';
-    if (!result.image) throw Error(path + ": " + result.error);
-    const IO::WriteResult written = IO::WriteImage(output, *result.image);
-    if (!written) throw Error(written.error);
-    std::cout << output << ": " << DescribeSize(*result.image) << " from " << document->GetLayers().size()
-              << " layers, live filters on "
-              << (device.device ? device.device->GetIdentifier() : std::string("the processor")) << '\n';
+        if (!IsQuiet()) std::cerr << "rastertools: warning: " << path << ": " << warning << '\n';
+    if (!IsQuiet())
+        (output == "-" ? std::cerr : std::cout)
+            << output << ": " << DescribeSize(*result.image) << " from " << document->GetLayers().size()
+            << " layers, live filters on "
+            << (device.device ? device.device->GetIdentifier() : std::string("the processor")) << '\n';
     return 0;
 }
 
 int RunShow(const DocArguments& arguments) {
-    TakeOptions(arguments, "show", {});
     RequirePositional(arguments, 1, "show DOC");
-    const std::string& path = arguments.positional[0];
+    const std::string& path = arguments.flags.positional[0];
     const auto document = LoadDocument(path);
     const auto& layers = document->GetLayers();
     const auto& selection = document->GetSelection();
@@ -334,16 +392,16 @@ int RunShow(const DocArguments& arguments) {
 
 int RunUndoRedo(const DocArguments& arguments, bool undo) {
     const std::string verb = undo ? "undo" : "redo";
-    TakeOptions(arguments, verb, {});
     RequirePositional(arguments, 1, verb + " DOC");
-    const std::string& path = arguments.positional[0];
+    const std::string& path = arguments.flags.positional[0];
     const Kernel::FileLock lock = LockDocument(path);
     auto document = LoadDocument(path);
     if (!(undo ? document->Undo() : document->Redo())) throw Error(path + ": nothing to " + verb);
     SaveDocument(*document, path);
     const auto& entry =
         document->GetHistory()[undo ? document->GetHistoryCursor() : document->GetHistoryCursor() - 1];
-    std::cout << path << ": " << verb << " " << entry.command->GetDescription().Localise() << '\n';
+    if (!IsQuiet())
+        std::cout << path << ": " << verb << " " << entry.command->GetDescription().Localise() << '\n';
     return 0;
 }
 
@@ -358,14 +416,21 @@ Kernel::FileLock LockDocument(const std::string& path) {
 int RunDoc(const std::vector<std::string>& args) {
     if (args.empty()) throw UsageError(std::string(kDocUsage));
     const std::string& subcommand = args.front();
-    const DocArguments arguments = SplitArguments({args.begin() + 1, args.end()});
+    if (subcommand == "--help" || subcommand == "-h") {
+        std::cout << CommandHelp("doc");
+        return 0;
+    }
+    if (std::find(std::begin(kDocSubcommands), std::end(kDocSubcommands), subcommand) ==
+        std::end(kDocSubcommands))
+        throw UsageError("unknown doc subcommand " + QuoteExcerpt(subcommand) +
+                         " (new, filter, render, show, undo, redo)");
+    const DocArguments arguments = ParseDoc(subcommand, {args.begin() + 1, args.end()});
+    if (arguments.help) return 0;
     if (subcommand == "new") return RunNew(arguments);
     if (subcommand == "filter") return RunFilter(arguments);
     if (subcommand == "render") return RunRender(arguments);
     if (subcommand == "show") return RunShow(arguments);
-    if (subcommand == "undo") return RunUndoRedo(arguments, true);
-    if (subcommand == "redo") return RunUndoRedo(arguments, false);
-    throw UsageError("unknown doc subcommand \"" + subcommand + "\" (new, filter, render, show, undo, redo)");
+    return RunUndoRedo(arguments, subcommand == "undo");
 }
 
 } // namespace App

@@ -1,5 +1,6 @@
 // rastertools list: what the library registered with the host, read back from the host's registries.
 
+#include "app/FilterArguments.h"
 #include "app/Options.h"
 #include "filters/Catalogue.h"
 #include "host/document/DocumentController.h"
@@ -76,7 +77,7 @@ int RunList(const std::vector<std::string>& args) {
             << info->toolClass << "  tool id " << int(tool->GetToolID()) << "  name " << info->name << '\n';
         PrintCommand(out, *info);
         out << "    " << std::left << std::setw(12) << "parameter" << std::setw(6) << "id" << std::setw(14)
-            << "label" << std::setw(12) << "type" << std::setw(14) << "range" << std::setw(32)
+            << "label" << std::setw(12) << "type" << std::setw(20) << "range" << std::setw(32)
             << "settings key" << std::setw(9) << "default"
             << "serialised\n";
         const auto reflecteds = tool->EnumerateReflecteds();
@@ -85,16 +86,20 @@ int RunList(const std::vector<std::string>& args) {
             for (const auto& property : reflecteds)
                 if (property->GetIdentifier() == spec.reflected) {
                     type = property->GetTypeName();
-                    range = property->DescribeRange();
-                    if (range.starts_with("range=")) range = range.substr(6);
+                    if (!property->DescribeRange().empty()) {
+                        // In the units the command line takes (degrees, percent), as the help shows them.
+                        const ShownParameter shown = GetShownParameter(spec);
+                        range = FormatShownNumber(shown.displayMinimum) + ".." +
+                                FormatShownNumber(shown.displayMaximum) + UnitSuffix(shown.unit);
+                    }
                 }
             const std::string key = spec.persisted ? RasterTools::SettingsKey(info->name, spec) : "-";
-            out << "    " << std::setw(12) << spec.name << std::setw(6)
+            out << "    " << std::setw(12) << GetShownParameter(spec).flag << std::setw(6)
                 << Kernel::FourCCToString(spec.reflected) << std::setw(14)
-                << ("\"" + std::string(spec.toolLabel) + "\"") << std::setw(12) << type << std::setw(14)
+                << ("\"" + std::string(spec.toolLabel) + "\"") << std::setw(12) << type << std::setw(20)
                 << (range.empty() ? "-" : range) << std::setw(32) << key << std::setw(9)
-                << RasterTools::FormatParameterValue(spec.defaultValue) << '"'
-                << Kernel::FourCCToString(spec.code) << "\":" << TagName(spec) << '\n';
+                << FormatShownValue(spec, spec.defaultValue) << '"' << Kernel::FourCCToString(spec.code)
+                << "\":" << TagName(spec) << '\n';
         }
     }
     // Commands without a tool of their own.

@@ -3,6 +3,7 @@
 
 #include "host/kernel/AtomicFile.h"
 
+#include <filesystem>
 #include <iosfwd>
 #include <stdexcept>
 #include <string>
@@ -43,6 +44,7 @@ struct PlayOptions {
     bool filesAllowed = true;
     int width = 1024;
     int height = 768;
+    std::filesystem::path folder; // where the script's file names are taken from; empty: the working folder
 };
 // Runs a play script read from in, writing what the host sees to out; name labels the errors.
 void PlayScript(std::istream& in, std::ostream& out, const std::string& name,

@@ -13,6 +13,7 @@
 
 #include <charconv>
 #include <cmath>
+#include <filesystem>
 #include <iostream>
 #include <sstream>
 
@@ -49,7 +50,8 @@ class PlaySession {
 public:
     PlaySession(std::ostream& out, const PlayOptions& options)
         : m_Out(out)
-        , m_FilesAllowed(options.filesAllowed) {
+        , m_FilesAllowed(options.filesAllowed)
+        , m_Folder(options.folder) {
         auto document = Kernel::MakeCounted<Document>();
         document->InsertLayer(
             0, Kernel::Counted<Node>(new RasterNode("Background", options.width, options.height)));
@@ -119,19 +121,21 @@ public:
         } else if (verb == "save") {
             arguments(1, 1, "save FILE");
             // Not in the middle of another command's change to the same document.
-            const Kernel::FileLock lock = LockDocument(words[1]);
-            if (auto error = DocumentFile::Save(*m_Controller->GetDocument(), words[1]))
+            const std::string path = InFolder(words[1], true);
+            const Kernel::FileLock lock = LockDocument(path);
+            if (auto error = DocumentFile::Save(*m_Controller->GetDocument(), path))
                 throw ScriptError(*error);
             m_Out << "  saved " << words[1] << '\n';
         } else if (verb == "load") {
             arguments(1, 1, "load FILE");
             Kernel::Counted<Document> document;
-            if (auto error = DocumentFile::Load(words[1], document)) throw ScriptError(*error);
+            if (auto error = DocumentFile::Load(InFolder(words[1], false), document))
+                throw ScriptError(*error);
             m_Controller->SetDocument(document);
             m_Out << "  loaded " << words[1] << '\n';
         } else if (verb == "render") {
             arguments(1, 1, "render OUTPUT");
-            Render(words[1]);
+            Render(InFolder(words[1], true));
         } else {
             throw ScriptError("unknown verb " + QuoteExcerpt(verb) + " (verbs: " + std::string(kVerbs) + ")");
         }
@@ -182,12 +186,41 @@ private:
         throw ScriptError("the tool has no property " + QuoteExcerpt(id) + " (properties: " + known + ")");
     }
 
+    // The catalogue's entry for a property of the current tool, where it has one.
+    const RasterTools::ParameterSpec* FindSpec(Kernel::FourCC identifier) const {
+        if (m_Filter)
+            for (const auto& spec : m_Filter->parameters)
+                if (spec.reflected == identifier) return &spec;
+        return nullptr;
+    }
+
+    // A property's value as people read it: in the units the command line takes.
+    std::string ShownValue(const Kernel::Reflected& property) const {
+        const std::string text = property.GetValueText();
+        const RasterTools::ParameterSpec* spec = FindSpec(property.GetIdentifier());
+        if (!spec) return text;
+        const auto value = RasterTools::ParseParameterValue(spec->type, text);
+        return value ? FormatShownValue(*spec, *value) : text;
+    }
+
     void SetReflected(const std::string& id, const std::string& value) {
         auto property = FindReflected(id);
-        if (!property->SetValueText(value))
+        // A catalogued parameter is typed in its shown units and checked as apply checks it.
+        if (const RasterTools::ParameterSpec* spec = FindSpec(property->GetIdentifier())) {
+            RasterTools::ParameterValue stored;
+            try {
+                stored = ParseShownValue(*spec, value, id);
+            } catch (const UsageError& error) {
+                throw ScriptError(error.what());
+            }
+            if (!property->SetValueText(RasterTools::FormatParameterValue(stored)))
+                throw ScriptError(QuoteExcerpt(value) + " is not a valid " + property->GetTypeName() +
+                                  " for " + id);
+        } else if (!property->SetValueText(value)) {
             throw ScriptError(QuoteExcerpt(value) + " is not a valid " + property->GetTypeName() + " for " +
                               id);
-        m_Out << "  " << id << "=" << property->GetValueText() << '\n';
+        }
+        m_Out << "  " << id << "=" << ShownValue(*property) << '\n';
         // A panel edit is followed by a fresh preview, as after any change.
         m_Tool->Preview(false);
     }
@@ -207,19 +240,16 @@ private:
         for (std::size_t i = 2; i < words.size(); ++i) {
             const auto equals = words[i].find('=');
             const std::string name = words[i].substr(0, equals);
-            std::size_t index = 0;
-            while (index < info->parameters.size() && info->parameters[index].name != name)
-                ++index;
-            if (equals == std::string::npos || index == info->parameters.size())
+            const RasterTools::ParameterSpec* spec = FindShownParameter(*info, name);
+            if (equals == std::string::npos || !spec)
                 throw ScriptError(QuoteExcerpt(words[i]) + " is not PARAM=VALUE for a parameter of " +
                                   words[1]);
-            auto value =
-                RasterTools::ParseParameterValue(info->parameters[index].type, words[i].substr(equals + 1));
-            if (!value) throw ScriptError(QuoteExcerpt(words[i]) + " has a value that does not parse");
-            const auto& spec = info->parameters[index];
-            if (!RasterTools::IsAcceptedValue(spec, *value))
-                throw ScriptError(name + " " + RasterTools::DescribeAcceptedValues(spec));
-            values[index] = *value;
+            try {
+                values[std::size_t(spec - info->parameters.data())] =
+                    ParseShownValue(*spec, words[i].substr(equals + 1), name);
+            } catch (const UsageError& error) {
+                throw ScriptError(error.what());
+            }
         }
         auto command = info->makeCommand(true, values);
         if (!dynamic_cast<const RasterDevicePreviewableFilterLayerCommand*>(command.Get()))
@@ -233,8 +263,8 @@ private:
         std::string text(info->description);
         const auto values = info->readCommand(command);
         for (std::size_t i = 0; i < values.size(); ++i)
-            text += " " + std::string(info->parameters[i].name) + "=" +
-                    RasterTools::FormatParameterValue(values[i]);
+            text += " " + GetShownParameter(info->parameters[i]).flag + "=" +
+                    FormatShownValue(info->parameters[i], values[i]);
         return text;
     }
 
@@ -269,7 +299,7 @@ private:
             for (const auto& spec : m_Filter->parameters)
                 for (const auto& property : reflecteds)
                     if (property->GetIdentifier() == spec.reflected)
-                        m_Out << spec.name << '=' << property->GetValueText() << '\n';
+                        m_Out << GetShownParameter(spec).flag << '=' << ShownValue(*property) << '\n';
         } else if (what == "hint") {
             m_Out << m_Controller->GetHintline() << '\n';
         } else if (what == "reflected") {
@@ -309,8 +339,20 @@ private:
         }
     }
 
+    // A file named in a script is found beside the script, wherever it is run from; one to be written gets
+    // its folder made.
+    std::string InFolder(const std::string& name, bool forWriting) const {
+        std::filesystem::path path(name);
+        if (path.is_relative() && !m_Folder.empty()) path = m_Folder / path;
+        std::error_code error;
+        if (forWriting && path.has_parent_path())
+            std::filesystem::create_directories(path.parent_path(), error);
+        return path.string();
+    }
+
     std::ostream& m_Out;
     bool m_FilesAllowed;
+    std::filesystem::path m_Folder;
     Kernel::Counted<DocumentController> m_Controller;
     Kernel::Counted<Tool> m_Tool;
     Kernel::Counted<Tool> m_PreviousTool;
@@ -360,7 +402,9 @@ int RunPlay(const std::vector<std::string>& args) {
     std::string text;
     if (auto error = Kernel::ReadWholeFile(name, text, kMaxScriptBytes)) throw Error(*error);
     std::istringstream file(text);
-    PlayScript(file, std::cout, name);
+    PlayOptions options;
+    options.folder = std::filesystem::path(name).parent_path();
+    PlayScript(file, std::cout, name, options);
     return 0;
 }
 

@@ -71,11 +71,11 @@ rastertools_command() {
   local common="--threads $3 --device cpu --quiet"
   case $1 in
   copy) echo "$rastertools apply copy $common $input $2" ;;
-  noise-gaussian) echo "$rastertools apply addnoise --intensity 0.3 --gaussian true $common $input $2" ;;
-  noise-uniform) echo "$rastertools apply addnoise --intensity 0.3 --gaussian false $common $input $2" ;;
+  noise-gaussian) echo "$rastertools apply addnoise --intensity 30 --gaussian true $common $input $2" ;;
+  noise-uniform) echo "$rastertools apply addnoise --intensity 30 --gaussian false $common $input $2" ;;
   # Tiles of 1024: each tile blurs its own rotated strip, so small tiles would repeat the radius's pad rows,
   # and larger ones make longer lines than the caches hold.
-  motionblur-*) echo "$rastertools apply motionblur --radius ${1#motionblur-} --radians 0.5235987755982988 --tile 1024 $common $input $2" ;;
+  motionblur-*) echo "$rastertools apply motionblur --radius ${1#motionblur-} --angle 30 --tile 1024 $common $input $2" ;;
   # The whole image: a circle of half the side about the middle, as ImageMagick's swirl and implode take.
   twirl-90) echo "$rastertools apply twirl --angle 90 --radius $((size / 2)) $common $input $2" ;;
   sphere-50) echo "$rastertools apply sphere --intensity 50 --radius $((size / 2)) $common $input $2" ;;

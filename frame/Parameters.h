@@ -31,6 +31,18 @@ std::string FormatParameterValue(const ParameterValue& value);
 // Parses text as a value of the given type; nothing when it does not parse.
 std::optional<ParameterValue> ParseParameterValue(ParameterType type, std::string_view text);
 
+// How people type and read a value whose stored number is not what they think in (the command line, its
+// help, play scripts): shown = stored x scale, in unit, under the flag name.
+struct ShownAs {
+    std::string_view name{}; // the flag; empty: the parameter's name
+    double scale = 1.0;
+    Kernel::UnitKind unit = Kernel::UnitKind::None; // None: the parameter's own unit
+    // The values offered and accepted, in shown units, where they are narrower than the accepted stored
+    // values (minimum < maximum); otherwise those scaled.
+    double minimum = 0.0;
+    double maximum = 0.0;
+};
+
 // Everything the host contract fixes about one parameter.
 struct ParameterSpec {
     std::string_view name;         // settings-key leaf and command-line flag, e.g. "intensity"
@@ -51,6 +63,7 @@ struct ParameterSpec {
     // to hardMaximum, which keep the work and the arithmetic of a render bounded.
     double hardMaximum = -std::numeric_limits<double>::infinity();
     double hardMinimum = std::numeric_limits<double>::infinity();
+    ShownAs shown{};
 };
 
 // The lowest and highest numbers (a point's coordinates) a parameter accepts from any route: panels, drags,

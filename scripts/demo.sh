@@ -21,14 +21,14 @@ render() { # OUTPUT FILTER [--PARAM VALUE]...
   "$bin" apply "$@" "$photo" "out/$output"
   echo "rendered out/$output"
 }
-render coffee-noise-gaussian.png addnoise --intensity 0.25 --gaussian true
-render coffee-noise-uniform.png addnoise --intensity 0.25 --gaussian false
-render coffee-noise-mono.png addnoise --intensity 0.25 --mono true
-render coffee-noise-rgba16.tif addnoise --intensity 0.25 --format rgba16
+render coffee-noise-gaussian.png addnoise --intensity 25 --gaussian true
+render coffee-noise-uniform.png addnoise --intensity 25 --gaussian false
+render coffee-noise-mono.png addnoise --intensity 25 --mono true
+render coffee-noise-rgba16.tif addnoise --intensity 25 --format rgba16
 render coffee-diffuse.png diffuse --intensity 0.02
 render coffee-edges.png verticaledgedetect
 render coffee-unsharpmask.png unsharpmask --radius 9 --factor 1 --threshold 0.02
-render coffee-motionblur.png motionblur --radius 20 --radians 0.5
+render coffee-motionblur.png motionblur --radius 20 --angle 30
 render coffee-twirl.png twirl --angle 90 --radius 200
 render coffee-sphere.png sphere --intensity 50 --radius 200
 render coffee-texture-rings.png proceduraltexture --eq 'rgb=fract(hypot(rx, ry) / 24)' --eq 'a=1' --origin 300,200
@@ -37,8 +37,8 @@ render coffee-texture-marble.png proceduraltexture --preset 3 --opacity 0.6
 # A document: the photo as a layer, noise applied to its pixels, then a live noise layer on top.
 doc=out/coffee.rtd
 "$bin" doc new "$photo" -o "$doc"
-"$bin" doc filter "$doc" addnoise --intensity 0.1 --mono true
-"$bin" doc filter "$doc" addnoise --intensity 0.2 --live
+"$bin" doc filter "$doc" addnoise --intensity 10 --mono true
+"$bin" doc filter "$doc" addnoise --intensity 20 --live
 "$bin" doc render "$doc" out/coffee-document.png
 "$bin" doc show "$doc" | tee out/coffee-document.txt
 

@@ -7,7 +7,7 @@ packages=(
   build-essential cmake ninja-build ccache pkg-config clang libclang-rt-dev clang-format
   libgtest-dev libgmock-dev libbenchmark-dev
   nlohmann-json3-dev libzstd-dev
-  libpng-dev libjpeg-dev libtiff-dev liblcms2-dev libtbb-dev
+  libpng-dev libjpeg-dev libtiff-dev liblcms2-dev libtbb-dev libcli11-dev
   ocl-icd-opencl-dev opencl-headers pocl-opencl-icd clinfo
 )
 

@@ -61,7 +61,13 @@ struct MotionBlurFilter {
           .defaultValue = 0.0,
           // Any direction, however written; far beyond these a double no longer tells one from the next.
           .hardMaximum = 1e6,
-          .hardMinimum = -1e6},
+          .hardMinimum = -1e6,
+          // Every angle people type is in degrees; a turn either way covers every direction.
+          .shown = {.name = "angle",
+                    .scale = 57.295779513082323, // 180 / pi
+                    .unit = Kernel::UnitKind::Degrees,
+                    .minimum = -360.0,
+                    .maximum = 360.0}},
          &Params::radians},
     }};
 };

@@ -48,7 +48,9 @@ struct AddNoiseFilter {
           .commandLabel = "Intensity",
           .minimum = 0.0,
           .maximum = 100.0,
-          .defaultValue = 0.0},
+          .defaultValue = 0.0,
+          // People think of strength in percent: 100 % is a spread of one whole channel range.
+          .shown = {.scale = 100.0, .unit = Kernel::UnitKind::Percent, .minimum = 0.0, .maximum = 100.0}},
          &Params::intensity},
         {{.name = "mono",
           .type = ParameterType::Bool,

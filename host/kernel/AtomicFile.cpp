@@ -2,10 +2,12 @@
 
 #include <algorithm>
 #include <atomic>
+#include <cctype>
 #include <cerrno>
 #include <climits>
 #include <csignal>
 #include <cstring>
+#include <ctime>
 #include <fcntl.h>
 #include <pthread.h>
 #include <sstream>
@@ -71,6 +73,17 @@ void RemoveStaleTemporaries(const std::filesystem::path& path) {
         const std::string name = it->path().filename().string();
         if (!name.starts_with(prefix)) continue;
         const std::string rest = name.substr(prefix.size()); // PID.XXXXXX
+        // Earlier builds named temporaries ".NAME.XXXXXX", without the writer's process: such a file that
+        // nobody has touched for ten minutes is a killed writer's.
+        if (rest.size() == 6 && std::all_of(rest.begin(), rest.end(), [](char c) {
+                return std::isalnum(static_cast<unsigned char>(c));
+            })) {
+            struct stat old {};
+            if (::lstat(it->path().c_str(), &old) == 0 && S_ISREG(old.st_mode) &&
+                ::time(nullptr) - old.st_mtime > 600)
+                ::unlink(it->path().c_str());
+            continue;
+        }
         const std::size_t dot = rest.find('.');
         if (dot == 0 || dot == std::string::npos || rest.size() - dot - 1 != 6 || dot > 9 ||
             rest.find_first_not_of("0123456789") != dot)

@@ -23,7 +23,8 @@ TEST_F(CommandLine, APlayedSessionCommitsToTheSettingsFile) {
     const Result result = Run("play session.play");
     ASSERT_EQ(result.exitCode, 0) << result.output;
     EXPECT_TRUE(Contains(result.output, "1. Unsharp Mask radius=5 factor=2 threshold=0")) << result.output;
-    EXPECT_TRUE(Contains(result.output, "intensity=1\nmono=false\ngaussian=false")) << result.output;
+    // 512 units of drag at 1/512 a unit store intensity 1, a spread of the whole channel: 100 percent.
+    EXPECT_TRUE(Contains(result.output, "intensity=100\nmono=false\ngaussian=false")) << result.output;
     const std::string settings = Settings();
     EXPECT_TRUE(Contains(settings, "\"tools.unsharpmask.radius\": 5.0")) << settings;
     EXPECT_TRUE(Contains(settings, "\"tools.unsharpmask.factor\": 2.0")) << settings;
@@ -43,7 +44,8 @@ TEST_F(CommandLine, ScriptErrorsNameTheLineAndFail) {
         {"start\n", "session.play:1: no tool chosen"},
         {"tool addnoise\n\n# only a comment\ndrag 0,0\n", "session.play:4: usage: drag X0,Y0 X1,Y1 [STEPS]"},
         {"tool addnoise\nclick here\n", "session.play:2: \"here\" is not a point"},
-        {"tool addnoise\nset inte lots\n", "session.play:2: \"lots\" is not a valid unit-range for inte"},
+        {"tool addnoise\nset inte lots\n", "session.play:2: inte: \"lots\" is not a number"},
+        {"tool addnoise\nset inte 101\n", "session.play:2: inte must lie within 0 .. 100 %"},
         {"tool addnoise\nset xxxx 1\n", "session.play:2: the tool has no property \"xxxx\""},
         {"select-live 0\n", "session.play:1: layer 0 is not a live filter layer"},
         {"select 7\n", "session.play:1: \"7\" is not a layer index (0 to 0)"},

@@ -138,9 +138,10 @@ Kernel::Counted<HardwareDevice> SelectHardwareDevice(const HardwareDeviceList& d
     case HardwareSelector::Choice::Cpu:
         return {};
     case HardwareSelector::Choice::Auto:
+        // An OpenCL device that runs on the processor is slower than the processor path it would replace
+        // (kernels compiled at run time, buffers copied): only a GPU is worth choosing unasked.
         if (auto cuda = first(HardwareBackEnd::Cuda, HardwareDeviceKind::Gpu)) return cuda;
-        if (auto gpu = first(HardwareBackEnd::OpenCL, HardwareDeviceKind::Gpu)) return gpu;
-        return first(HardwareBackEnd::OpenCL, HardwareDeviceKind::Cpu);
+        return first(HardwareBackEnd::OpenCL, HardwareDeviceKind::Gpu);
     case HardwareSelector::Choice::OpenCL:
         return selector.index ? nth(HardwareBackEnd::OpenCL, *selector.index)
                               : gpuThenAny(HardwareBackEnd::OpenCL);

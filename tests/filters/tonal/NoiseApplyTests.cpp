@@ -75,8 +75,8 @@ TEST_F(ApplyNoise, DeviceAndTilesGiveIdenticalFilesInEveryFormat) {
     WriteInput("in.png");
     const bool opencl = Run("apply addnoise --device opencl in.png probe.tif").exitCode == 0;
     for (const char* format : {"rgba8", "rgba16", "rgbauf", "ia8", "ia16", "cmyka8", "laba16"}) {
-        for (const char* kind : {"--intensity 0.3 --mono false --gaussian true",
-                                 "--intensity 0.3 --mono true --gaussian false"}) {
+        for (const char* kind : {"--intensity 30 --mono false --gaussian true",
+                                 "--intensity 30 --mono true --gaussian false"}) {
             const std::string common = std::string("apply addnoise ") + kind + " --format " + format + " ";
             const Result reference = Run(common + "--device cpu --tile 512 in.png cpu512.tif");
             ASSERT_EQ(reference.exitCode, 0) << reference.output;

@@ -43,7 +43,7 @@ TEST(DeviceSelector, RefusesUnknownWordsAndMalformedIndices) {
         EXPECT_EQ(ParseHardwareSelector(text), std::nullopt) << "'" << text << "'";
 }
 
-TEST(DeviceSelector, AutoPrefersCudaThenOpenCLGpuThenOpenCLCpu) {
+TEST(DeviceSelector, AutoPrefersCudaThenOpenCLGpuAndNeverAProcessorDevice) {
     const auto oclCpu = Describing("opencl:0.0", HardwareBackEnd::OpenCL, HardwareDeviceKind::Cpu);
     const auto oclGpu = Describing("opencl:1.0", HardwareBackEnd::OpenCL, HardwareDeviceKind::Gpu);
     const auto oclGpu2 = Describing("opencl:1.1", HardwareBackEnd::OpenCL, HardwareDeviceKind::Gpu);
@@ -64,7 +64,7 @@ TEST(DeviceSelector, AutoPrefersCudaThenOpenCLGpuThenOpenCLCpu) {
     const HardwareDeviceList noCuda{oclCpu, oclGpu};
     EXPECT_EQ(Picked(noCuda, "auto"), "opencl:1.0");
     EXPECT_EQ(Picked(noCuda, "cuda"), "none");
-    EXPECT_EQ(Picked({oclCpu}, "auto"), "opencl:0.0");
+    EXPECT_EQ(Picked({oclCpu}, "auto"), "none") << "the processor path beats OpenCL on the processor";
     EXPECT_EQ(Picked({oclCpu}, "opencl"), "opencl:0.0");
     EXPECT_EQ(Picked({}, "auto"), "none");
 }
@@ -136,10 +136,9 @@ TEST(DeviceEnumeration, FindsTheOpenCLCpuDevice) {
     REQUIRE_OPENCL_DEVICE(device);
     EXPECT_EQ(device->GetBackEnd(), HardwareBackEnd::OpenCL);
     EXPECT_EQ(device->GetLanguage(), HardwareKernelLanguage::OpenCLC);
-    // Without a CUDA device, auto falls back to the OpenCL device.
-    const bool hasCuda = Hardware::GetDevice("cuda") != nullptr;
-    if (!hasCuda) {
-        EXPECT_EQ(Hardware::GetDevice("auto"), device);
+    // Auto takes an OpenCL device only when it is a GPU.
+    if (device->GetKind() == HardwareDeviceKind::Cpu && Hardware::GetDevice("cuda") == nullptr) {
+        EXPECT_EQ(Hardware::GetDevice("auto"), nullptr);
     }
     std::cout << "[ info     ] OpenCL device: " << device->Describe() << "\n";
 }
