@@ -1,0 +1,76 @@
+#pragma once
+// The lighting Sample stage for the processor and the lighting command's kinds of render: one per layer
+// format, source and destination alike, without or with a mask.
+
+#include "filters/lighting/LightingMath.h"
+#include "pipeline/Conversions.h"
+#include "pipeline/Pipeline.h"
+
+namespace RasterTools {
+
+// Lights the source pixel (read through Transform and Extend, in the working pixel) by LightingMath's model.
+// The layer is its own height map: the luminance of the pixels above, below, left and right of the height
+// position, 0 outside the layer, so that the relief slopes to 0 at the layer's border.
+struct LightingSampler {
+    // The sampler block (see LightingMath's indices): no lights and identity affines by default.
+    struct Params {
+        float block[LightingMath::BlockFloats] = {
+            1.0f, 1.0f, 1.0f, 1.0f, 1.0f,       // ambient colour and amount
+            1.0f, 1.0f, 1.0f, 1.0f, 0.0f,       // specular colour and amount
+            1.0f, 0.0f, 0.0f, 0.0f, 1.0f, 0.0f, // surface affine
+            1.0f, 0.0f, 0.0f, 0.0f, 1.0f, 0.0f, // height-map affine
+            1.0f, 0.0f, 0.0f, 0.0f};            // diffuse, normal z, sense, light count
+    };
+
+    template <class Image>
+    static float HeightAt(const Image& image, Raster::KernelMath::int2 at) noexcept {
+        if (at.x < 0 || at.y < 0 || at.x >= image.GetWidth() || at.y >= image.GetHeight()) return 0.0f;
+        return LightingMath::LightingLuminance(ToWorking<Image::Format>(image.Row(at.y)[at.x]));
+    }
+
+    // One pixel, exactly as the kernel text does it.
+    template <class Transform, class Extend, class Image>
+    static typename Image::Stored Sample(const Image& image, Raster::KernelMath::int2 location,
+                                         const Raster::PreparedTransform<Transform>& t,
+                                         const Params& params) noexcept {
+        using namespace LightingMath;
+        const float* p = params.block;
+        const float2 v = LightingSurface(location, p);
+        float4 n = make_float4(0.0f, 0.0f, 1.0f, 0.0f);
+        if (p[LightingNormalZ] != 0.0f)
+            n = LightingNormal(HeightAt(image, LightingBumpAt(v, 0.0f, -1.0f, p)),
+                               HeightAt(image, LightingBumpAt(v, 0.0f, 1.0f, p)),
+                               HeightAt(image, LightingBumpAt(v, -1.0f, 0.0f, p)),
+                               HeightAt(image, LightingBumpAt(v, 1.0f, 0.0f, p)), p);
+        float4 lit, shine;
+        LightingShade(v, n, p, &lit, &shine);
+        const auto pixel = Extend::Read(image, Raster::TransformPixelCenterToInt<Transform>(location, t));
+        return FromWorking<Image::Format>(LightingLit(ToWorking<Image::Format>(pixel), lit, shine));
+    }
+};
+
+namespace LightingStages {
+
+// Reads beyond the layer are transparent black; the height reads make their own border (0).
+template <Raster::PixelFormat F>
+using Plain = PipelineStages<Raster::Copy, Raster::IdentityMask, LightingSampler, Raster::IdentityTransform,
+                             Raster::Zero, FormatList<F>, FormatList<F>>;
+template <Raster::PixelFormat F>
+using Masked = PipelineStages<Raster::Copy, Raster::BitmapMask, LightingSampler, Raster::IdentityTransform,
+                              Raster::Zero, FormatList<F>, FormatList<F>>;
+
+} // namespace LightingStages
+
+// The sampler's kernel text: per source format and language (null for an unknown language or a format that
+// is not a layer format).
+template <>
+struct StageText<LightingSampler> {
+    static const char* Get(HardwareKernelLanguage language, Raster::PixelFormat source);
+};
+
+} // namespace RasterTools
+
+// One layer format's processor renders.
+#define RT_INSTANTIATE_LIGHTING(Format)                                                                      \
+    RT_INSTANTIATE_PROCESSOR(RasterTools::LightingStages::Plain<Raster::PixelFormat::Format>, Format)        \
+    RT_INSTANTIATE_PROCESSOR(RasterTools::LightingStages::Masked<Raster::PixelFormat::Format>, Format)
