@@ -25,8 +25,6 @@ public:
     // at another pixel density shows the same picture.
     bool GetLooksTerribleWhenPreviewingBecauseOfRetina() const override { return false; }
     bool CanAffectAlpha() const override { return false; }
-    bool CanRequireInflation() const override { return false; }
-    bool CanRepeat() const override { return true; }
 
     // The height map's slopes read the pixels next to each one.
     static double Margin(const LightingParameters&) { return 1.0; }
