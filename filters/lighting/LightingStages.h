@@ -47,6 +47,49 @@ struct LightingSampler {
         const auto pixel = Extend::Read(image, Raster::TransformPixelCenterToInt<Transform>(location, t));
         return FromWorking<Image::Format>(LightingLit(ToWorking<Image::Format>(pixel), lit, shine));
     }
+
+    // Whether both affines are the identity, so that a pixel's height position is its own location.
+    static bool MapsOntoItself(const float* p) noexcept {
+        const float identity[6] = {1.0f, 0.0f, 0.0f, 0.0f, 1.0f, 0.0f};
+        for (int i = 0; i < 6; ++i)
+            if (p[LightingMath::LightingSurfaceAffine + i] != identity[i] ||
+                p[LightingMath::LightingBumpAffine + i] != identity[i])
+                return false;
+        return true;
+    }
+
+    // A span of up to 32 pixels: where the pixels are their own height positions, the heights of the rows
+    // above, at and below are taken once each (every height serves four neighbours), with the same
+    // functions in the same order as Sample, so the pixels are Sample's. Otherwise pixel by pixel.
+    template <class Transform, class Extend, class Image>
+    static void SampleSpan(const Image& image, const Raster::PreparedTransform<Transform>& t,
+                           const Params& params, int x0, int y, int n, typename Image::Stored* out) noexcept {
+        using namespace LightingMath;
+        const float* p = params.block;
+        if (!Raster::IsIdentityTransform<Transform> || !MapsOntoItself(p)) {
+            for (int i = 0; i < n; ++i)
+                out[i] = Sample<Transform, Extend>(image, make_int2(x0 + i, y), t, params);
+            return;
+        }
+        constexpr int Span = Raster::SpanLength;
+        const bool relief = p[LightingNormalZ] != 0.0f;
+        float heights[3][Span + 2];
+        if (relief)
+            for (int r = 0; r < 3; ++r)
+                for (int i = 0; i < n + 2; ++i)
+                    heights[r][i] = HeightAt(image, make_int2(x0 - 1 + i, y - 1 + r));
+        for (int i = 0; i < n; ++i) {
+            const int2 location = make_int2(x0 + i, y);
+            const float2 v = LightingSurface(location, p);
+            const float4 n4 = relief ? LightingNormal(heights[0][i + 1], heights[2][i + 1], heights[1][i],
+                                                      heights[1][i + 2], p)
+                                     : make_float4(0.0f, 0.0f, 1.0f, 0.0f);
+            float4 lit, shine;
+            LightingShade(v, n4, p, &lit, &shine);
+            const auto pixel = Extend::Read(image, location);
+            out[i] = FromWorking<Image::Format>(LightingLit(ToWorking<Image::Format>(pixel), lit, shine));
+        }
+    }
 };
 
 namespace LightingStages {
