@@ -2,6 +2,7 @@
 // The lighting command: lights the layer's colour with a spot, point or directional light over the relief of
 // its own luminance (Phong's diffuse and specular terms plus ambient light); alpha stays.
 
+#include "filters/distort/DistortPlacement.h"
 #include "filters/lighting/Lighting.h"
 #include "filters/lighting/LightingStages.h"
 #include "frame/SinglePassCommand.h"
@@ -25,6 +26,33 @@ public:
     // at another pixel density shows the same picture.
     bool GetLooksTerribleWhenPreviewingBecauseOfRetina() const override { return false; }
     bool CanAffectAlpha() const override { return false; }
+
+    // Document coordinates; not numbers when unset (see UnsetLightCentre).
+    Kernel::PointT<double> GetCentre() const noexcept { return m_Params.centre; }
+    double GetDistance() const noexcept { return m_Params.distance; }
+
+    // The layer was transformed by transform: the light's centre moves with it and its distance scales by
+    // the transform's length scale (an unset centre or distance stays unset).
+    void ApplyTransform(const Raster::AffineTransform::Params& transform) {
+        Distort::TransformCircle(m_Params.centre, m_Params.distance, transform, false);
+        BoundParameters(m_Params, LightingFilter::kParameters);
+    }
+    // The converse, e.g. from document coordinates into a layer's own pixels; false, changing nothing, for a
+    // singular transform.
+    bool ApplyInverseTransform(const Raster::AffineTransform::Params& transform) {
+        const bool applied = Distort::TransformCircle(m_Params.centre, m_Params.distance, transform, true);
+        BoundParameters(m_Params, LightingFilter::kParameters);
+        return applied;
+    }
+
+    // The whole raster (cut to the selection) on the processor, with the light carried into the layer's
+    // pixels.
+    Kernel::RectT<int> DoEffect(Kernel::NonCounted<MutableRasterInterface> raster) const override {
+        if (!raster) return {};
+        const Kernel::Counted<RasterLightingCommand> local(new RasterLightingCommand(false, m_Params));
+        if (!local->ApplyInverseTransform(raster->GetTransform())) return {};
+        return local->RenderDirectly(*raster);
+    }
 
     // The height map's slopes read the pixels next to each one.
     static double Margin(const LightingParameters&) { return 1.0; }

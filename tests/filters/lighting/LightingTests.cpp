@@ -241,6 +241,30 @@ TEST(LightingValues, TheReliefSlopesToZeroAtTheLayersBorder) {
     EXPECT_EQ(ReadComponents(*out, 0, 3)[3], 1.0);            // alpha stays
 }
 
+TEST(LightingPlacement, TheLightMovesAndScalesWithTheLayersTransformAndBack) {
+    LightingParameters params;
+    params.centre = {10.0, 5.0};
+    params.distance = 20.0;
+    const auto command = Make(params);
+    Raster::AffineTransform::Params layer;
+    layer.m = {2.0, 0.0, 3.0, 0.0, 2.0, 4.0};
+    command->ApplyTransform(layer);
+    EXPECT_EQ(command->GetCentre(), (Kernel::PointT<double>{23.0, 14.0}));
+    EXPECT_EQ(command->GetDistance(), 40.0);
+    EXPECT_TRUE(command->ApplyInverseTransform(layer));
+    EXPECT_EQ(command->GetCentre(), (Kernel::PointT<double>{10.0, 5.0}));
+    EXPECT_EQ(command->GetDistance(), 20.0);
+    // Unset stays unset; a singular map changes nothing.
+    const auto unset = Make(LightingParameters{});
+    unset->ApplyTransform(layer);
+    EXPECT_TRUE(std::isnan(unset->GetCentre().x));
+    EXPECT_EQ(unset->GetDistance(), 0.0);
+    Raster::AffineTransform::Params singular;
+    singular.m = {0.0, 0.0, 1.0, 0.0, 0.0, 1.0};
+    EXPECT_FALSE(command->ApplyInverseTransform(singular));
+    EXPECT_EQ(command->GetCentre(), (Kernel::PointT<double>{10.0, 5.0}));
+}
+
 TEST(LightingHostile, ParametersNoPanelWouldGiveAreBoundedAndRenderFinitePixels) {
     const double nan = std::numeric_limits<double>::quiet_NaN(),
                  inf = std::numeric_limits<double>::infinity();
