@@ -18,6 +18,7 @@ work=${WORK:-${TMPDIR:-/tmp}/rastertools-peers}
 size=4096
 OPERATIONS=(noise-gaussian noise-uniform diffuse edge twirl-90 sphere-50)
 OPERATIONS+=(motionblur-10 motionblur-50 motionblur-200)
+OPERATIONS+=(lighting-directional lighting-spot)
 [ $# -gt 0 ] && OPERATIONS=("$@")
 
 # ---- Peers from Debian
@@ -81,6 +82,9 @@ rastertools_command() {
   # Up to 512 × 0.01 = 5 pixels, as far as -spread 5.
   diffuse) echo "$rastertools apply diffuse --intensity 0.01 $common $input $2" ;;
   edge) echo "$rastertools apply verticaledgedetect $common $input $2" ;;
+  # One light; the spot over the relief of the image's own luminance, as the peers' shading takes it.
+  lighting-directional) echo "$rastertools apply lighting --light 2 $common $input $2" ;;
+  lighting-spot) echo "$rastertools apply lighting --light 0 --depth 5 --outercone 60 $common $input $2" ;;
   esac
 }
 imagemagick_command() {
@@ -94,6 +98,8 @@ imagemagick_command() {
   sphere-50) echo "/usr/bin/convert $common $input -implode -0.5 -compress none $2" ;;
   diffuse) echo "/usr/bin/convert $common $input -spread 5 -compress none $2" ;;
   edge) echo "/usr/bin/convert $common $input -morphology Convolve '3x3: -1,0,1 -2,0,2 -1,0,1' -compress none $2" ;;
+  # A distant light over the image's intensity as relief.
+  lighting-*) echo "/usr/bin/convert $common $input -shade 135x30 -compress none $2" ;;
   esac
 }
 vips_command() {
@@ -118,6 +124,8 @@ gegl_command() {
   twirl-90) echo "$env gegl -i $input -o $2 -- gegl:whirl-pinch whirl=90 pinch=0 radius=1" ;;
   sphere-50) echo "$env gegl -i $input -o $2 -- gegl:spherize amount=0.5" ;;
   diffuse) echo "$env gegl -i $input -o $2 -- gegl:noise-spread amount-x=5 amount-y=5" ;;
+  # A distant light over the image's own relief (the image again as the height map).
+  lighting-*) echo "$env gegl -i $input -o $2 -- gegl:bump-map azimuth=135 elevation=30 depth=5 aux=[ gegl:load path=$input ]" ;;
   esac
 }
 # TOOLS (default all four) picks the tools, e.g. TOOLS="rastertools vips" to leave out the slowest.

@@ -42,8 +42,14 @@
 // moved by (dx, dy), each coordinate truncated toward zero.
 // LightingNormal: from the heights above, below, left and right of the height-map position, the unit normal
 // (x, y, z in a float4, w unused); with the normal z of 0 (no relief) the flat (0, 0, 1).
-// LightingShade: every light's diffuse and specular terms accumulated in light order, scaled by the amounts,
-// with the ambient colour added to the diffuse; colour components r, g, b, a in float4s.
+// LightingPointTerms (spot and point lights; cone: the spot's) and LightingDirectionalTerms: one light's
+// diffuse term ta, the base rz of its specular power (0 where it has none) and the factor on that power (the
+// spot's attenuation); a flat surface under a directional light takes the light's flat specular term
+// outright (fixed). LightingSpecularTerm: the specular term from those. Every value is chosen by selects, so
+// that a span can take them for many pixels at once.
+// LightingShade: every light's diffuse and specular terms accumulated in light order (unknown types skipped),
+// then LightingFinish: scaled by the amounts, with the ambient colour added to the diffuse; colour components
+// r, g, b, a in float4s.
 // LightingLit: pixel × diffuse + specular in the colour channels, alpha kept.
 // LightingLuminance: the height a working pixel gives when the layer is its own height map (Rec. 709
 // weights of the colour, alpha ignored).
@@ -63,12 +69,12 @@
     RT_LIGHTING_FUNCTION float4 LightingNormal(float above, float below, float left, float right,            \
                                                params_address_space float* p) {                              \
         const float nz = p[LightingNormalZ];                                                                 \
-        if (nz == 0.0f) return make_float4(0.0f, 0.0f, 1.0f, 0.0f);                                          \
         const int sense = p[LightingHeightSense] == 1.0f;                                                    \
         const float nx = sense ? left - right : right - left;                                                \
         const float ny = sense ? above - below : below - above;                                              \
         const float scale = 1.0f / RT_LIGHTING_SQRT(nx * nx + ny * ny + nz * nz);                            \
-        return make_float4(nx * scale, ny * scale, nz * scale, 0.0f);                                        \
+        return nz == 0.0f ? make_float4(0.0f, 0.0f, 1.0f, 0.0f)                                              \
+                          : make_float4(nx * scale, ny * scale, nz * scale, 0.0f);                           \
     }                                                                                                        \
     RT_LIGHTING_FUNCTION float LightingPower(float x, float exponent) {                                      \
         int e = rt_sat_int(exponent);                                                                        \
@@ -81,6 +87,55 @@
         }                                                                                                    \
         return result;                                                                                       \
     }                                                                                                        \
+    RT_LIGHTING_FUNCTION float LightingPointTerms(float2 v, float4 n, params_address_space float* light,     \
+                                                  int cone, float* ta, float* rz) {                          \
+        params_address_space float* position = light + LightingLightPosition;                                \
+        params_address_space float* direction = light + LightingLightDirection;                              \
+        const float x = position[0] - v.x;                                                                   \
+        const float y = position[1] - v.y;                                                                   \
+        const float z = -position[2];                                                                        \
+        const float length2 = x * x + y * y + z * z;                                                         \
+        const float scale = 1.0f / RT_LIGHTING_SQRT(length2);                                                \
+        const float lx = x * scale;                                                                          \
+        const float ly = y * scale;                                                                          \
+        const float lz = z * scale;                                                                          \
+        const float dot = -(n.x * lx + n.y * ly + n.z * lz);                                                 \
+        const float dot2 = direction[0] * lx + direction[1] * ly + direction[2] * lz;                        \
+        const float inner = light[LightingInnerThreshold];                                                   \
+        const float outer = light[LightingOuterThreshold];                                                   \
+        const float ramp = dot2 > inner ? 1.0f : dot2 > outer ? (dot2 - outer) / (inner - outer) : 0.0f;     \
+        const float attenuation = length2 > 0.0f && dot > 0.0f ? (cone ? ramp : 1.0f) : 0.0f;                \
+        const int lit = attenuation > 0.0f;                                                                  \
+        *ta = lit ? dot * attenuation : 0.0f;                                                                \
+        *rz = lit ? 2.0f * n.z * dot + lz : 0.0f;                                                            \
+        return attenuation;                                                                                  \
+    }                                                                                                        \
+    RT_LIGHTING_FUNCTION float LightingDirectionalTerms(float4 n, params_address_space float* light,         \
+                                                        float* ta, float* rz, float* fixed) {                \
+        params_address_space float* direction = light + LightingLightDirection;                              \
+        const int flat = n.x == 0.0f && n.y == 0.0f;                                                         \
+        const float dot = -(n.x * direction[0] + n.y * direction[1] + n.z * direction[2]);                   \
+        const int lit = !flat && dot > 0.0f;                                                                 \
+        *ta = flat ? -direction[2] : lit ? dot : 0.0f;                                                       \
+        *rz = lit ? 2.0f * n.z * dot + direction[2] : 0.0f;                                                  \
+        *fixed = flat ? light[LightingFlatSpecular] : 0.0f;                                                  \
+        return 1.0f;                                                                                         \
+    }                                                                                                        \
+    RT_LIGHTING_FUNCTION float LightingSpecularTerm(float rz, float power, float factor, float fixed) {      \
+        return rz > 0.0f ? power * factor : fixed;                                                           \
+    }                                                                                                        \
+    RT_LIGHTING_FUNCTION void LightingFinish(float dr, float dg, float db, float da, float sr, float sg,     \
+                                             float sb, float sa, params_address_space float* p, float4* lit, \
+                                             float4* shine) {                                                \
+        const float kd = p[LightingDiffuseAmount];                                                           \
+        params_address_space float* ac = p + LightingAmbientColour;                                          \
+        const float ka = p[LightingAmbientAmount];                                                           \
+        params_address_space float* sc = p + LightingSpecularColour;                                         \
+        const float ks = p[LightingSpecularAmount];                                                          \
+        *lit = make_float4(dr * kd + ac[0] * ka, dg * kd + ac[1] * ka, db * kd + ac[2] * ka,                 \
+                           da * kd + ac[3] * ka);                                                            \
+        *shine = make_float4(sr * (sc[0] * ks), sg * (sc[1] * ks), sb * (sc[2] * ks), sa * (sc[3] * ks));    \
+    }                                                                                                        \
     RT_LIGHTING_FUNCTION void LightingShade(float2 v, float4 n, params_address_space float* p, float4* lit,  \
                                             float4* shine) {                                                 \
         float dr = 0.0f, dg = 0.0f, db = 0.0f, da = 0.0f;                                                    \
@@ -89,50 +144,14 @@
         for (int i = 0; i < count; ++i) {                                                                    \
             params_address_space float* light = p + LightingFirstLight + LightingLightFloats * i;            \
             const float type = light[LightingLightType];                                                     \
-            params_address_space float* position = light + LightingLightPosition;                            \
-            params_address_space float* direction = light + LightingLightDirection;                          \
-            const float exponent = light[LightingLightExponent];                                             \
+            if (type != 0.0f && type != 1.0f && type != 2.0f) continue;                                      \
             float ta = 0.0f;                                                                                 \
-            float tb = 0.0f;                                                                                 \
-            if (type == 0.0f || type == 1.0f) {                                                              \
-                float lx = position[0] - v.x;                                                                \
-                float ly = position[1] - v.y;                                                                \
-                float lz = -position[2];                                                                     \
-                const float length2 = lx * lx + ly * ly + lz * lz;                                           \
-                if (length2 > 0.0f) {                                                                        \
-                    const float scale = 1.0f / RT_LIGHTING_SQRT(length2);                                    \
-                    lx = lx * scale;                                                                         \
-                    ly = ly * scale;                                                                         \
-                    lz = lz * scale;                                                                         \
-                    const float dot = -(n.x * lx + n.y * ly + n.z * lz);                                     \
-                    float attenuation = dot > 0.0f ? 1.0f : 0.0f;                                            \
-                    if (dot > 0.0f && type == 0.0f) {                                                        \
-                        const float dot2 = direction[0] * lx + direction[1] * ly + direction[2] * lz;        \
-                        const float inner = light[LightingInnerThreshold];                                   \
-                        const float outer = light[LightingOuterThreshold];                                   \
-                        attenuation = dot2 > inner   ? 1.0f                                                  \
-                                      : dot2 > outer ? (dot2 - outer) / (inner - outer)                      \
-                                                     : 0.0f;                                                 \
-                    }                                                                                        \
-                    if (attenuation > 0.0f) {                                                                \
-                        ta = dot * attenuation;                                                              \
-                        const float rz = 2.0f * n.z * dot + lz;                                              \
-                        tb = rz > 0.0f ? LightingPower(rz, exponent) * attenuation : 0.0f;                   \
-                    }                                                                                        \
-                }                                                                                            \
-            } else if (type == 2.0f) {                                                                       \
-                if (n.x == 0.0f && n.y == 0.0f) {                                                            \
-                    ta = -direction[2];                                                                      \
-                    tb = light[LightingFlatSpecular];                                                        \
-                } else {                                                                                     \
-                    const float dot = -(n.x * direction[0] + n.y * direction[1] + n.z * direction[2]);       \
-                    if (dot > 0.0f) {                                                                        \
-                        ta = dot;                                                                            \
-                        const float rz = 2.0f * n.z * dot + direction[2];                                    \
-                        tb = rz > 0.0f ? LightingPower(rz, exponent) : 0.0f;                                 \
-                    }                                                                                        \
-                }                                                                                            \
-            }                                                                                                \
+            float rz = 0.0f;                                                                                 \
+            float fixed = 0.0f;                                                                              \
+            const float factor = type == 2.0f ? LightingDirectionalTerms(n, light, &ta, &rz, &fixed)         \
+                                              : LightingPointTerms(v, n, light, type == 0.0f, &ta, &rz);     \
+            const float tb =                                                                                 \
+                LightingSpecularTerm(rz, LightingPower(rz, light[LightingLightExponent]), factor, fixed);    \
             params_address_space float* c = light + LightingLightColour;                                     \
             dr = dr + c[0] * ta;                                                                             \
             dg = dg + c[1] * ta;                                                                             \
@@ -143,14 +162,7 @@
             sb = sb + c[2] * tb;                                                                             \
             sa = sa + c[3] * tb;                                                                             \
         }                                                                                                    \
-        const float kd = p[LightingDiffuseAmount];                                                           \
-        params_address_space float* ac = p + LightingAmbientColour;                                          \
-        const float ka = p[LightingAmbientAmount];                                                           \
-        params_address_space float* sc = p + LightingSpecularColour;                                         \
-        const float ks = p[LightingSpecularAmount];                                                          \
-        *lit = make_float4(dr * kd + ac[0] * ka, dg * kd + ac[1] * ka, db * kd + ac[2] * ka,                 \
-                           da * kd + ac[3] * ka);                                                            \
-        *shine = make_float4(sr * (sc[0] * ks), sg * (sc[1] * ks), sb * (sc[2] * ks), sa * (sc[3] * ks));    \
+        LightingFinish(dr, dg, db, da, sr, sg, sb, sa, p, lit, shine);                                       \
     }                                                                                                        \
     RT_LIGHTING_FUNCTION float4 LightingLit(float4 pixel, float4 lit, float4 shine) {                        \
         return make_float4(pixel.x * lit.x + shine.x, pixel.y * lit.y + shine.y, pixel.z * lit.z + shine.z,  \

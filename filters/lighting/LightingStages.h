@@ -59,8 +59,9 @@ struct LightingSampler {
     }
 
     // A span of up to 32 pixels: where the pixels are their own height positions, the heights of the rows
-    // above, at and below are taken once each (every height serves four neighbours), with the same
-    // functions in the same order as Sample, so the pixels are Sample's. Otherwise pixel by pixel.
+    // above, at and below are taken once each (every height serves four neighbours) and every step of the
+    // model runs for the whole span at once, so that it vectorises; the same functions in the same order as
+    // Sample's, so the pixels are Sample's. Otherwise pixel by pixel.
     template <class Transform, class Extend, class Image>
     static void SampleSpan(const Image& image, const Raster::PreparedTransform<Transform>& t,
                            const Params& params, int x0, int y, int n, typename Image::Stored* out) noexcept {
@@ -78,15 +79,64 @@ struct LightingSampler {
             for (int r = 0; r < 3; ++r)
                 for (int i = 0; i < n + 2; ++i)
                     heights[r][i] = HeightAt(image, make_int2(x0 - 1 + i, y - 1 + r));
+        // Each step for every pixel of the span at once, light after light, in LightingShade's order.
+        alignas(64) float2 v[Span];
+        alignas(64) float4 normal[Span];
+#pragma omp simd
         for (int i = 0; i < n; ++i) {
-            const int2 location = make_int2(x0 + i, y);
-            const float2 v = LightingSurface(location, p);
-            const float4 n4 = relief ? LightingNormal(heights[0][i + 1], heights[2][i + 1], heights[1][i],
-                                                      heights[1][i + 2], p)
-                                     : make_float4(0.0f, 0.0f, 1.0f, 0.0f);
+            v[i] = LightingSurface(make_int2(x0 + i, y), p);
+            normal[i] = relief ? LightingNormal(heights[0][i + 1], heights[2][i + 1], heights[1][i],
+                                                heights[1][i + 2], p)
+                               : make_float4(0.0f, 0.0f, 1.0f, 0.0f);
+        }
+        alignas(64) float sums[8][Span] = {};
+        const int count = rt_sat_int(p[LightingLightCount]);
+        for (int l = 0; l < count; ++l) {
+            const float* light = p + LightingFirstLight + LightingLightFloats * l;
+            const float type = light[LightingLightType];
+            if (type != 0.0f && type != 1.0f && type != 2.0f) continue;
+            alignas(64) float ta[Span], rz[Span], factor[Span], fixed[Span], power[Span], base[Span];
+            if (type == 2.0f) {
+#pragma omp simd
+                for (int i = 0; i < n; ++i)
+                    factor[i] = LightingDirectionalTerms(normal[i], light, &ta[i], &rz[i], &fixed[i]);
+            } else {
+                const int cone = type == 0.0f;
+#pragma omp simd
+                for (int i = 0; i < n; ++i) {
+                    fixed[i] = 0.0f;
+                    factor[i] = LightingPointTerms(v[i], normal[i], light, cone, &ta[i], &rz[i]);
+                }
+            }
+            // LightingPower's squarings, for every pixel at once.
+            for (int i = 0; i < n; ++i) {
+                power[i] = 1.0f;
+                base[i] = rz[i];
+            }
+            for (int e = rt_sat_int(light[LightingLightExponent]); e > 0; e >>= 1) {
+                if (e & 1)
+#pragma omp simd
+                    for (int i = 0; i < n; ++i)
+                        power[i] = power[i] * base[i];
+#pragma omp simd
+                for (int i = 0; i < n; ++i)
+                    base[i] = base[i] * base[i];
+            }
+            const float* c = light + LightingLightColour;
+#pragma omp simd
+            for (int i = 0; i < n; ++i) {
+                const float tb = LightingSpecularTerm(rz[i], power[i], factor[i], fixed[i]);
+                for (int k = 0; k < 4; ++k) {
+                    sums[k][i] = sums[k][i] + c[k] * ta[i];
+                    sums[4 + k][i] = sums[4 + k][i] + c[k] * tb;
+                }
+            }
+        }
+        for (int i = 0; i < n; ++i) {
             float4 lit, shine;
-            LightingShade(v, n4, p, &lit, &shine);
-            const auto pixel = Extend::Read(image, location);
+            LightingFinish(sums[0][i], sums[1][i], sums[2][i], sums[3][i], sums[4][i], sums[5][i], sums[6][i],
+                           sums[7][i], p, &lit, &shine);
+            const auto pixel = Extend::Read(image, make_int2(x0 + i, y));
             out[i] = FromWorking<Image::Format>(LightingLit(ToWorking<Image::Format>(pixel), lit, shine));
         }
     }
