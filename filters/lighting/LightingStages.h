@@ -6,6 +6,8 @@
 #include "pipeline/Conversions.h"
 #include "pipeline/Pipeline.h"
 
+#include <algorithm>
+
 namespace RasterTools {
 
 // Lights the source pixel (read through Transform and Extend, in the working pixel) by LightingMath's model.
@@ -76,9 +78,23 @@ struct LightingSampler {
         const bool relief = p[LightingNormalZ] != 0.0f;
         float heights[3][Span + 2];
         if (relief)
-            for (int r = 0; r < 3; ++r)
-                for (int i = 0; i < n + 2; ++i)
-                    heights[r][i] = HeightAt(image, make_int2(x0 - 1 + i, y - 1 + r));
+            for (int r = 0; r < 3; ++r) {
+                // HeightAt for a row, in a loop without exits.
+                const int row = y - 1 + r;
+                if (row < 0 || row >= image.GetHeight()) {
+                    std::fill_n(heights[r], n + 2, 0.0f);
+                    continue;
+                }
+                const auto* pixels = image.Row(row);
+                const int width = image.GetWidth();
+#pragma omp simd
+                for (int i = 0; i < n + 2; ++i) {
+                    const int x = x0 - 1 + i;
+                    const bool inside = x >= 0 && x < width;
+                    const float h = LightingLuminance(ToWorking<Image::Format>(pixels[inside ? x : 0]));
+                    heights[r][i] = inside ? h : 0.0f;
+                }
+            }
         // Each step for every pixel of the span at once, light after light, in LightingShade's order.
         alignas(64) float2 v[Span];
         alignas(64) float4 normal[Span];
