@@ -69,12 +69,13 @@
     RT_LIGHTING_FUNCTION float4 LightingNormal(float above, float below, float left, float right,            \
                                                params_address_space float* p) {                              \
         const float nz = p[LightingNormalZ];                                                                 \
-        const int sense = p[LightingHeightSense] == 1.0f;                                                    \
-        const float nx = sense ? left - right : right - left;                                                \
-        const float ny = sense ? above - below : below - above;                                              \
+        const float sign = p[LightingHeightSense] == 1.0f ? -1.0f : 1.0f; /* exact: a - b is -(b - a) */     \
+        const float nx = (right - left) * sign;                                                              \
+        const float ny = (below - above) * sign;                                                             \
         const float scale = 1.0f / RT_LIGHTING_SQRT(nx * nx + ny * ny + nz * nz);                            \
-        return nz == 0.0f ? make_float4(0.0f, 0.0f, 1.0f, 0.0f)                                              \
-                          : make_float4(nx * scale, ny * scale, nz * scale, 0.0f);                           \
+        const int flat = nz == 0.0f;                                                                         \
+        return make_float4(flat ? 0.0f : nx * scale, flat ? 0.0f : ny * scale, flat ? 1.0f : nz * scale,     \
+                           0.0f);                                                                            \
     }                                                                                                        \
     RT_LIGHTING_FUNCTION float LightingPower(float x, float exponent) {                                      \
         int e = rt_sat_int(exponent);                                                                        \
@@ -103,8 +104,9 @@
         const float dot2 = direction[0] * lx + direction[1] * ly + direction[2] * lz;                        \
         const float inner = light[LightingInnerThreshold];                                                   \
         const float outer = light[LightingOuterThreshold];                                                   \
-        const float ramp = dot2 > inner ? 1.0f : dot2 > outer ? (dot2 - outer) / (inner - outer) : 0.0f;     \
-        const float attenuation = length2 > 0.0f && dot > 0.0f ? (cone ? ramp : 1.0f) : 0.0f;                \
+        const float fade = (dot2 - outer) / (inner - outer);                                                 \
+        const float ramp = dot2 > inner ? 1.0f : dot2 > outer ? fade : 0.0f;                                 \
+        const float attenuation = ((length2 > 0.0f) & (dot > 0.0f)) ? (cone ? ramp : 1.0f) : 0.0f;           \
         const int lit = attenuation > 0.0f;                                                                  \
         *ta = lit ? dot * attenuation : 0.0f;                                                                \
         *rz = lit ? 2.0f * n.z * dot + lz : 0.0f;                                                            \
@@ -113,9 +115,9 @@
     RT_LIGHTING_FUNCTION float LightingDirectionalTerms(float4 n, params_address_space float* light,         \
                                                         float* ta, float* rz, float* fixed) {                \
         params_address_space float* direction = light + LightingLightDirection;                              \
-        const int flat = n.x == 0.0f && n.y == 0.0f;                                                         \
+        const int flat = (n.x == 0.0f) & (n.y == 0.0f);                                                      \
         const float dot = -(n.x * direction[0] + n.y * direction[1] + n.z * direction[2]);                   \
-        const int lit = !flat && dot > 0.0f;                                                                 \
+        const int lit = (!flat) & (dot > 0.0f);                                                              \
         *ta = flat ? -direction[2] : lit ? dot : 0.0f;                                                       \
         *rz = lit ? 2.0f * n.z * dot + direction[2] : 0.0f;                                                  \
         *fixed = flat ? light[LightingFlatSpecular] : 0.0f;                                                  \

@@ -99,11 +99,15 @@ struct LightingSampler {
         alignas(64) float2 v[Span];
         alignas(64) float4 normal[Span];
 #pragma omp simd
-        for (int i = 0; i < n; ++i) {
+        for (int i = 0; i < n; ++i)
             v[i] = LightingSurface(make_int2(x0 + i, y), p);
-            normal[i] = relief ? LightingNormal(heights[0][i + 1], heights[2][i + 1], heights[1][i],
-                                                heights[1][i + 2], p)
-                               : make_float4(0.0f, 0.0f, 1.0f, 0.0f);
+        if (relief) {
+#pragma omp simd
+            for (int i = 0; i < n; ++i)
+                normal[i] =
+                    LightingNormal(heights[0][i + 1], heights[2][i + 1], heights[1][i], heights[1][i + 2], p);
+        } else {
+            std::fill_n(normal, n, make_float4(0.0f, 0.0f, 1.0f, 0.0f));
         }
         alignas(64) float sums[8][Span] = {};
         const int count = rt_sat_int(p[LightingLightCount]);
