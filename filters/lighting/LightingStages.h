@@ -152,13 +152,18 @@ struct LightingSampler {
                 }
             }
         }
+        alignas(64) float4 working[Span];
+        for (int i = 0; i < n; ++i)
+            working[i] = ToWorking<Image::Format>(Extend::Read(image, make_int2(x0 + i, y)));
+#pragma omp simd
         for (int i = 0; i < n; ++i) {
             float4 lit, shine;
             LightingFinish(sums[0][i], sums[1][i], sums[2][i], sums[3][i], sums[4][i], sums[5][i], sums[6][i],
                            sums[7][i], p, &lit, &shine);
-            const auto pixel = Extend::Read(image, make_int2(x0 + i, y));
-            out[i] = FromWorking<Image::Format>(LightingLit(ToWorking<Image::Format>(pixel), lit, shine));
+            working[i] = LightingLit(working[i], lit, shine);
         }
+        for (int i = 0; i < n; ++i)
+            out[i] = FromWorking<Image::Format>(working[i]);
     }
 };
 
