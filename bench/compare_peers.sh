@@ -19,6 +19,7 @@ size=4096
 OPERATIONS=(noise-gaussian noise-uniform diffuse edge twirl-90 sphere-50)
 OPERATIONS+=(motionblur-10 motionblur-50 motionblur-200)
 OPERATIONS+=(texture-1 texture-3)
+OPERATIONS+=(lighting-directional lighting-spot)
 [ $# -gt 0 ] && OPERATIONS=("$@")
 
 # ---- Peers from Debian
@@ -85,6 +86,9 @@ rastertools_command() {
   # Procedural textures: R from x alone, and three channels of about fifteen operations with one noise call.
   texture-1) echo "$rastertools apply proceduraltexture --angles rad --eq 'r=sin(x / 20) * 0.5 + 0.5' $common $input $2" ;;
   texture-3) echo "$rastertools apply proceduraltexture --angles rad --eq 'rgb=t = noise(x / 64, y / 64); vec3(fract(x / 37 + t), abs(sin(y / 23 - t * 2)), clamp(x / w * 0.5 + t * 0.5, 0, 1))' $common $input $2" ;;
+  # One light; the spot over the relief of the image's own luminance, as the peers' shading takes it.
+  lighting-directional) echo "$rastertools apply lighting --light 2 $common $input $2" ;;
+  lighting-spot) echo "$rastertools apply lighting --light 0 --depth 5 --outercone 60 $common $input $2" ;;
   esac
 }
 imagemagick_command() {
@@ -102,6 +106,8 @@ imagemagick_command() {
   # about as much per pixel.
   texture-1) echo "/usr/bin/convert $common $input -channel R -fx 'sin((i+0.5)/20)*0.5+0.5' +channel -compress none $2" ;;
   texture-3) echo "/usr/bin/convert $common $input -channel RGB -fx 't=sin((i+0.5)/64+(j+0.5)/64); c==0 ? frac((i+0.5)/37+t) : (c==1 ? abs(sin((j+0.5)/23-t*2)) : min(max((i+0.5)/w*0.5+t*0.5,0),1))' +channel -compress none $2" ;;
+  # A distant light over the image's intensity as relief.
+  lighting-*) echo "/usr/bin/convert $common $input -shade 135x30 -compress none $2" ;;
   esac
 }
 vips_command() {
@@ -129,6 +135,8 @@ gegl_command() {
   twirl-90) echo "$env gegl -i $input -o $2 -- gegl:whirl-pinch whirl=90 pinch=0 radius=1" ;;
   sphere-50) echo "$env gegl -i $input -o $2 -- gegl:spherize amount=0.5" ;;
   diffuse) echo "$env gegl -i $input -o $2 -- gegl:noise-spread amount-x=5 amount-y=5" ;;
+  # A distant light over the image's own relief (the image again as the height map).
+  lighting-*) echo "$env gegl -i $input -o $2 -- gegl:bump-map azimuth=135 elevation=30 depth=5 aux=[ gegl:load path=$input ]" ;;
   esac
 }
 # TOOLS (default all four) picks the tools, e.g. TOOLS="rastertools vips" to leave out the slowest.

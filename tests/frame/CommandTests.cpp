@@ -82,9 +82,13 @@ TEST(CommandSerialisation, EveryFilterRoundTripsThroughTheClassRegistry) {
             case ParameterType::Bool:
                 values.emplace_back(!std::get<bool>(spec.defaultValue));
                 break;
-            case ParameterType::Int:
-                values.emplace_back(std::get<int>(spec.defaultValue) + 3);
+            case ParameterType::Int: {
+                // Three above the default where the range allows, else the end farther from it.
+                const int value = std::get<int>(spec.defaultValue), high = int(HighestValue(spec));
+                const int low = int(LowestValue(spec));
+                values.emplace_back(value + 3 <= high ? value + 3 : high - value >= value - low ? high : low);
                 break;
+            }
             case ParameterType::Point: {
                 const double low = LowestValue(spec), span = HighestValue(spec) - low;
                 values.emplace_back(Kernel::PointT<double>{low + 0.375 * span, low + 0.625 * span});
@@ -264,6 +268,7 @@ TEST(CommandAnswers, EveryRegisteredCommandGivesTheHostContractsAnswers) {
         {"RasterCopyCommand", "RCpy", false, false, false, false, 2},
         {"RasterVerticalEdgeDetectCommand", "RVEd", true, true, false, true, 0},
         {"ProceduralTextureCommand", "PrTx", true, false, false, false, 2},
+        {"RasterLightingCommand", "RLiC", false, true, false, false, 2},
     };
     const auto CodeOf = [](const char* code) {
         return (Kernel::FourCC(std::uint8_t(code[0])) << 24) | (Kernel::FourCC(std::uint8_t(code[1])) << 16) |
