@@ -90,11 +90,10 @@ public:
     void Save(Kernel::OutSerialiser& out) const override;
     bool Load(const Kernel::InSerialiser& in, Kernel::FileStore& store, unsigned short version) override;
 
-private:
-    friend class FilterCommand<ProceduralTextureFilter>; // creates the default-constructed command for
-                                                         // loading
+    // For loading: Load then sets the fields.
     ProceduralTextureCommand();
 
+private:
     // The prepared state for a raster format, made once per command; null for a format without one.
     std::shared_ptr<const State> GetState(Raster::PixelFormat format) const;
     template <class Stages>

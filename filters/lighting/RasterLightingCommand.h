@@ -95,10 +95,10 @@ public:
         params.sampler = GetSamplerParams(bounds, view);
     }
 
-private:
-    friend class FilterCommand<LightingFilter>; // creates the default-constructed command for loading
+    // For loading: Load then sets the fields.
     RasterLightingCommand() = default;
 
+private:
     // The light's fifteen floats: type; colour; position; direction; the spot's cone thresholds; the
     // specular exponent; the flat surface's specular term under a directional light.
     void WriteLight(float* light, const Kernel::RectT<double>& bounds) const {

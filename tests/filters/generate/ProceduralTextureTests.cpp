@@ -375,7 +375,8 @@ TEST(ProceduralTextureCommandForm, SaveAndLoadKeepEverything) {
     out.SaveObject(Kernel::MakeFourCC("CVls"), *config->GetConstantSet().GetConstants()[0]);
     out.SaveType(Kernel::MakeFourCC("BleM"), std::int32_t(99));
     const Kernel::InSerialiser in(out.GetBytes());
-    auto odd = Kernel::CountedCast<ProceduralTextureCommand>(ProceduralTextureCommand::CreateObject());
+    auto odd = Kernel::CountedCast<ProceduralTextureCommand>(
+        ProceduralTextureCommand::GetTypeClassProperties().CreateObject());
     ASSERT_TRUE(odd);
     const int before = odd->GetBlendMode();
     odd->Load(in, store, 1);
