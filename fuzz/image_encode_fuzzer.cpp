@@ -29,7 +29,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     if (std::int64_t(image.GetWidth()) * image.GetHeight() > 1 << 20) return 0;
     for (IO::FileType type : {IO::FileType::PNG, IO::FileType::JPEG, IO::FileType::TIFF}) {
         if (!IO::CanWrite(type, image.GetFormat())) continue;
-        const IO::WriteOptions options{.jpegQuality = 1 + int(size % 100)};
+        const IO::WriteOptions options{.quality = 1 + int(size % 100)};
         const IO::EncodeResult encoded = IO::EncodeImage(image, type, "fuzz", options);
         if (!encoded) std::abort(); // every writable image must encode
         const IO::ReadResult again = IO::DecodeImage(encoded.bytes, "again");
