@@ -96,26 +96,48 @@ EncodeResult EncodeWebp(const Raster::DynamicBuffer& image, std::string_view nam
             std::memcpy(to + std::size_t(x) * std::size_t(channels), row + std::size_t(x) * 4,
                         std::size_t(channels));
     }
-    std::uint8_t* encoded = nullptr;
-    const int stride = width * channels;
-    // Quality 100 asks for every pixel back: the lossless coder.
-    std::size_t length;
-    if (request.quality >= 100)
-        length = request.alpha ? WebPEncodeLosslessRGBA(packed.data(), width, height, stride, &encoded)
-                               : WebPEncodeLosslessRGB(packed.data(), width, height, stride, &encoded);
-    else
-        length = request.alpha
-                     ? WebPEncodeRGBA(packed.data(), width, height, stride, float(request.quality), &encoded)
-                     : WebPEncodeRGB(packed.data(), width, height, stride, float(request.quality), &encoded);
-    if (length == 0 || !encoded) {
-        WebPFree(encoded);
-        result.error = Describe(name, "cannot encode WebP");
+    // Quality 100 asks for every pixel back: the lossless coder, told to keep the colour of transparent
+    // pixels too.
+    WebPConfig config;
+    if (!WebPConfigInit(&config)) {
+        result.error = Describe(name, "cannot encode WebP (library version mismatch)");
         return result;
     }
-    struct Free {
-        std::uint8_t* p;
-        ~Free() { WebPFree(p); }
-    } freeEncoded{encoded};
+    config.quality = float(request.quality);
+    if (request.quality >= 100) {
+        config.lossless = 1;
+        config.exact = 1;
+    }
+    WebPPicture picture;
+    if (!WebPPictureInit(&picture)) {
+        result.error = Describe(name, "cannot encode WebP (library version mismatch)");
+        return result;
+    }
+    picture.use_argb = config.lossless;
+    picture.width = width;
+    picture.height = height;
+    WebPMemoryWriter writer;
+    WebPMemoryWriterInit(&writer);
+    picture.writer = WebPMemoryWrite;
+    picture.custom_ptr = &writer;
+    struct Release {
+        WebPPicture* picture;
+        WebPMemoryWriter* writer;
+        ~Release() {
+            WebPPictureFree(picture);
+            WebPMemoryWriterClear(writer);
+        }
+    } release{&picture, &writer};
+    const int stride = width * channels;
+    const int imported = request.alpha ? WebPPictureImportRGBA(&picture, packed.data(), stride)
+                                       : WebPPictureImportRGB(&picture, packed.data(), stride);
+    if (!imported || !WebPEncode(&config, &picture)) {
+        result.error =
+            Describe(name, "cannot encode WebP (error " + std::to_string(int(picture.error_code)) + ")");
+        return result;
+    }
+    const std::uint8_t* encoded = writer.mem;
+    const std::size_t length = writer.size;
 
     if (request.icc.empty()) {
         if (!AppendBytes(result.bytes, encoded, length)) result.error = Describe(name, "out of memory");

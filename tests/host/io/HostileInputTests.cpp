@@ -577,9 +577,9 @@ TEST(HostileInput, OutputTypeComesFromTheExtensionAndUnknownOnesAreRefused) {
     const auto before = folder.Names();
     IO::WriteResult result = IO::WriteImage(folder / "out.bmp", *image);
     EXPECT_FALSE(result);
-    EXPECT_EQ(result.error,
-              (folder / "out.bmp").string() + ": unknown image file extension \".bmp\"; use .png, .jpg, "
-                                              ".jpeg, .tif, .tiff, .webp, .avif, .heic, .heif or .exr");
+    EXPECT_EQ(result.error, (folder / "out.bmp").string() +
+                                ": unknown image file extension \".bmp\"; use .png, .jpg, "
+                                ".jpeg, .tif, .tiff, .webp, .avif, .heic, .heif or .exr");
     result = IO::WriteImage(folder / "out", *image);
     EXPECT_FALSE(result);
     EXPECT_TRUE(Contains(result.error, "no file extension")) << result.error;
