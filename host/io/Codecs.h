@@ -26,7 +26,7 @@ bool IsOpaque(const Raster::DynamicBuffer& image) noexcept;
 
 // The profile's colour space signature (bytes 16..19: "RGB ", "GRAY", "CMYK", "Lab "), or empty.
 std::string_view GetProfileColourSpace(std::span<const std::byte> profile) noexcept;
-// Whether profile describes pixels of format's kind (RGB, grey or CMYK); Lab and float pixels take none.
+// Whether profile describes pixels of format's kind (RGB, grey or CMYK); Lab pixels take none.
 bool ProfileFits(std::span<const std::byte> profile, Raster::PixelFormat format) noexcept;
 
 // stored turned and mirrored as EXIF/TIFF orientation 1..8 says the stored rows lie; 5..8 swap the sides.

@@ -85,6 +85,7 @@ bool ProfileFits(std::span<const std::byte> profile, PixelFormat format) noexcep
     switch (format) {
     case PixelFormat::RGBA8:
     case PixelFormat::RGBA16:
+    case PixelFormat::RGBAUF:
         return space == "RGB ";
     case PixelFormat::IA8:
     case PixelFormat::IA16:
