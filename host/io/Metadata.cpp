@@ -36,7 +36,7 @@ std::vector<std::byte> EncodeExif(const Exiv2::ExifData& exif, Exiv2::ByteOrder 
 }
 
 // The tags that describe how a TIFF stores its pixels: the encoded file's own must stand, whatever the source
-// image's EXIF said.
+// image's EXIF said; and the TIFF homes of XMP and IPTC.
 bool IsStorageTag(const std::string& key) {
     static const char* const tags[] = {"ImageWidth",
                                        "ImageLength",
@@ -62,7 +62,10 @@ bool IsStorageTag(const std::string& key) {
                                        "SubIFDs",
                                        "JPEGTables",
                                        "YCbCrSubSampling",
-                                       "Orientation"};
+                                       "Orientation",
+                                       "XMLPacket",
+                                       "IPTCNAA",
+                                       "ImageResources"};
     const std::string prefix = "Exif.Image.";
     if (key.compare(0, prefix.size(), prefix) != 0) return false;
     const std::string tag = key.substr(prefix.size());
