@@ -69,11 +69,52 @@ void LimitSizes() {
     });
 }
 
+// OpenEXR allocates each header attribute at the size the file claims before reading it (2 GiB for a
+// 466-byte file), so the headers are walked here first: every attribute must lie within the file. Empty when
+// they do, else the reason.
+std::string CheckHeaders(std::span<const std::byte> data) {
+    if (data.size() < 8) return "no header";
+    const bool multipart = (std::uint8_t(data[5]) & 0x10) != 0; // version field, byte 1: the multi-part flag
+    std::size_t at = 8;
+    auto word = [&](std::string& out) {
+        out.clear();
+        while (at < data.size() && data[at] != std::byte{0} && out.size() < 256)
+            out.push_back(char(data[at++]));
+        if (at >= data.size() || out.size() >= 256) return false;
+        ++at; // the terminating zero
+        return true;
+    };
+    std::string name, type;
+    for (int headers = 0;; ++headers) {
+        for (;;) {
+            if (!word(name)) return "a header runs past the end";
+            if (name.empty()) break; // the end of this header
+            if (!word(type)) return "a header runs past the end";
+            if (data.size() - at < 4) return "a header runs past the end";
+            std::uint32_t size = 0;
+            for (int i = 3; i >= 0; --i)
+                size = (size << 8) | std::uint32_t(data[at + std::size_t(i)]);
+            at += 4;
+            if (size > data.size() - at)
+                return "attribute \"" + name + "\" claims more bytes than the file holds";
+            at += size;
+        }
+        if (!multipart) return {};
+        // Multi-part files list their headers one after another, ended by an empty one.
+        if (at < data.size() && data[at] == std::byte{0}) return {};
+        if (headers > 10000) return "too many parts";
+    }
+}
+
 } // namespace
 
 ReadResult DecodeExr(std::span<const std::byte> data, std::string_view name) {
     ReadResult result;
     LimitSizes();
+    if (std::string reason = CheckHeaders(data); !reason.empty()) {
+        result.error = Describe(name, "truncated or damaged OpenEXR data (" + reason + ")");
+        return result;
+    }
     try {
         MemoryInput input(data);
         Imf::InputFile file(input);

@@ -112,6 +112,7 @@ void ICCManager::DoLABA16ToRGBAFTransform(unsigned char* in, unsigned char* out,
 
 #include <cmath>
 #include <memory>
+#include <thread>
 
 namespace Raster {
 
@@ -394,7 +395,7 @@ Kernel::Counted<DynamicBuffer> ICCManager::ConvertImage(const DynamicBuffer& ima
         }
     }
     Transform transform(cmsCreateTransform(source.profile.get(), source.layout, target.profile.get(),
-                                           target.layout, INTENT_RELATIVE_COLORIMETRIC, cmsFLAGS_NOCACHE | cmsFLAGS_NOOPTIMIZE));
+                                           target.layout, INTENT_RELATIVE_COLORIMETRIC, cmsFLAGS_NOCACHE));
     if (!transform) {
         error = "lcms2 cannot join the two colour profiles";
         return nullptr;
@@ -407,21 +408,44 @@ Kernel::Counted<DynamicBuffer> ICCManager::ConvertImage(const DynamicBuffer& ima
     const int width = image.GetWidth();
     const int inCount = ColourCount(source.formula ? Model::RGB : source.model);
     const int outCount = ColourCount(target.formula ? Model::RGB : target.model);
-    std::vector<float> in(std::size_t(width) * std::size_t(inCount)),
-        out(std::size_t(width) * std::size_t(outCount)), alpha(static_cast<std::size_t>(width));
-    const std::size_t inPixel = std::size_t(image.GetBytesPerPixel()),
-                      outPixel = std::size_t(result->GetBytesPerPixel());
-    for (int y = 0; y < image.GetHeight(); ++y) {
-        const std::byte* row = image.RowBytes(y);
-        for (int x = 0; x < width; ++x)
-            Unpack(from, row + std::size_t(x) * inPixel, source.formula,
-                   &in[std::size_t(x) * std::size_t(inCount)], alpha[std::size_t(x)]);
-        cmsDoTransform(transform.get(), in.data(), out.data(), cmsUInt32Number(width));
-        std::byte* outRow = result->RowBytes(y);
-        for (int x = 0; x < width; ++x)
-            Pack(to, &out[std::size_t(x) * std::size_t(outCount)], alpha[std::size_t(x)], target.formula,
-                 outRow + std::size_t(x) * outPixel);
+    const std::size_t inPixel = std::size_t(image.GetBytesPerPixel());
+    const std::size_t outPixel = std::size_t(result->GetBytesPerPixel());
+    // Rows in bands on every core: one transform without a cache may serve several threads at once.
+    auto convertRows = [&](int first, int last) {
+        std::vector<float> in(std::size_t(width) * std::size_t(inCount));
+        std::vector<float> out(std::size_t(width) * std::size_t(outCount));
+        std::vector<float> alpha(static_cast<std::size_t>(width));
+        for (int y = first; y < last; ++y) {
+            const std::byte* row = image.RowBytes(y);
+            for (int x = 0; x < width; ++x)
+                Unpack(from, row + std::size_t(x) * inPixel, source.formula,
+                       &in[std::size_t(x) * std::size_t(inCount)], alpha[std::size_t(x)]);
+            cmsDoTransform(transform.get(), in.data(), out.data(), cmsUInt32Number(width));
+            std::byte* outRow = result->RowBytes(y);
+            for (int x = 0; x < width; ++x)
+                Pack(to, &out[std::size_t(x) * std::size_t(outCount)], alpha[std::size_t(x)], target.formula,
+                     outRow + std::size_t(x) * outPixel);
+        }
+    };
+    const int height = image.GetHeight();
+    const int bands = std::clamp(int(std::thread::hardware_concurrency()), 1,
+                                 std::max(1, int(std::int64_t(width) * height / 65536)));
+    std::vector<std::thread> threads;
+    try {
+        for (int band = 1; band < bands; ++band)
+            threads.emplace_back(convertRows, height * band / bands, height * (band + 1) / bands);
+    } catch (...) {
+        // Without more threads the rest is converted here.
+        const int done = int(threads.size());
+        for (auto& thread : threads)
+            thread.join();
+        convertRows(0, height / bands);
+        convertRows(height * (done + 1) / bands, height);
+        return result;
     }
+    convertRows(0, height / bands);
+    for (auto& thread : threads)
+        thread.join();
     return result;
 }
 

@@ -270,4 +270,17 @@ TEST(HostileInput, NewTypesRefuseEveryTruncationAndOversizedClaims) {
     const IO::ReadResult exrRead = IO::DecodeImage(hugeExr, "huge.exr");
     EXPECT_FALSE(exrRead.image);
     EXPECT_EQ(exrRead.error.rfind("huge.exr: ", 0), 0u) << exrRead.error;
+    // An attribute of a kind OpenEXR does not know, claiming 1.75 GiB in a file of a few hundred bytes:
+    // OpenEXR would allocate all of it before finding the file short. Refused before.
+    std::vector<std::byte> claims = exr.bytes;
+    const std::string_view text(reinterpret_cast<const char*>(claims.data()), claims.size());
+    const std::size_t at = text.find(std::string_view("compression\0compression\0", 24));
+    ASSERT_NE(at, std::string_view::npos);
+    claims[at] = claims[at + 12] = std::byte('X');
+    claims[at + 24 + 3] = std::byte(0x70);
+    const IO::ReadResult claimsRead = IO::DecodeImage(claims, "claims.exr");
+    EXPECT_FALSE(claimsRead.image);
+    EXPECT_EQ(claimsRead.error,
+              "claims.exr: truncated or damaged OpenEXR data (attribute \"Xompression\" claims "
+              "more bytes than the file holds)");
 }
