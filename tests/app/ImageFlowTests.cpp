@@ -1,6 +1,7 @@
 // What a photographer's files keep through the command line: a wide-gamut picture's profile, its camera
 // metadata and its orientation, through apply and through a document; its Lab from its own profile.
 
+#include "host/document/DocumentFile.h"
 #include "host/io/ImageIO.h"
 #include "host/raster/ICCManager.h"
 #include "tests/app/CommandLineSupport.h"
@@ -19,7 +20,7 @@ using Raster::PixelFormat;
 
 namespace {
 
-std::vector<std::byte> ProPhoto() {
+std::vector<std::byte> MakeProPhoto() {
     const cmsCIExyY white{0.3457, 0.3585, 1.0};
     const cmsCIExyYTRIPLE primaries{{0.7347, 0.2653, 1.0}, {0.1596, 0.8404, 1.0}, {0.0366, 0.0001, 1.0}};
     cmsToneCurve* gamma = cmsBuildGamma(nullptr, 1.8);
@@ -32,6 +33,12 @@ std::vector<std::byte> ProPhoto() {
     cmsSaveProfileToMem(profile, bytes.data(), &size);
     cmsCloseProfile(profile);
     return bytes;
+}
+
+// Made once: a profile records when it was made, so two calls a second apart differ.
+const std::vector<std::byte>& ProPhoto() {
+    static const std::vector<std::byte> profile = MakeProPhoto();
+    return profile;
 }
 
 // A 6 × 4 portrait as a camera stores it: sideways, with Orientation 6, a maker and a copyright.
@@ -110,22 +117,28 @@ TEST_F(ImageFlow, ApplyAndDocumentsKeepProfileMetadataAndOrientation) {
 }
 
 TEST_F(ImageFlow, LabFromATaggedPictureUsesItsProfile) {
-    const Result run = Run("apply copy --format laba16 portrait.png lab.tif --device cpu");
+    // The document's layer is converted by the host on the way in: through the picture's profile.
+    const Result run = Run("doc new portrait.png -o lab.rtd --format laba16");
     ASSERT_EQ(run.exitCode, 0) << run.output;
-    const IO::ReadResult read = IO::ReadImage(m_Folder / "lab.tif");
-    ASSERT_TRUE(read) << read.error;
-    ASSERT_EQ(read.image->GetFormat(), PixelFormat::LabA16);
-    EXPECT_TRUE(read.metadata.iccProfile.empty()); // Lab needs none
+    Kernel::Counted<Document> document;
+    const auto error = DocumentFile::Load(m_Folder / "lab.rtd", document);
+    ASSERT_FALSE(error) << *error;
+    const auto layer = Kernel::CountedCast<RasterNode>(document->GetLayer(0));
+    ASSERT_TRUE(layer);
+    ASSERT_EQ(layer->GetPixels()->GetFormat(), PixelFormat::LabA16);
+    EXPECT_TRUE(layer->GetColourProfile().empty()); // Lab needs none
+    EXPECT_EQ(document->GetMetadata().iccProfile, ProPhoto());
+    EXPECT_EQ(Tag(document->GetMetadata(), "Exif.Image.Make"), "Testmaker");
     Raster::ColourProfiles profiles;
     profiles.Add(ProPhoto());
-    std::string error;
+    std::string why;
     const auto expected =
-        Raster::ICCManager::ConvertImage(*Picture(), profiles, PixelFormat::LabA16, {}, error);
-    ASSERT_TRUE(expected) << error;
-    // TIFF turns the picture upright by its Orientation 6 on reading; the stored pixel (x, y) is at (3 - y,
-    // x).
+        Raster::ICCManager::ConvertImage(*Picture(), profiles, PixelFormat::LabA16, {}, why);
+    ASSERT_TRUE(expected) << why;
     for (int y = 0; y < 4; ++y)
-        for (int x = 0; x < 6; ++x)
-            EXPECT_EQ(std::memcmp(read.image->RowBytes(x) + (3 - y) * 8, expected->RowBytes(y) + x * 8, 8), 0)
-                << x << "," << y;
+        EXPECT_EQ(std::memcmp(layer->GetPixels()->RowBytes(y), expected->RowBytes(y), 6 * 8), 0)
+            << "row " << y;
+    // What the built-in sRGB conversion would give differs: the profile was used.
+    const auto srgb = Raster::ICCManager::ConvertImage(*Picture(), {}, PixelFormat::LabA16, {}, why);
+    EXPECT_NE(std::memcmp(srgb->RowBytes(0), expected->RowBytes(0), 6 * 8), 0);
 }

@@ -246,7 +246,7 @@ std::vector<std::byte> SaveProfile(cmsHPROFILE profile) {
     return bytes;
 }
 
-std::vector<std::byte> ProPhoto() {
+std::vector<std::byte> MakeProPhoto() {
     const cmsCIExyY white{0.3457, 0.3585, 1.0};
     const cmsCIExyYTRIPLE primaries{{0.7347, 0.2653, 1.0}, {0.1596, 0.8404, 1.0}, {0.0366, 0.0001, 1.0}};
     cmsToneCurve* gamma = cmsBuildGamma(nullptr, 1.8);
@@ -256,11 +256,21 @@ std::vector<std::byte> ProPhoto() {
     return SaveProfile(profile);
 }
 
-std::vector<std::byte> Grey18() {
+std::vector<std::byte> MakeGrey18() {
     cmsToneCurve* gamma = cmsBuildGamma(nullptr, 1.8);
     cmsHPROFILE profile = cmsCreateGrayProfile(cmsD50_xyY(), gamma);
     cmsFreeToneCurve(gamma);
     return SaveProfile(profile);
+}
+
+// Each made once: a profile records when it was made, so two calls a second apart differ.
+const std::vector<std::byte>& ProPhoto() {
+    static const std::vector<std::byte> profile = MakeProPhoto();
+    return profile;
+}
+const std::vector<std::byte>& Grey18() {
+    static const std::vector<std::byte> profile = MakeGrey18();
+    return profile;
 }
 
 Raster::ImageMetadata SomeMetadata() {
