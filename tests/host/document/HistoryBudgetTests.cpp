@@ -99,7 +99,8 @@ TEST(HistoryBudget, TheDroppedCountSurvivesSavingAndVersionTwoFilesStillLoad) {
 
     // The same file as version 2 wrote it: no dropped count after the history's entry count and cursor, and
     // neither the layer's colour profile nor the document's metadata (empty blocks, 20 bytes of zeros after
-    // the layer's pixels: magic, version, counts, the name "layer", kind, placement and image header take 55).
+    // the layer's pixels: magic, version, counts, the name "layer", kind, placement and image header take
+    // 55).
     const std::uint32_t counts[2] = {2, 2};
     const std::uint64_t dropped = 3;
     std::vector<std::byte> field(16);
