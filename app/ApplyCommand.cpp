@@ -9,6 +9,7 @@
 #include "filters/Catalogue.h"
 #include "host/document/TileRenderer.h"
 #include "host/io/ImageIO.h"
+#include "host/raster/ICCManager.h"
 #include "pipeline/Formats.h"
 #include "pipeline/RenderJob.h"
 
@@ -76,8 +77,18 @@ Kernel::Counted<Raster::DynamicBuffer> ReadMask(const std::string& path, int wid
 
 // The image in format, converted on the processor by the copy filter (the decoder only widens for free).
 Kernel::Counted<Raster::DynamicBuffer> ConvertOnLoad(Kernel::Counted<Raster::DynamicBuffer> image,
-                                                     Raster::PixelFormat format, const std::string& path) {
+                                                     Raster::PixelFormat format, const std::string& path,
+                                                     const std::vector<std::byte>& profile) {
     if (image->GetFormat() == format) return image;
+    // A tagged picture changes colour model through its own profile.
+    Raster::ColourProfiles profiles;
+    profiles.Add(profile);
+    if (std::string why;
+        Raster::ICCManager::NeedsProfileConversion(image->GetFormat(), profiles, format, profiles)) {
+        if (auto managed = Raster::ICCManager::ConvertImage(*image, profiles, format, profiles, why))
+            return managed;
+        throw Error(path + ": " + why);
+    }
     const RasterTools::FilterInfo* copy = RasterTools::FindFilter("copy");
     const auto command =
         copy ? copy->makeCommand(false, {static_cast<int>(format), Kernel::PointT<double>{1.0, 1.0}})
@@ -292,7 +303,8 @@ FileReport ProcessFile(const ApplyPlan& plan, const RenderDevice& device, const 
     IO::ReadResult read = ReadInput(input, loadFormat, plan.files);
     if (!read) throw Error(read.error);
     const std::string inputName = input == "-" ? "standard input" : input;
-    const auto source = loadFormat ? ConvertOnLoad(read.image, *loadFormat, inputName) : read.image;
+    const auto source =
+        loadFormat ? ConvertOnLoad(read.image, *loadFormat, inputName, read.metadata.iccProfile) : read.image;
     progress.Update(0.05);
 
     // Every link's output shape first, so that an output the file cannot hold is refused before the work.
@@ -370,7 +382,7 @@ FileReport ProcessFile(const ApplyPlan& plan, const RenderDevice& device, const 
             report.unchanged =
                 std::memcmp(current->RowBytes(y), source->RowBytes(y), source->GetRowBytes()) == 0;
     }
-    WriteOutput(output, outputType, *current, plan.files);
+    WriteOutput(output, outputType, *current, plan.files, read.metadata);
     progress.Update(1.0);
     progress.Finish();
 

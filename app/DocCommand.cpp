@@ -196,7 +196,14 @@ int RunNew(const DocArguments& arguments) {
     Kernel::Counted<Raster::DynamicBuffer> pixels = read.image;
     if (flags.format.Given()) {
         const Raster::PixelFormat format = ParseLayerFormat(flags.format.Value());
-        if (format != pixels->GetFormat()) {
+        Raster::ColourProfiles profiles;
+        profiles.Add(read.metadata.iccProfile);
+        if (std::string why;
+            Raster::ICCManager::NeedsProfileConversion(pixels->GetFormat(), profiles, format, profiles)) {
+            // A tagged picture changes colour model through its own profile.
+            pixels = Raster::ICCManager::ConvertImage(*pixels, profiles, format, profiles, why);
+            if (!pixels) throw Error(input + ": " + why);
+        } else if (format != pixels->GetFormat()) {
             // Converting is the pixel pipeline's work: a copy into the chosen format.
             const auto& copy = RequireFilter("copy");
             const auto command =
@@ -212,8 +219,11 @@ int RunNew(const DocArguments& arguments) {
     }
     auto document = Kernel::MakeCounted<Document>();
     const std::string name = input == "-" ? std::string() : std::filesystem::path(input).stem().string();
-    document->InsertLayer(0,
-                          Kernel::Counted<Node>(new RasterNode(name.empty() ? "Background" : name, pixels)));
+    auto layer = Kernel::MakeCounted<RasterNode>(name.empty() ? "Background" : name, pixels);
+    Raster::ColourProfiles profiles;
+    if (profiles.Add(read.metadata.iccProfile)) layer->SetColourProfile(profiles.For(pixels->GetFormat()));
+    document->InsertLayer(0, layer);
+    document->SetMetadata(read.metadata);
     SaveDocument(*document, output);
     if (!IsQuiet())
         std::cout << output << ": new document, raster layer \"" << document->GetLayer(0)->GetName() << "\" "
@@ -317,7 +327,8 @@ int RunRender(const DocArguments& arguments) {
         progress.Finish();
         throw Error(path + ": " + result.error);
     }
-    WriteOutput(output, outputType, *result.image, files);
+    WriteOutput(output, outputType, *result.image, files,
+                GetFlattenedMetadata(*document, result.image->GetFormat()));
     progress.Update(1.0);
     progress.Finish();
     for (const auto& warning : result.warnings)

@@ -22,18 +22,19 @@ constexpr std::size_t kMaxInputBytes = std::size_t(4) << 30;
 
 // ---- Connection to the I/O layer's options -------------------------------------------------------------
 // Everything the reader and writer are told from the command line is set here and nowhere else.
-IO::WriteOptions MakeWriteOptions(const FileSettings& settings) {
+IO::WriteOptions MakeWriteOptions(const FileSettings& settings, const Raster::ImageMetadata& metadata) {
     IO::WriteOptions options;
-    if (settings.quality) options.jpegQuality = *settings.quality;
-    // compression: checked by CheckFileFlags; the writer has no field for it yet.
+    if (settings.quality) options.quality = *settings.quality;
+    options.compression = settings.compression; // the writer refuses a name its type does not know
+    options.metadata = metadata;
     return options;
 }
 
 IO::ReadResult Read(const std::string& path, std::span<const std::byte> bytes, bool fromMemory,
                     std::optional<Raster::PixelFormat> requested, const FileSettings& settings) {
-    // autoOrient: checked by CheckFileFlags; the reader has no option for it yet.
-    (void)settings;
-    return fromMemory ? IO::DecodeImage(bytes, path, requested) : IO::ReadImage(path, requested);
+    const IO::ReadOptions options{.autoOrient = settings.autoOrient};
+    return fromMemory ? IO::DecodeImage(bytes, path, requested, options)
+                      : IO::ReadImage(path, requested, options);
 }
 // ---------------------------------------------------------------------------------------------------------
 
@@ -95,8 +96,8 @@ IO::FileType OutputType(const std::string& path, const FileSettings& settings) {
 }
 
 void WriteOutput(const std::string& path, IO::FileType type, const Raster::DynamicBuffer& image,
-                 const FileSettings& settings) {
-    const IO::WriteOptions options = MakeWriteOptions(settings);
+                 const FileSettings& settings, const Raster::ImageMetadata& metadata) {
+    const IO::WriteOptions options = MakeWriteOptions(settings, metadata);
     if (path != "-" && IO::GetFileTypeForExtension(path) == type) {
         if (const IO::WriteResult written = IO::WriteImage(path, image, options); !written)
             throw Error(written.error);

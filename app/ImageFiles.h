@@ -25,8 +25,9 @@ IO::ReadResult ReadInput(const std::string& path, std::optional<Raster::PixelFor
                          const FileSettings& settings);
 // The type the output gets: --output-format, else the name's extension; a UsageError when neither says.
 IO::FileType OutputType(const std::string& path, const FileSettings& settings);
-// Writes image atomically to path ("-": standard output) as type, with the writing flags applied.
+// Writes image atomically to path ("-": standard output) as type, with the writing flags applied and the
+// profile and metadata that came with it.
 void WriteOutput(const std::string& path, IO::FileType type, const Raster::DynamicBuffer& image,
-                 const FileSettings& settings);
+                 const FileSettings& settings, const Raster::ImageMetadata& metadata = {});
 
 } // namespace App

@@ -8,6 +8,7 @@ packages=(
   libgtest-dev libgmock-dev libbenchmark-dev
   nlohmann-json3-dev libzstd-dev
   libpng-dev libjpeg-dev libtiff-dev liblcms2-dev libtbb-dev libcli11-dev
+  libwebp-dev libheif-dev libexiv2-dev libopenexr-dev
   ocl-icd-opencl-dev opencl-headers pocl-opencl-icd clinfo
 )
 

@@ -180,3 +180,17 @@ bool Document::Redo() {
     ++m_Cursor;
     return true;
 }
+
+Raster::ColourProfiles Document::GetProfiles() const {
+    Raster::ColourProfiles profiles;
+    for (const auto& node : m_Layers) {
+        const auto* raster = dynamic_cast<const RasterNode*>(node.Get());
+        if (!raster || raster->GetColourProfile().empty()) continue;
+        Raster::ColourProfiles one;
+        if (!one.Add(raster->GetColourProfile())) continue;
+        if (!one.rgb.empty() && profiles.rgb.empty()) profiles.rgb = std::move(one.rgb);
+        if (!one.grey.empty() && profiles.grey.empty()) profiles.grey = std::move(one.grey);
+        if (!one.cmyk.empty() && profiles.cmyk.empty()) profiles.cmyk = std::move(one.cmyk);
+    }
+    return profiles;
+}

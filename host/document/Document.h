@@ -6,6 +6,8 @@
 #include "host/kernel/Countable.h"
 #include "host/raster/AffineTransform.h"
 #include "host/raster/DynamicBuffer.h"
+#include "host/raster/ICCManager.h"
+#include "host/raster/ImageMetadata.h"
 
 #include <cstdint>
 #include <string>
@@ -46,10 +48,15 @@ public:
     Raster::AffineTransform::Params GetTransform() const noexcept;
     // The layer's rectangle in document pixels.
     Kernel::RectT<int> GetDocumentBounds() const noexcept;
+    // The ICC profile of the pixels' numbers; empty for the built-in working space (see
+    // Raster::ColourProfiles).
+    const std::vector<std::byte>& GetColourProfile() const noexcept { return m_Profile; }
+    void SetColourProfile(std::vector<std::byte> profile) { m_Profile = std::move(profile); }
 
 private:
     Kernel::Counted<Raster::DynamicBuffer> m_Pixels;
     Kernel::PointT<int> m_Offset;
+    std::vector<std::byte> m_Profile;
 };
 
 // Gives access to the filter command of a live filter layer.
@@ -144,6 +151,13 @@ public:
     const Kernel::Counted<Command>& GetPreview() const noexcept { return m_Preview; }
     void SetPreview(Kernel::Counted<Command> preview) { m_Preview = std::move(preview); }
 
+    // The profile and EXIF, XMP and IPTC of the image the document was made from, written out again with it.
+    const Raster::ImageMetadata& GetMetadata() const noexcept { return m_Metadata; }
+    void SetMetadata(Raster::ImageMetadata metadata) { m_Metadata = std::move(metadata); }
+    // What the document's RGB, grey and CMYK numbers mean: for each, the profile of the lowest raster layer
+    // that has one of that kind (Raster::ColourProfiles says what an empty one means).
+    Raster::ColourProfiles GetProfiles() const;
+
     // The pixel selection that limits pixel changes; null when there is none.
     const Kernel::Counted<SelectionRasterNode>& GetPixelSelection() const noexcept {
         return m_PixelSelection;
@@ -163,6 +177,7 @@ private:
     std::size_t m_DroppedHistory = 0;
     Kernel::Counted<Command> m_Preview;
     Kernel::Counted<SelectionRasterNode> m_PixelSelection;
+    Raster::ImageMetadata m_Metadata;
 };
 
 // Swaps the pixels of patch with those of its layer's rectangle; false (and nothing changed) when they do not

@@ -225,3 +225,7 @@ std::string DescribeCommand(const Command& command) {
     }
     return text;
 }
+
+Raster::ColourProfiles DocumentController::GetProfiles() const {
+    return m_Document ? m_Document->GetProfiles() : Raster::ColourProfiles{};
+}

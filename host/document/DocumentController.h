@@ -58,6 +58,9 @@ public:
     // Puts another document in place of the current one (after loading), leaving any live edit.
     void SetDocument(Kernel::Counted<Document> document);
 
+    // The document's colour profiles (Document::GetProfiles); an empty set when there is no document.
+    Raster::ColourProfiles GetProfiles() const;
+
     const DocumentDefaults& GetDocumentDefaults() const noexcept { return m_Defaults; }
     void SetDocumentDefaults(const DocumentDefaults& defaults) { m_Defaults = defaults; }
 

@@ -17,8 +17,10 @@ namespace {
 
 constexpr std::array<char, 8> kMagic = {'R', 'T', 'D', 'O', 'C', '\r', '\n', '\x1a'};
 // 2: raster layers with their pixels and placement, pixel patches in history, the pixel selection.
-// 3: the number of history entries dropped to keep history within its memory budget. Version 2 is still read.
-constexpr std::uint32_t kVersion = 3;
+// 3: the number of history entries dropped to keep history within its memory budget.
+// 4: each raster layer's ICC profile, and the profile, EXIF, XMP and IPTC of the image the document was made
+//    from. Versions 2 and 3 are still read (their layers have no profile: the working space).
+constexpr std::uint32_t kVersion = 4;
 constexpr std::uint32_t kOldestReadableVersion = 2;
 constexpr int kCompressionLevel = 3;
 constexpr std::uint32_t kNoLayer = std::numeric_limits<std::uint32_t>::max();
@@ -234,6 +236,7 @@ std::vector<std::byte> Encode(const Document& document, std::string* error) {
             out.Value(std::int32_t(raster->GetOffset().y));
             if (!out.Image(*raster->GetPixels()))
                 return fail("the pixels of layer \"" + node->GetName() + "\" could not be compressed");
+            out.Block(raster->GetColourProfile());
         } else if (const auto* live = dynamic_cast<const FilterRasterNode*>(node.Get())) {
             out.Value(LayerKind::LiveFilter);
             if (!live->GetFilter())
@@ -243,6 +246,12 @@ std::vector<std::byte> Encode(const Document& document, std::string* error) {
             return fail("layer \"" + node->GetName() + "\" is of a kind that cannot be saved");
         }
     }
+
+    const Raster::ImageMetadata& metadata = document.GetMetadata();
+    out.Block(metadata.iccProfile);
+    out.Block(metadata.exif);
+    out.Text(metadata.xmp);
+    out.Block(metadata.iptc);
 
     out.Value(std::uint32_t(document.GetSelection().size()));
     for (const auto& node : document.GetSelection())
@@ -325,7 +334,12 @@ std::optional<std::string> Decode(std::span<const std::byte> bytes, Kernel::Coun
             if (!in.Value(x) || !in.Value(y)) return damaged("placement of layer " + std::to_string(i));
             if (!in.Image(pixels, false, why))
                 return damaged("pixels of layer " + std::to_string(i) + ": " + why);
-            nodes.emplace_back(new RasterNode(name, std::move(pixels), {x, y}));
+            std::span<const std::byte> profile;
+            if (version >= 4 && !in.Block(profile))
+                return damaged("colour profile of layer " + std::to_string(i));
+            auto* raster = new RasterNode(name, std::move(pixels), {x, y});
+            nodes.emplace_back(raster);
+            raster->SetColourProfile({profile.begin(), profile.end()});
         } else if (kind == LayerKind::LiveFilter) {
             std::span<const std::byte> block;
             if (!in.Block(block)) return damaged("filter of layer " + std::to_string(i));
@@ -338,6 +352,16 @@ std::optional<std::string> Decode(std::span<const std::byte> bytes, Kernel::Coun
     }
     for (std::uint32_t i = 0; i < stackCount; ++i)
         document->InsertLayer(i, nodes[i]);
+    if (version >= 4) {
+        std::span<const std::byte> profile, exif, iptc;
+        Raster::ImageMetadata metadata;
+        if (!in.Block(profile) || !in.Block(exif) || !in.Text(metadata.xmp) || !in.Block(iptc))
+            return damaged("metadata");
+        metadata.iccProfile.assign(profile.begin(), profile.end());
+        metadata.exif.assign(exif.begin(), exif.end());
+        metadata.iptc.assign(iptc.begin(), iptc.end());
+        document->SetMetadata(std::move(metadata));
+    }
 
     std::uint32_t selectionCount = 0;
     if (!in.Value(selectionCount) || !in.CanHold(selectionCount, 4)) return damaged("selection");

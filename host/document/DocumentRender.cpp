@@ -29,10 +29,10 @@ bool RenderStep(Kernel::RectT<int> area, const FlattenOptions& options, double f
     return RenderTiles(area, tiles, render);
 }
 
-void CompositeLayer(const RasterNode& layer, Raster::DynamicBuffer& canvas, Kernel::RectT<int> canvasBounds,
+void CompositeLayer(const RasterNode& layer, const Raster::DynamicBuffer& pixels,
+                    Raster::DynamicBuffer& canvas, Kernel::RectT<int> canvasBounds,
                     const Kernel::RectT<int>& tile) {
     // tile is in canvas pixels; the layer's part of it in layer pixels.
-    const auto& pixels = *layer.GetPixels();
     const Kernel::PointT<int> offset = layer.GetOffset();
     const int dx = canvasBounds.left - offset.x, dy = canvasBounds.top - offset.y;
     const int width = tile.Width();
@@ -124,6 +124,10 @@ FlattenResult FlattenDocument(const Document& document, const FlattenOptions& op
     }
     const Kernel::RectT<int> area = canvas->GetBounds();
     const auto& layers = document.GetLayers();
+    // The canvas holds the document's RGB numbers; layers whose profile says otherwise are converted to them.
+    const Raster::ColourProfiles documentProfiles = document.GetProfiles();
+    Raster::ColourProfiles canvasProfiles;
+    canvasProfiles.rgb = documentProfiles.rgb;
     const double steps = double(layers.size() + 1);
     bool* abort = const_cast<bool*>(options.abort); // the span populators take it mutable but only read it
 
@@ -132,12 +136,25 @@ FlattenResult FlattenDocument(const Document& document, const FlattenOptions& op
         bool rendered = true;
         if (const auto* raster = dynamic_cast<const RasterNode*>(&node)) {
             if (!raster->GetPixels()) continue;
+            Kernel::Counted<Raster::DynamicBuffer> pixels = raster->GetPixels();
+            Raster::ColourProfiles layerProfiles;
+            layerProfiles.Add(raster->GetColourProfile());
+            if (Raster::ICCManager::NeedsProfileConversion(pixels->GetFormat(), layerProfiles, kWorking,
+                                                           canvasProfiles)) {
+                std::string why;
+                if (auto managed = Raster::ICCManager::ConvertImage(*pixels, layerProfiles, kWorking,
+                                                                    canvasProfiles, why))
+                    pixels = std::move(managed);
+                else
+                    result.warnings.push_back("layer \"" + node.GetName() +
+                                              "\": its colour profile was not used (" + why + ")");
+            }
             const Kernel::RectT<int> own = raster->GetDocumentBounds();
             const Kernel::RectT<int> part{own.left - result.bounds.left, own.top - result.bounds.top,
                                           own.right - result.bounds.left, own.bottom - result.bounds.top};
             rendered = RenderStep(part, options, double(i) / steps, 1.0 / steps,
                                   [&](const Kernel::RectT<int>& tile) {
-                                      CompositeLayer(*raster, *canvas, result.bounds, tile);
+                                      CompositeLayer(*raster, *pixels, *canvas, result.bounds, tile);
                                       return true;
                                   });
         } else if (const auto* live = dynamic_cast<const FilterRasterNode*>(&node)) {
@@ -187,6 +204,17 @@ FlattenResult FlattenDocument(const Document& document, const FlattenOptions& op
 
     if (format == kWorking) {
         result.image = canvas;
+    } else if (Raster::ICCManager::NeedsProfileConversion(kWorking, canvasProfiles, format,
+                                                          documentProfiles)) {
+        // Into another colour model from profiled RGB: through the profiles, not the built-in formulas.
+        std::string why;
+        result.image =
+            Raster::ICCManager::ConvertImage(*canvas, canvasProfiles, format, documentProfiles, why);
+        if (!result.image) {
+            result.error = "the rendered image could not be converted to " +
+                           std::string(Raster::GetPixelFormatName(format)) + " (" + why + ")";
+            return result;
+        }
     } else {
         auto image = Raster::DynamicBuffer::Create(width, height, format);
         if (!image) {
@@ -206,4 +234,10 @@ FlattenResult FlattenDocument(const Document& document, const FlattenOptions& op
     }
     if (options.progress) options.progress(1.0);
     return result;
+}
+
+Raster::ImageMetadata GetFlattenedMetadata(const Document& document, Raster::PixelFormat format) {
+    Raster::ImageMetadata metadata = document.GetMetadata();
+    metadata.iccProfile = document.GetProfiles().For(format);
+    return metadata;
 }

@@ -5,6 +5,7 @@
 
 #include <csetjmp>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
 #include <memory>
 
@@ -101,6 +102,8 @@ bool StartJpegDecoder(jpeg_decompress_struct* info, JpegError* error, jpeg_progr
     info->progress = progress;
     jpeg_mem_src(info, reinterpret_cast<const unsigned char*>(data.data()),
                  static_cast<unsigned long>(data.size()));
+    // The colour profile lives in APP2 markers, split over as many as it needs.
+    jpeg_save_markers(info, JPEG_APP0 + 2, 0xFFFF);
     jpeg_read_header(info, TRUE);
     header.width = int(info->image_width);
     header.height = int(info->image_height);
@@ -146,33 +149,48 @@ bool DecodeJpegPixels(jpeg_decompress_struct* info, JpegError* error, Raster::Dy
     return true;
 }
 
+bool ReadJpegProfile(jpeg_decompress_struct* info, JpegError* error, JOCTET** profile, unsigned int* length) {
+    if (setjmp(error->jump)) return false;
+    return jpeg_read_icc_profile(info, profile, length) != 0;
+}
+
 bool EncodeJpegPixels(jpeg_compress_struct* info, JpegError* error, JpegSink* sink,
-                      const Raster::DynamicBuffer* image, int quality, unsigned char* scratch) {
+                      const Raster::DynamicBuffer* image, const EncodeRequest* request,
+                      unsigned char* scratch) {
     if (setjmp(error->jump)) return false;
     jpeg_create_compress(info);
     info->dest = &sink->manager;
     sink->manager.init_destination = InitSink;
     sink->manager.empty_output_buffer = EmptySink;
     sink->manager.term_destination = TerminateSink;
-    const bool grey = image->GetFormat() == PixelFormat::IA8;
+    const PixelFormat format = image->GetFormat();
+    const bool grey = format == PixelFormat::IA8;
+    const bool cmyk = format == PixelFormat::CMYKA8;
     info->image_width = JDIMENSION(image->GetWidth());
     info->image_height = JDIMENSION(image->GetHeight());
-    info->input_components = grey ? 1 : 3;
-    info->in_color_space = grey ? JCS_GRAYSCALE : JCS_RGB;
+    info->input_components = grey ? 1 : cmyk ? 4 : 3;
+    info->in_color_space = grey ? JCS_GRAYSCALE : cmyk ? JCS_CMYK : JCS_RGB;
     jpeg_set_defaults(info);
-    jpeg_set_quality(info, quality, TRUE);
+    // CMYK is stored as it comes, with Adobe's marker; readers then expect inverted ink (see below).
+    if (cmyk) jpeg_set_colorspace(info, JCS_CMYK);
+    jpeg_set_quality(info, request->quality, TRUE);
     info->optimize_coding = TRUE;
     // At high quality, chroma at full resolution: halving it would cost more than the quantiser does.
-    if (!grey && quality >= 90) info->comp_info[0].h_samp_factor = info->comp_info[0].v_samp_factor = 1;
+    if (!grey && !cmyk && request->quality >= 90)
+        info->comp_info[0].h_samp_factor = info->comp_info[0].v_samp_factor = 1;
     jpeg_start_compress(info, TRUE);
+    if (!request->icc.empty())
+        jpeg_write_icc_profile(info, reinterpret_cast<const JOCTET*>(request->icc.data()),
+                               static_cast<unsigned int>(request->icc.size()));
     const int width = image->GetWidth();
     const int components = info->input_components;
+    const int pixelBytes = image->GetBytesPerPixel();
     while (info->next_scanline < info->image_height) {
         const auto* row = reinterpret_cast<const unsigned char*>(image->RowBytes(int(info->next_scanline)));
-        const int pixelBytes = grey ? 2 : 4;
         for (int x = 0; x < width; ++x)
             for (int c = 0; c < components; ++c)
-                scratch[x * components + c] = row[x * pixelBytes + c];
+                scratch[x * components + c] = cmyk ? static_cast<unsigned char>(255 - row[x * pixelBytes + c])
+                                                   : row[x * pixelBytes + c];
         JSAMPROW rows[1] = {scratch};
         jpeg_write_scanlines(info, rows, 1);
     }
@@ -212,6 +230,19 @@ ReadResult DecodeJpeg(std::span<const std::byte> data, std::string_view name,
 
     JpegHeader header;
     if (!StartJpegDecoder(&info, &error, &progress, data, header)) return damaged();
+    // The markers came with the header; a profile whose pieces do not fit together is left out.
+    JOCTET* profile = nullptr;
+    unsigned int profileLength = 0;
+    if (ReadJpegProfile(&info, &error, &profile, &profileLength) && profile) {
+        const auto* bytes = reinterpret_cast<const std::byte*>(profile);
+        try {
+            result.metadata.iccProfile.assign(bytes, bytes + profileLength);
+        } catch (...) {
+            std::free(profile);
+            throw;
+        }
+    }
+    std::free(profile);
 
     PixelFormat format;
     bool invert = false;
@@ -248,9 +279,10 @@ ReadResult DecodeJpeg(std::span<const std::byte> data, std::string_view name,
     return result;
 }
 
-EncodeResult EncodeJpeg(const Raster::DynamicBuffer& image, std::string_view name, int quality) {
+EncodeResult EncodeJpeg(const Raster::DynamicBuffer& image, std::string_view name,
+                        const EncodeRequest& request) {
     EncodeResult result;
-    std::vector<unsigned char> scratch(std::size_t(image.GetWidth()) * 3);
+    std::vector<unsigned char> scratch(std::size_t(image.GetWidth()) * 4);
     auto sink = std::make_unique<JpegSink>();
     sink->out = &result.bytes;
     jpeg_compress_struct info{};
@@ -262,7 +294,7 @@ EncodeResult EncodeJpeg(const Raster::DynamicBuffer& image, std::string_view nam
         jpeg_compress_struct* info;
         ~Guard() { jpeg_destroy_compress(info); }
     } guard{&info};
-    if (!EncodeJpegPixels(&info, &error, sink.get(), &image, quality, scratch.data())) {
+    if (!EncodeJpegPixels(&info, &error, sink.get(), &image, &request, scratch.data())) {
         result.bytes.clear();
         result.error = Describe(name, std::string("cannot encode JPEG (") + error.message + ")");
     }

@@ -124,15 +124,31 @@ bool ReadPngPixels(png_structp png, png_infop info, const PngHeader& header, Png
     return true;
 }
 
-bool WritePng(png_structp png, png_infop info, const Raster::DynamicBuffer* image) {
+int CompressionLevel(std::string_view name) {
+    if (name == "none") return 0;
+    if (name == "fast") return 1;
+    if (name == "best") return 9;
+    return 6;
+}
+
+bool WritePng(png_structp png, png_infop info, const Raster::DynamicBuffer* image,
+              const EncodeRequest* request) {
     if (setjmp(png_jmpbuf(png))) return false;
     const PixelFormat format = image->GetFormat();
     const bool grey = format == PixelFormat::IA8 || format == PixelFormat::IA16;
     const int depth = Raster::GetBytesPerComponent(format) * 8;
-    png_set_IHDR(png, info, png_uint_32(image->GetWidth()), png_uint_32(image->GetHeight()), depth,
-                 grey ? PNG_COLOR_TYPE_GRAY_ALPHA : PNG_COLOR_TYPE_RGB_ALPHA, PNG_INTERLACE_NONE,
-                 PNG_COMPRESSION_TYPE_DEFAULT, PNG_FILTER_TYPE_DEFAULT);
+    const int colorType = grey ? (request->alpha ? PNG_COLOR_TYPE_GRAY_ALPHA : PNG_COLOR_TYPE_GRAY)
+                               : (request->alpha ? PNG_COLOR_TYPE_RGB_ALPHA : PNG_COLOR_TYPE_RGB);
+    png_set_IHDR(png, info, png_uint_32(image->GetWidth()), png_uint_32(image->GetHeight()), depth, colorType,
+                 PNG_INTERLACE_NONE, PNG_COMPRESSION_TYPE_DEFAULT, PNG_FILTER_TYPE_DEFAULT);
+    png_set_compression_level(png, CompressionLevel(request->compression));
+    if (!request->icc.empty())
+        png_set_iCCP(png, info, "ICC profile", PNG_COMPRESSION_TYPE_BASE,
+                     reinterpret_cast<png_const_bytep>(request->icc.data()),
+                     png_uint_32(request->icc.size()));
     png_write_info(png, info);
+    // Opaque images leave their alpha out: libpng drops the last sample of every stored pixel.
+    if (!request->alpha) png_set_filler(png, 0, PNG_FILLER_AFTER);
     if constexpr (std::endian::native == std::endian::little)
         if (depth == 16) png_set_swap(png);
     for (int y = 0; y < image->GetHeight(); ++y)
@@ -185,6 +201,9 @@ ReadResult DecodePng(std::span<const std::byte> data, std::string_view name,
     // anyway (2 GiB for a 44-byte file). Text, profiles, EXIF and the rest are never used here, so every
     // chunk but the ones decoding needs is skipped unread, and the caps hold for anything libpng still keeps.
     png_set_keep_unknown_chunks(guard.png, PNG_HANDLE_CHUNK_NEVER, nullptr, -1);
+    // The colour profile is the exception: it says what the pixels mean.
+    static const png_byte profileChunk[] = {'i', 'C', 'C', 'P', 0};
+    png_set_keep_unknown_chunks(guard.png, PNG_HANDLE_CHUNK_AS_DEFAULT, profileChunk, 1);
     png_set_chunk_malloc_max(guard.png, MaxChunkBytes);
     png_set_chunk_cache_max(guard.png, MaxCachedChunks);
 
@@ -213,10 +232,20 @@ ReadResult DecodePng(std::span<const std::byte> data, std::string_view name,
     if (!result.image) return Failed(std::move(result), name, "out of memory");
     if (!ReadPngPixels(guard.png, guard.info, header, transforms, result.image.Get(), context))
         return damaged();
+    png_charp profileName = nullptr;
+    int profileCompression = 0;
+    png_bytep profile = nullptr;
+    png_uint_32 profileLength = 0;
+    if (png_get_iCCP(guard.png, guard.info, &profileName, &profileCompression, &profile, &profileLength) &&
+        profile && profileLength > 0) {
+        const auto* bytes = reinterpret_cast<const std::byte*>(profile);
+        result.metadata.iccProfile.assign(bytes, bytes + profileLength);
+    }
     return result;
 }
 
-EncodeResult EncodePng(const Raster::DynamicBuffer& image, std::string_view name) {
+EncodeResult EncodePng(const Raster::DynamicBuffer& image, std::string_view name,
+                       const EncodeRequest& request) {
     EncodeResult result;
     PngContext context;
     context.out = &result.bytes;
@@ -226,7 +255,7 @@ EncodeResult EncodePng(const Raster::DynamicBuffer& image, std::string_view name
     guard.info = png_create_info_struct(guard.png);
     if (!guard.info) return Failed(std::move(result), name, "out of memory");
     png_set_write_fn(guard.png, &context, WritePngData, FlushPngData);
-    if (!WritePng(guard.png, guard.info, &image)) {
+    if (!WritePng(guard.png, guard.info, &image, &request)) {
         result.bytes.clear();
         result.error = Describe(name, std::string("cannot encode PNG (") + context.message + ")");
     }

@@ -634,39 +634,6 @@ int OrientationOf(TIFF* tif) {
                                                                                     : ORIENTATION_TOPLEFT;
 }
 
-// The stored image turned and mirrored upright. Every decoding route reads rows as stored and ends here, so
-// that all of them agree.
-Kernel::Counted<Raster::DynamicBuffer> Upright(Kernel::Counted<Raster::DynamicBuffer> stored,
-                                               int orientation) {
-    if (orientation == ORIENTATION_TOPLEFT || !stored) return stored;
-    const int width = stored->GetWidth();
-    const int height = stored->GetHeight();
-    const bool swap = orientation >= ORIENTATION_LEFTTOP;
-    const int outWidth = swap ? height : width;
-    const int outHeight = swap ? width : height;
-    auto upright = Raster::DynamicBuffer::Create(outWidth, outHeight, stored->GetFormat());
-    if (!upright) return upright;
-    const std::size_t pixel = std::size_t(stored->GetBytesPerPixel());
-    // For each upright position, the stored row and column: whether they run backwards, and whether the
-    // upright x walks the stored rows (5..8) or the stored columns (1..4).
-    const bool mirrorX = orientation == ORIENTATION_TOPRIGHT || orientation == ORIENTATION_BOTRIGHT ||
-                         orientation == ORIENTATION_RIGHTTOP || orientation == ORIENTATION_RIGHTBOT;
-    const bool mirrorY = orientation == ORIENTATION_BOTRIGHT || orientation == ORIENTATION_BOTLEFT ||
-                         orientation == ORIENTATION_RIGHTBOT || orientation == ORIENTATION_LEFTBOT;
-    for (int y = 0; y < outHeight; ++y) {
-        std::byte* to = upright->RowBytes(y);
-        const int v = mirrorY ? outHeight - 1 - y : y;
-        for (int x = 0; x < outWidth; ++x) {
-            const int u = mirrorX ? outWidth - 1 - x : x;
-            const int row = swap ? u : v;
-            const int column = swap ? v : u;
-            std::memcpy(to + std::size_t(x) * pixel, stored->RowBytes(row) + std::size_t(column) * pixel,
-                        pixel);
-        }
-    }
-    return upright;
-}
-
 // Layouts without a host format of their own (palette, YCbCr, bilevel, ...) go through libtiff's own
 // renderer, which gives 8-bit RGBA with premultiplied alpha.
 ReadResult ReadRendered(TIFF* tif, std::string_view name, TiffFile& file) {
@@ -822,11 +789,30 @@ ReadResult DecodeTiff(std::span<const std::byte> data, std::string_view name) {
     // libtiff carries on after damaged data with whatever it made of it; such an image is not the file's.
     if (file.messages.damage[0]) return damaged(file.Reason(""));
     result.image = Upright(std::move(result.image), orientation);
-    if (!result.image) result.error = Describe(name, "out of memory");
+    if (!result.image) {
+        result.error = Describe(name, "out of memory");
+        return result;
+    }
+    std::uint32_t profileLength = 0;
+    const void* profile = nullptr;
+    if (TIFFGetField(file.tif, TIFFTAG_ICCPROFILE, &profileLength, &profile) && profile &&
+        profileLength > 0) {
+        const auto* bytes = static_cast<const std::byte*>(profile);
+        result.metadata.iccProfile.assign(bytes, bytes + profileLength);
+    }
     return result;
 }
 
-EncodeResult EncodeTiff(const Raster::DynamicBuffer& image, std::string_view name) {
+std::uint16_t CompressionScheme(std::string_view name) {
+    if (name == "none") return COMPRESSION_NONE;
+    if (name == "lzw") return COMPRESSION_LZW;
+    if (name == "packbits") return COMPRESSION_PACKBITS;
+    if (name == "zstd") return COMPRESSION_ZSTD;
+    return COMPRESSION_ADOBE_DEFLATE;
+}
+
+EncodeResult EncodeTiff(const Raster::DynamicBuffer& image, std::string_view name,
+                        const EncodeRequest& request) {
     EncodeResult result;
     TiffStream stream;
     stream.out = &result.bytes;
@@ -842,7 +828,13 @@ EncodeResult EncodeTiff(const Raster::DynamicBuffer& image, std::string_view nam
     const WriteLayout layout = WriteLayoutFor(format);
     const auto width = std::uint32_t(image.GetWidth());
     const auto height = std::uint32_t(image.GetHeight());
-    const std::size_t rowBytes = image.GetRowBytes();
+    // Opaque images are stored without their alpha sample.
+    const std::uint16_t samples = request.alpha ? layout.samples : std::uint16_t(layout.samples - 1);
+    const std::size_t componentBytes = layout.bits / 8u;
+    const std::size_t pixelBytes = std::size_t(image.GetBytesPerPixel());
+    const std::size_t storedPixelBytes = componentBytes * samples;
+    const std::size_t rowBytes = storedPixelBytes * width;
+    const std::uint16_t compression = CompressionScheme(request.compression);
     // About 256 KiB a strip: large enough for deflate to work well, small enough for readers to stream.
     const std::uint32_t rowsPerStrip =
         std::clamp<std::uint32_t>(std::uint32_t((256u << 10) / rowBytes), 1, height);
@@ -851,18 +843,22 @@ EncodeResult EncodeTiff(const Raster::DynamicBuffer& image, std::string_view nam
     bool ok = TIFFSetField(tif, TIFFTAG_IMAGEWIDTH, width) &&
               TIFFSetField(tif, TIFFTAG_IMAGELENGTH, height) &&
               TIFFSetField(tif, TIFFTAG_BITSPERSAMPLE, layout.bits) &&
-              TIFFSetField(tif, TIFFTAG_SAMPLESPERPIXEL, layout.samples) &&
+              TIFFSetField(tif, TIFFTAG_SAMPLESPERPIXEL, samples) &&
               TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, layout.photometric) &&
               TIFFSetField(tif, TIFFTAG_SAMPLEFORMAT, layout.sampleFormat) &&
               TIFFSetField(tif, TIFFTAG_PLANARCONFIG, PLANARCONFIG_CONTIG) &&
-              TIFFSetField(tif, TIFFTAG_EXTRASAMPLES, 1, extra) &&
-              TIFFSetField(tif, TIFFTAG_COMPRESSION, COMPRESSION_ADOBE_DEFLATE) &&
-              TIFFSetField(tif, TIFFTAG_PREDICTOR,
-                           layout.sampleFormat == SAMPLEFORMAT_IEEEFP ? PREDICTOR_FLOATINGPOINT
-                                                                      : PREDICTOR_HORIZONTAL) &&
+              (!request.alpha || TIFFSetField(tif, TIFFTAG_EXTRASAMPLES, 1, extra)) &&
+              TIFFSetField(tif, TIFFTAG_COMPRESSION, compression) &&
               TIFFSetField(tif, TIFFTAG_ROWSPERSTRIP, rowsPerStrip) &&
               TIFFSetField(tif, TIFFTAG_ORIENTATION, ORIENTATION_TOPLEFT);
+    // The predictor belongs to the schemes that model differences: deflate, LZW and zstd.
+    if (ok && compression != COMPRESSION_NONE && compression != COMPRESSION_PACKBITS)
+        ok = TIFFSetField(tif, TIFFTAG_PREDICTOR,
+                          layout.sampleFormat == SAMPLEFORMAT_IEEEFP ? PREDICTOR_FLOATINGPOINT
+                                                                     : PREDICTOR_HORIZONTAL);
     if (ok && format == PixelFormat::CMYKA8) ok = TIFFSetField(tif, TIFFTAG_INKSET, INKSET_CMYK);
+    if (ok && !request.icc.empty())
+        ok = TIFFSetField(tif, TIFFTAG_ICCPROFILE, std::uint32_t(request.icc.size()), request.icc.data());
     if (!ok) return failed("cannot set the tags");
 
     auto strip = std::make_unique_for_overwrite<std::byte[]>(std::size_t(rowsPerStrip) * rowBytes);
@@ -870,12 +866,17 @@ EncodeResult EncodeTiff(const Raster::DynamicBuffer& image, std::string_view nam
         const std::uint32_t rows = std::min(rowsPerStrip, height - y0);
         for (std::uint32_t r = 0; r < rows; ++r) {
             std::byte* to = strip.get() + std::size_t(r) * rowBytes;
-            std::memcpy(to, image.RowBytes(int(y0 + r)), rowBytes);
+            const std::byte* from = image.RowBytes(int(y0 + r));
+            if (request.alpha)
+                std::memcpy(to, from, rowBytes);
+            else
+                for (std::uint32_t x = 0; x < width; ++x)
+                    std::memcpy(to + x * storedPixelBytes, from + x * pixelBytes, storedPixelBytes);
             // CIELab keeps a and b as signed 16-bit; LabA16 has them offset by 32768.
             if (format == PixelFormat::LabA16)
                 for (std::uint32_t x = 0; x < width; ++x)
                     for (std::size_t c : {std::size_t(1), std::size_t(2)}) {
-                        std::byte* p = to + std::size_t(x) * 8 + c * 2;
+                        std::byte* p = to + std::size_t(x) * storedPixelBytes + c * 2;
                         Store(p, std::uint16_t(Load<std::uint16_t>(p) ^ 0x8000u));
                     }
         }

@@ -1,7 +1,36 @@
 #pragma once
-// The host's colour manager: conversions between working float RGB and LabA16 pixels on the processor.
+// The host's colour manager: conversions between working float RGB and LabA16 pixels on the processor, and
+// conversions of whole images between pixel formats through the ICC profiles that say what their numbers
+// mean.
+
+#include "host/kernel/Countable.h"
+#include "host/raster/PixelFormat.h"
+
+#include <cstddef>
+#include <span>
+#include <string>
+#include <vector>
 
 namespace Raster {
+
+class DynamicBuffer;
+
+// The ICC profiles that give a document's or an image's RGB, grey and CMYK numbers their meaning. An empty
+// one is the built-in default: the working space (sRGB) for RGB and grey, the pixel pipeline's undercolour
+// formula against sRGB for CMYK. Lab needs none.
+struct ColourProfiles {
+    std::vector<std::byte> rgb;
+    std::vector<std::byte> grey;
+    std::vector<std::byte> cmyk;
+
+    bool IsEmpty() const noexcept { return rgb.empty() && grey.empty() && cmyk.empty(); }
+    bool operator==(const ColourProfiles&) const = default;
+    // The profile that describes pixels of format (empty for Lab and for formats without colour).
+    const std::vector<std::byte>& For(PixelFormat format) const noexcept;
+    // profile put in the slot its own header names (RGB, GRAY or CMYK); false, and nothing changed, when it
+    // is none of those or too short to be a profile.
+    bool Add(std::span<const std::byte> profile);
+};
 
 // The two colour spaces: the defining constants, from which the literals of LabMath.h are derived (and
 // checked, in LabFragments.cpp).
@@ -55,6 +84,19 @@ public:
     // LabA16 to working RGB, unbounded: colours outside sRGB come back with components below 0 or above 1.
     // Alpha is the stored value divided by 65535.
     void DoLABA16ToRGBAFTransform(unsigned char* in, unsigned char* out, int count);
+
+    // Whether converting pixels of from, described by fromProfiles, into to, described by toProfiles, needs
+    // ConvertImage: a profile takes part and the numbers must change meaning (another colour model, or
+    // another profile for the same one). Otherwise the pixel pipeline's conversions give the right result.
+    static bool NeedsProfileConversion(PixelFormat from, const ColourProfiles& fromProfiles, PixelFormat to,
+                                       const ColourProfiles& toProfiles);
+    // The image converted into a layer format through lcms2, relative colorimetric, in float: RGB and grey
+    // through their profiles, CMYK through its profile (or the undercolour formula), LabA16 as D50 Lab.
+    // Alpha is carried over, rescaled. Integer results are clamped and rounded to nearest; rgbauf is not
+    // clamped. Null, with error set, when a profile is damaged or lcms2 cannot join the two.
+    static Kernel::Counted<DynamicBuffer> ConvertImage(const DynamicBuffer& image,
+                                                       const ColourProfiles& fromProfiles, PixelFormat to,
+                                                       const ColourProfiles& toProfiles, std::string& error);
 
     ICCManager(const ICCManager&) = delete;
     ICCManager& operator=(const ICCManager&) = delete;

@@ -129,7 +129,7 @@ TEST_F(DocumentFiles, HostileCountsWithAValidChecksumAreRefused) {
     EXPECT_EQ(DocumentFile::Decode(future, loaded).value_or(""),
               "document version 99 is from a newer rastertools and cannot be read (this program reads "
               "versions 2 to "
-              "3)");
+              "4)");
 }
 
 TEST_F(DocumentFiles, AFailedLoadLeavesTheFileAndAFailedSaveLeavesTheOldFile) {

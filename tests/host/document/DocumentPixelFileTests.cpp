@@ -1,7 +1,8 @@
 // Documents with pixels on disk: round trips of layers, placements, pixel selection, history with its undo
-// pixels and live layers; every damaged or truncated file refused and left alone; hostile size claims refused
-// before anything is allocated.
+// pixels and live layers, colour profiles and metadata; every damaged or truncated file refused and left
+// alone; hostile size claims refused before anything is allocated.
 
+#include "host/document/DocumentController.h"
 #include "host/document/DocumentFile.h"
 #include "host/document/DocumentRender.h"
 #include "host/document/PixelEffect.h"
@@ -10,6 +11,7 @@
 
 #include <cstring>
 #include <gtest/gtest.h>
+#include <lcms2.h>
 #include <unistd.h>
 
 using namespace DocumentTests;
@@ -221,7 +223,7 @@ TEST_F(PixelDocumentFiles, HostileSizesAndVersionsAreRefusedBeforeAllocating) {
         Poke(forged, 12, std::uint32_t(0x10000000)); // layer count
         refuse(forged, "the document is damaged (layer count)");
     }
-    for (const std::uint32_t version : {1u, 4u}) {
+    for (const std::uint32_t version : {1u, 5u}) {
         auto forged = bytes;
         Poke(forged, 8, version);
         Reseal(forged);
@@ -229,6 +231,158 @@ TEST_F(PixelDocumentFiles, HostileSizesAndVersionsAreRefusedBeforeAllocating) {
         ASSERT_TRUE(error);
         EXPECT_EQ(*error, "document version " + std::to_string(version) + " is from " +
                               (version == 1 ? "an older" : "a newer") +
-                              " rastertools and cannot be read (this program reads versions 2 to 3)");
+                              " rastertools and cannot be read (this program reads versions 2 to 4)");
     }
+}
+
+namespace {
+
+std::vector<std::byte> SaveProfile(cmsHPROFILE profile) {
+    cmsUInt32Number size = 0;
+    cmsSaveProfileToMem(profile, nullptr, &size);
+    std::vector<std::byte> bytes(size);
+    cmsSaveProfileToMem(profile, bytes.data(), &size);
+    cmsCloseProfile(profile);
+    return bytes;
+}
+
+std::vector<std::byte> MakeProPhoto() {
+    const cmsCIExyY white{0.3457, 0.3585, 1.0};
+    const cmsCIExyYTRIPLE primaries{{0.7347, 0.2653, 1.0}, {0.1596, 0.8404, 1.0}, {0.0366, 0.0001, 1.0}};
+    cmsToneCurve* gamma = cmsBuildGamma(nullptr, 1.8);
+    cmsToneCurve* curves[3] = {gamma, gamma, gamma};
+    cmsHPROFILE profile = cmsCreateRGBProfile(&white, &primaries, curves);
+    cmsFreeToneCurve(gamma);
+    return SaveProfile(profile);
+}
+
+std::vector<std::byte> MakeGrey18() {
+    cmsToneCurve* gamma = cmsBuildGamma(nullptr, 1.8);
+    cmsHPROFILE profile = cmsCreateGrayProfile(cmsD50_xyY(), gamma);
+    cmsFreeToneCurve(gamma);
+    return SaveProfile(profile);
+}
+
+// Each made once: a profile records when it was made, so two calls a second apart differ.
+const std::vector<std::byte>& ProPhoto() {
+    static const std::vector<std::byte> profile = MakeProPhoto();
+    return profile;
+}
+const std::vector<std::byte>& Grey18() {
+    static const std::vector<std::byte> profile = MakeGrey18();
+    return profile;
+}
+
+Raster::ImageMetadata SomeMetadata() {
+    Raster::ImageMetadata metadata;
+    metadata.iccProfile = ProPhoto();
+    metadata.exif = {std::byte('I'), std::byte('I'), std::byte(42), std::byte(0), std::byte(8),
+                     std::byte(0),   std::byte(0),   std::byte(0),  std::byte(0), std::byte(0)};
+    metadata.xmp = "<x:xmpmeta xmlns:x=\"adobe:ns:meta/\"/>";
+    metadata.iptc = {std::byte(0x1C), std::byte(2), std::byte(0), std::byte(0),
+                     std::byte(2),    std::byte(0), std::byte(4)};
+    return metadata;
+}
+
+} // namespace
+
+TEST_F(PixelDocumentFiles, ProfilesAndMetadataSurviveSavingAndOldVersionsStillLoad) {
+    auto document = Kernel::MakeCounted<Document>();
+    auto wide = Kernel::MakeCounted<RasterNode>("wide", MakeNoiseImage(3, 2, PixelFormat::RGBA16, 1));
+    wide->SetColourProfile(ProPhoto());
+    auto grey = Kernel::MakeCounted<RasterNode>("grey", MakeNoiseImage(3, 2, PixelFormat::IA8, 2));
+    grey->SetColourProfile(Grey18());
+    auto plain = Kernel::MakeCounted<RasterNode>("plain", MakeNoiseImage(3, 2, PixelFormat::RGBA8, 3));
+    document->InsertLayer(0, wide);
+    document->InsertLayer(1, grey);
+    document->InsertLayer(2, plain);
+    document->SetMetadata(SomeMetadata());
+    ASSERT_FALSE(DocumentFile::Save(*document, m_Path));
+    Kernel::Counted<Document> loaded;
+    ASSERT_FALSE(DocumentFile::Load(m_Path, loaded));
+    ASSERT_EQ(loaded->GetLayers().size(), 3u);
+    const auto* layers = loaded->GetLayers().data();
+    EXPECT_EQ(Kernel::CountedCast<RasterNode>(layers[0])->GetColourProfile(), ProPhoto());
+    EXPECT_EQ(Kernel::CountedCast<RasterNode>(layers[1])->GetColourProfile(), Grey18());
+    EXPECT_TRUE(Kernel::CountedCast<RasterNode>(layers[2])->GetColourProfile().empty());
+    EXPECT_EQ(loaded->GetMetadata(), SomeMetadata());
+    const Raster::ColourProfiles profiles = loaded->GetProfiles();
+    EXPECT_EQ(profiles.rgb, ProPhoto());
+    EXPECT_EQ(profiles.grey, Grey18());
+    EXPECT_TRUE(profiles.cmyk.empty());
+    auto controller = Kernel::MakeCounted<DocumentController>(loaded);
+    EXPECT_EQ(controller->GetProfiles(), profiles);
+    EXPECT_TRUE(
+        Kernel::MakeCounted<DocumentController>(Kernel::Counted<Document>())->GetProfiles().IsEmpty());
+
+    // The same one-layer document as version 3 wrote it: no profile block after the pixels and no metadata.
+    auto single = Kernel::MakeCounted<Document>();
+    single->InsertLayer(
+        0, Kernel::MakeCounted<RasterNode>("", MakeFilled(1, 1, PixelFormat::RGBA8, {1, 0, 0, 1})));
+    auto bytes = DocumentFile::Encode(*single);
+    std::uint64_t frame = 0;
+    std::memcpy(&frame, bytes.data() + 42, 8);
+    const std::size_t afterPixels = 50 + std::size_t(frame);
+    // Four empty blocks of the layer's profile and the metadata's profile and EXIF, XMP and IPTC.
+    ASSERT_EQ(std::vector<std::byte>(bytes.begin() + std::ptrdiff_t(afterPixels),
+                                     bytes.begin() + std::ptrdiff_t(afterPixels) + 20),
+              std::vector<std::byte>(20));
+    bytes.erase(bytes.begin() + std::ptrdiff_t(afterPixels),
+                bytes.begin() + std::ptrdiff_t(afterPixels) + 20);
+    Poke(bytes, 8, std::uint32_t(3));
+    Reseal(bytes);
+    Kernel::Counted<Document> old;
+    const auto error = DocumentFile::Decode(bytes, old);
+    ASSERT_FALSE(error) << *error;
+    ASSERT_EQ(old->GetLayers().size(), 1u);
+    EXPECT_TRUE(Kernel::CountedCast<RasterNode>(old->GetLayer(0))->GetColourProfile().empty());
+    EXPECT_TRUE(old->GetMetadata().IsEmpty());
+    EXPECT_EQ(PixelBytes(*Kernel::CountedCast<RasterNode>(old->GetLayer(0))->GetPixels()),
+              PixelBytes(*MakeFilled(1, 1, PixelFormat::RGBA8, {1, 0, 0, 1})));
+}
+
+TEST(DocumentColour, FlatteningComposesInTheDocumentsProfileAndConvertsThroughIt) {
+    // A ProPhoto layer alone: its numbers pass through untouched and the output carries its profile.
+    auto document = Kernel::MakeCounted<Document>();
+    auto wide = Kernel::MakeCounted<RasterNode>("wide", MakeNoiseImage(4, 3, PixelFormat::RGBA16, 5));
+    wide->SetColourProfile(ProPhoto());
+    document->InsertLayer(0, wide);
+    FlattenResult flat = FlattenDocument(*document);
+    ASSERT_TRUE(flat.image) << flat.error;
+    EXPECT_EQ(PixelBytes(*flat.image), PixelBytes(*wide->GetPixels()));
+    EXPECT_EQ(GetFlattenedMetadata(*document, PixelFormat::RGBA16).iccProfile, ProPhoto());
+    EXPECT_TRUE(GetFlattenedMetadata(*document, PixelFormat::LabA16).iccProfile.empty());
+
+    // Into Lab, the document's profile decides: what lcms2 gives for ProPhoto, not the sRGB formula.
+    std::string error;
+    Raster::ColourProfiles prophoto;
+    prophoto.Add(ProPhoto());
+    const auto expected =
+        Raster::ICCManager::ConvertImage(*wide->GetPixels(), prophoto, PixelFormat::LabA16, {}, error);
+    ASSERT_TRUE(expected) << error;
+    flat = FlattenDocument(*document, {.format = PixelFormat::LabA16});
+    ASSERT_TRUE(flat.image) << flat.error;
+    const auto wideLab = PixelBytes(*flat.image);
+    const auto managedLab = PixelBytes(*expected);
+    ASSERT_EQ(wideLab.size(), managedLab.size());
+    int worst = 0; // through 16-bit float working pixels on the one side only
+    for (std::size_t i = 0; i + 1 < wideLab.size(); i += 2) {
+        std::uint16_t a, b;
+        std::memcpy(&a, &wideLab[i], 2);
+        std::memcpy(&b, &managedLab[i], 2);
+        worst = std::max(worst, std::abs(int(a) - int(b)));
+    }
+    EXPECT_LE(worst, 2);
+
+    // An sRGB (unprofiled) layer over it is converted into ProPhoto numbers: opaque sRGB red is not
+    // ProPhoto's full red but about (0.70, 0.28, 0.10) in it.
+    auto red = Kernel::MakeCounted<RasterNode>("red", MakeFilled(4, 3, PixelFormat::RGBA16, {1, 0, 0, 1}));
+    document->InsertLayer(1, red);
+    flat = FlattenDocument(*document);
+    ASSERT_TRUE(flat.image) << flat.error;
+    const std::uint16_t* pixel = flat.image->Row<std::uint16_t>(1) + 4;
+    EXPECT_NEAR(pixel[0] / 65535.0, 0.70, 0.03);
+    EXPECT_NEAR(pixel[1] / 65535.0, 0.28, 0.03);
+    EXPECT_NEAR(pixel[2] / 65535.0, 0.10, 0.05);
+    EXPECT_EQ(pixel[3], 65535);
 }

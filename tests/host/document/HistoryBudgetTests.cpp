@@ -97,7 +97,10 @@ TEST(HistoryBudget, TheDroppedCountSurvivesSavingAndVersionTwoFilesStillLoad) {
     EXPECT_EQ(loaded->GetHistory().size(), 2u);
     EXPECT_EQ(loaded->GetDroppedHistoryCount(), 3u);
 
-    // The same file as version 2 wrote it: no dropped count after the history's entry count and cursor.
+    // The same file as version 2 wrote it: no dropped count after the history's entry count and cursor, and
+    // neither the layer's colour profile nor the document's metadata (empty blocks, 20 bytes of zeros after
+    // the layer's pixels: magic, version, counts, the name "layer", kind, placement and image header take
+    // 55).
     const std::uint32_t counts[2] = {2, 2};
     const std::uint64_t dropped = 3;
     std::vector<std::byte> field(16);
@@ -107,6 +110,11 @@ TEST(HistoryBudget, TheDroppedCountSurvivesSavingAndVersionTwoFilesStillLoad) {
     ASSERT_NE(at, bytes.end());
     std::vector<std::byte> old(bytes.begin(), at + 8);
     old.insert(old.end(), at + 16, bytes.end());
+    std::uint64_t frame = 0;
+    std::memcpy(&frame, old.data() + 47, 8);
+    const auto profiles = old.begin() + std::ptrdiff_t(55 + frame);
+    ASSERT_EQ(std::vector<std::byte>(profiles, profiles + 20), std::vector<std::byte>(20));
+    old.erase(profiles, profiles + 20);
     const std::uint32_t two = 2;
     std::memcpy(old.data() + 8, &two, 4);
     std::uint64_t hash = 0xcbf29ce484222325ull;

@@ -236,7 +236,9 @@ TEST(HostileInput, TruncatedFilesAreRefusedAtEveryLength) {
             ASSERT_TRUE(StartsWith(result.error, std::string(c.name) + ": ")) << result.error;
             // Too short to carry a whole signature, a file is simply not recognised.
             const bool recognised = IO::DetectFileType(Cut(c.bytes, length)).has_value();
-            EXPECT_TRUE(Contains(result.error, recognised ? c.damage : "not a PNG, JPEG or TIFF file"))
+            EXPECT_TRUE(
+                Contains(result.error,
+                         recognised ? c.damage : "not a PNG, JPEG, TIFF, WebP, AVIF, HEIC or OpenEXR file"))
                 << result.error;
         }
     }
@@ -530,7 +532,8 @@ TEST(HostileInput, FilesAreRecognisedByContentNotName) {
     std::ofstream(folder / "coffee.png") << "this is text, not pixels\n";
     result = IO::ReadImage(folder / "coffee.png");
     EXPECT_FALSE(result);
-    EXPECT_EQ(result.error, (folder / "coffee.png").string() + ": not a PNG, JPEG or TIFF file");
+    EXPECT_EQ(result.error,
+              (folder / "coffee.png").string() + ": not a PNG, JPEG, TIFF, WebP, AVIF, HEIC or OpenEXR file");
 
     std::ofstream(folder / "empty.tif").flush();
     result = IO::ReadImage(folder / "empty.tif");
@@ -574,9 +577,9 @@ TEST(HostileInput, OutputTypeComesFromTheExtensionAndUnknownOnesAreRefused) {
     const auto before = folder.Names();
     IO::WriteResult result = IO::WriteImage(folder / "out.bmp", *image);
     EXPECT_FALSE(result);
-    EXPECT_EQ(result.error,
-              (folder / "out.bmp").string() +
-                  ": unknown image file extension \".bmp\"; use .png, .jpg, .jpeg, .tif or .tiff");
+    EXPECT_EQ(result.error, (folder / "out.bmp").string() +
+                                ": unknown image file extension \".bmp\"; use .png, .jpg, "
+                                ".jpeg, .tif, .tiff, .webp, .avif, .heic, .heif or .exr");
     result = IO::WriteImage(folder / "out", *image);
     EXPECT_FALSE(result);
     EXPECT_TRUE(Contains(result.error, "no file extension")) << result.error;
@@ -594,7 +597,7 @@ TEST(HostileInput, FormatsATypeCannotHoldAreRefusedWithTheConversionToMake) {
     result = IO::EncodeImage(*Noise(PixelFormat::IA16, 4, 4, 9), IO::FileType::JPEG, "g.jpg");
     EXPECT_EQ(result.error, "g.jpg: JPEG cannot hold ia16 pixels; convert them to ia8 first");
     result =
-        IO::EncodeImage(*Noise(PixelFormat::RGBA8, 4, 4, 9), IO::FileType::JPEG, "q.jpg", {.jpegQuality = 0});
+        IO::EncodeImage(*Noise(PixelFormat::RGBA8, 4, 4, 9), IO::FileType::JPEG, "q.jpg", {.quality = 0});
     EXPECT_EQ(result.error, "q.jpg: JPEG quality 0 is outside 1..100");
 
     for (PixelFormat format :

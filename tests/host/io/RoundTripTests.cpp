@@ -50,9 +50,10 @@ TEST(TiffRoundTrip, MemoryAndFilePathsGiveTheSameBytes) {
 }
 
 TEST(TiffRoundTrip, LabIsStoredAsSignedCIELab) {
-    // L 32768 (about L* 50), a* = 0 (32768), b* = +10 (32768 + 10 × 256), opaque.
+    // L 32768 (about L* 50), a* = 0 (32768), b* = +10 (32768 + 10 × 256), partly transparent so that the
+    // alpha sample is stored.
     auto lab = Raster::DynamicBuffer::Create(1, 1, PixelFormat::LabA16);
-    const std::uint16_t pixel[4] = {32768, 32768, 32768 + 256 * 10, 65535}; // b* = +10
+    const std::uint16_t pixel[4] = {32768, 32768, 32768 + 256 * 10, 40000}; // b* = +10
     std::memcpy(lab->RowBytes(0), pixel, sizeof pixel);
     const IO::EncodeResult encoded = IO::EncodeImage(*lab, IO::FileType::TIFF, "lab.tif");
     ASSERT_TRUE(encoded) << encoded.error;
@@ -70,7 +71,7 @@ TEST(TiffRoundTrip, LabIsStoredAsSignedCIELab) {
     EXPECT_EQ(std::uint16_t(samples[0]), 32768);
     EXPECT_EQ(samples[1], 0);
     EXPECT_EQ(samples[2], 2560);
-    EXPECT_EQ(std::uint16_t(samples[3]), 65535);
+    EXPECT_EQ(std::uint16_t(samples[3]), 40000);
 }
 
 TEST(PngRoundTrip, EightAndSixteenBitGreyAndColourAreBitExact) {
@@ -94,7 +95,7 @@ TEST(JpegRoundTrip, ColourAndGreyStayWithinTheQuantisationError) {
         SCOPED_TRACE(Raster::GetPixelFormatName(format));
         auto original = Ramps(format, 64, 48);
         for (int quality : {92, 100}) {
-            ASSERT_TRUE(IO::WriteImage(folder / "round.jpg", *original, {.jpegQuality = quality}));
+            ASSERT_TRUE(IO::WriteImage(folder / "round.jpg", *original, {.quality = quality}));
             const IO::ReadResult read = IO::ReadImage(folder / "round.jpg");
             ASSERT_TRUE(read) << read.error;
             EXPECT_EQ(read.type, IO::FileType::JPEG);
