@@ -10,7 +10,7 @@ namespace Raster {
 class BrushEngine {
 public:
     // A stroke stops producing dabs beyond this many, so that a hostile stroke cannot exhaust memory.
-    static constexpr std::size_t kMaxNozzlesPerStroke = std::size_t(1) << 20;
+    static constexpr std::size_t kMaxNozzlesPerStroke = std::size_t(1) << 18;
     // Points are held within this distance of the origin.
     static constexpr double kCoordinateLimit = double(1 << 24);
 
