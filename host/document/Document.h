@@ -17,7 +17,9 @@ class RasterNode;
 class PixelWriteObserver {
 public:
     virtual ~PixelWriteObserver() = default;
-    virtual void WillWritePixels(const RasterNode& layer, Kernel::RectT<int> rect) = 0;
+    // incoming: the pixels rect is about to receive (rect's size), or null when they are not known.
+    virtual void WillWritePixels(const RasterNode& layer, Kernel::RectT<int> rect,
+                                 const Raster::DynamicBuffer* incoming) = 0;
 };
 
 // One layer of a document. Nodes keep their identity for their whole life; history entries refer to them.
@@ -52,9 +54,9 @@ public:
     // Whoever changes the pixels in place calls WillWritePixels first (rect in layer pixels).
     void AddWriteObserver(PixelWriteObserver* observer) { m_Observers.push_back(observer); }
     void RemoveWriteObserver(PixelWriteObserver* observer) { std::erase(m_Observers, observer); }
-    void WillWritePixels(Kernel::RectT<int> rect) const {
+    void WillWritePixels(Kernel::RectT<int> rect, const Raster::DynamicBuffer* incoming = nullptr) const {
         for (PixelWriteObserver* observer : m_Observers)
-            observer->WillWritePixels(*this, rect);
+            observer->WillWritePixels(*this, rect, incoming);
     }
     // Where the layer's top-left pixel sits in document pixels.
     Kernel::PointT<int> GetOffset() const noexcept { return m_Offset; }

@@ -17,6 +17,18 @@ void CopyRect(const Raster::DynamicBuffer& from, Kernel::PointT<int> fromAt, Ras
                     from.RowBytes(fromAt.y + y) + std::size_t(fromAt.x) * bpp, std::size_t(width) * bpp);
 }
 
+// Whether incoming (placed with its pixel (0, 0) at origin) differs from base anywhere in part.
+bool Differs(const Raster::DynamicBuffer& base, const Raster::DynamicBuffer& incoming,
+             Kernel::RectT<int> part, Kernel::PointT<int> origin) {
+    const std::size_t bpp = std::size_t(base.GetBytesPerPixel());
+    for (int y = part.top; y < part.bottom; ++y)
+        if (std::memcmp(base.RowBytes(y) + std::size_t(part.left) * bpp,
+                        incoming.RowBytes(y - origin.y) + std::size_t(part.left - origin.x) * bpp,
+                        std::size_t(part.Width()) * bpp) != 0)
+            return true;
+    return false;
+}
+
 } // namespace
 
 LayerSnapshot::LayerSnapshot(Kernel::Counted<RasterNode> layer)
@@ -35,9 +47,14 @@ Kernel::RectT<int> LayerSnapshot::TileRect(int column, int row) const noexcept {
     return tile.Intersect(m_Base->GetBounds());
 }
 
-void LayerSnapshot::WillWritePixels(const RasterNode& layer, Kernel::RectT<int> rect) {
+void LayerSnapshot::WillWritePixels(const RasterNode& layer, Kernel::RectT<int> rect,
+                                    const Raster::DynamicBuffer* incoming) {
     // A layer that was given another buffer writes into that one; the base stays as it was.
     if (!m_Base || layer.GetPixels() != m_Base) return;
+    const Kernel::RectT<int> written = rect;
+    if (incoming && (incoming->GetFormat() != m_Base->GetFormat() || incoming->GetWidth() != rect.Width() ||
+                     incoming->GetHeight() != rect.Height()))
+        incoming = nullptr;
     rect = rect.Intersect(m_Base->GetBounds());
     if (rect.IsEmpty()) return;
     for (int row = rect.top / kTileSide; row <= (rect.bottom - 1) / kTileSide; ++row)
@@ -45,6 +62,10 @@ void LayerSnapshot::WillWritePixels(const RasterNode& layer, Kernel::RectT<int> 
             const std::uint64_t key = TileKey(column, row);
             if (m_Tiles.contains(key)) continue;
             const Kernel::RectT<int> tile = TileRect(column, row);
+            // A stroke's change is its bounding box, mostly unchanged pixels: only tiles that differ are
+            // kept.
+            if (incoming && !Differs(*m_Base, *incoming, tile.Intersect(rect), {written.left, written.top}))
+                continue;
             auto kept = Raster::DynamicBuffer::Create(tile.Width(), tile.Height(), m_Base->GetFormat());
             // Without memory the tile is lost to the snapshot; reads of it then give the changed pixels.
             if (!kept) continue;

@@ -28,7 +28,9 @@ public:
     std::size_t GetKeptTileCount() const noexcept { return m_Tiles.size(); }
 
 private:
-    void WillWritePixels(const RasterNode& layer, Kernel::RectT<int> rect) override;
+    // Keeps the tiles under rect whose pixels incoming would change (all of them without incoming).
+    void WillWritePixels(const RasterNode& layer, Kernel::RectT<int> rect,
+                         const Raster::DynamicBuffer* incoming) override;
     Kernel::RectT<int> TileRect(int column, int row) const noexcept;
 
     Kernel::Counted<RasterNode> m_Layer;

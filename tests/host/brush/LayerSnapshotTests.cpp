@@ -59,6 +59,26 @@ TEST(LayerSnapshot, ASnapshotOfALargeDocumentCostsOnlyTheTilesThatChangeAfterIt)
     EXPECT_EQ(std::uint8_t(doc.layer->GetPixels()->RowBytes(t)[std::size_t(t) * 4]), 7);
 }
 
+TEST(LayerSnapshot, OnlyTilesWhosePixelsDifferAreKeptFromAChangedRectangle) {
+    // A diagonal stroke's change is its bounding box: 512 × 512 of which only the diagonal differs.
+    SnapshotDocument doc(1024);
+    const auto snapshot = doc.controller->NominateSnapshot();
+    auto pixels = Raster::DynamicBuffer::Create(512, 512, Raster::PixelFormat::RGBA8);
+    for (int i = 0; i < 512; ++i)
+        pixels->Row<std::uint8_t>(i)[i * 4 + 3] = 255;
+    HistoryEntry entry{.kind = HistoryEntry::Kind::PixelChange};
+    entry.patches.push_back({.layer = doc.layer, .rect = {100, 100, 612, 612}, .pixels = pixels});
+    doc.document->PushHistory(std::move(entry));
+    // The diagonal from (100, 100) to (611, 611) lies in the five tiles (0, 0) to (4, 4) of 128 pixels.
+    EXPECT_EQ(snapshot->GetKeptBytes(),
+              5 * Raster::DynamicBuffer::ComputeStorageBytes(
+                      LayerSnapshot::kTileSide, LayerSnapshot::kTileSide, Raster::PixelFormat::RGBA8));
+    const auto read = snapshot->ReadLayerPixels(doc.layer->GetId(), {100, 100, 612, 612});
+    ASSERT_TRUE(read);
+    EXPECT_EQ(std::uint8_t(read->RowBytes(300)[300 * 4 + 3]), 0);
+    EXPECT_EQ(std::uint8_t(doc.layer->GetPixels()->RowBytes(400)[400 * 4 + 3]), 255);
+}
+
 TEST(LayerSnapshot, UndoAndRedoAfterTheSnapshotAreKeptToo) {
     SnapshotDocument doc(300);
     Change(*doc.document, doc.layer, {0, 0, 10, 10}, 50);
