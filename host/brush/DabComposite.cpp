@@ -21,6 +21,11 @@ struct Precision {
         if (!(f > 0.0)) return 0; // NaN too
         return f >= 1.0 ? kFull : std::uint32_t(std::lround(f * double(kFull)));
     }
+    // A stored float mask value, multiplied in single precision as a device does.
+    static std::uint32_t FromFloat(float f) noexcept {
+        if (!(f > 0.0f)) return 0;
+        return f >= 1.0f ? kFull : std::uint32_t(std::lround(f * float(kFull)));
+    }
     static std::uint32_t From8(std::uint8_t v) noexcept { return Bits == 8 ? v : std::uint32_t(v) * 257u; }
     static std::uint32_t From16(std::uint16_t v) noexcept {
         return Bits == 8 ? (std::uint32_t(v) * 255u + 32767u) / 65535u : v;
@@ -35,7 +40,7 @@ std::uint32_t ReadWeight(const DynamicBuffer& mask, int x, int y) noexcept {
     case PixelFormat::MaskA16:
         return P::From16(mask.Row<std::uint16_t>(y)[x]);
     default:
-        return P::FromFraction(mask.Row<float>(y)[x]);
+        return P::FromFloat(mask.Row<float>(y)[x]);
     }
 }
 
@@ -46,7 +51,7 @@ std::uint32_t ReadCoverage(const DynamicBuffer& coverage, int x, int y) noexcept
     else if constexpr (Coverage == PixelFormat::MaskA16)
         return P::From16(coverage.Row<std::uint16_t>(y)[x]);
     else
-        return P::FromFraction(coverage.Row<float>(y)[x]);
+        return P::FromFloat(coverage.Row<float>(y)[x]);
 }
 
 // Moves d towards v by w (of full), never past v; w == full gives v exactly.
@@ -68,19 +73,17 @@ int PositiveModulo(long long value, int modulus) noexcept {
 }
 
 template <class T, PixelFormat Coverage>
-void Compose(DynamicBuffer& target, Kernel::RectT<int> rect, Kernel::PointT<int> coverageAt,
-             const DynamicBuffer& coverage, const DabRequest& request) {
+void Compose(DynamicBuffer& target, const DabPlan& plan, const DynamicBuffer& coverage,
+             const DabRequest& request) {
     using P = Precision<sizeof(T) == 1 ? 8 : 16>;
     const PixelFormatInfo& info = GetPixelFormatInfo(target.GetFormat());
     const int channels = info.channelCount;
     const int alpha = info.alphaIndex;
+    const Kernel::RectT<int> rect = plan.rect;
+    const Kernel::PointT<int> coverageAt = plan.coverageAt;
+    const std::uint32_t factor = plan.factor;
+    const bool stamp = plan.stamp;
     const bool copy = request.write == DabWrite::Copy;
-    const bool opaque = !copy && request.path == DabPath::Opaque;
-    const bool stamp = !copy && request.path == DabPath::Stamp;
-    const double strength = std::isnan(request.strength) ? 0.0 : std::clamp(request.strength, 0.0, 1.0);
-    const double dynamic = std::isnan(request.dynamic) ? 0.0 : std::clamp(request.dynamic, 0.0, 1.0);
-    const std::uint32_t factor = P::FromFraction(opaque ? dynamic : strength * dynamic);
-    const double scale = request.textureScale > 0.0 ? request.textureScale : 1.0;
 
     T value[5] = {};
     if (request.write == DabWrite::Colour)
@@ -91,17 +94,15 @@ void Compose(DynamicBuffer& target, Kernel::RectT<int> rect, Kernel::PointT<int>
         T* row = target.Row<T>(y);
         const T* source = copy ? request.source->Row<T>(y - rect.top) : nullptr;
         const int coverageY = coverageAt.y + y - rect.top;
-        int textureY = 0;
-        if (request.texture)
-            textureY = PositiveModulo((long long)std::floor(double(request.targetOrigin.y + y) / scale),
-                                      request.texture->GetHeight());
+        const int textureY = request.texture ? DabTexel(request.targetOrigin.y + y, request.textureScale,
+                                                        request.texture->GetHeight())
+                                             : 0;
         for (int x = rect.left; x < rect.right; ++x) {
             std::uint32_t w = P::Multiply(
                 ReadCoverage<P, Coverage>(coverage, coverageAt.x + x - rect.left, coverageY), factor);
             if (request.texture) {
                 const int textureX =
-                    PositiveModulo((long long)std::floor(double(request.targetOrigin.x + x) / scale),
-                                   request.texture->GetWidth());
+                    DabTexel(request.targetOrigin.x + x, request.textureScale, request.texture->GetWidth());
                 w = P::Multiply(w, ReadWeight<P>(*request.texture, textureX, textureY));
             }
             if (w == 0) continue;
@@ -133,17 +134,17 @@ void Compose(DynamicBuffer& target, Kernel::RectT<int> rect, Kernel::PointT<int>
 }
 
 template <class T>
-bool ComposeFor(PixelFormat coverageFormat, DynamicBuffer& target, Kernel::RectT<int> rect,
-                Kernel::PointT<int> coverageAt, const DynamicBuffer& coverage, const DabRequest& request) {
+bool ComposeFor(PixelFormat coverageFormat, DynamicBuffer& target, const DabPlan& plan,
+                const DynamicBuffer& coverage, const DabRequest& request) {
     switch (coverageFormat) {
     case PixelFormat::MaskA8:
-        Compose<T, PixelFormat::MaskA8>(target, rect, coverageAt, coverage, request);
+        Compose<T, PixelFormat::MaskA8>(target, plan, coverage, request);
         return true;
     case PixelFormat::MaskA16:
-        Compose<T, PixelFormat::MaskA16>(target, rect, coverageAt, coverage, request);
+        Compose<T, PixelFormat::MaskA16>(target, plan, coverage, request);
         return true;
     case PixelFormat::MaskAF:
-        Compose<T, PixelFormat::MaskAF>(target, rect, coverageAt, coverage, request);
+        Compose<T, PixelFormat::MaskAF>(target, plan, coverage, request);
         return true;
     default:
         return false;
@@ -152,43 +153,69 @@ bool ComposeFor(PixelFormat coverageFormat, DynamicBuffer& target, Kernel::RectT
 
 } // namespace
 
-bool CompositeDab(DynamicBuffer& target, Kernel::RectT<int> rect, const DynamicBuffer& coverage,
-                  const DabRequest& request) {
+int DabTexel(int documentCoordinate, double scale, int size) noexcept {
+    if (size < 1) return 0;
+    if (!(scale > 0.0)) scale = 1.0;
+    return PositiveModulo((long long)std::floor(double(documentCoordinate) / scale), size);
+}
+
+std::optional<DabPlan> PlanDab(const DynamicBuffer& target, Kernel::RectT<int> rect,
+                               const DynamicBuffer& coverage, const DabRequest& request) {
     const PixelFormat format = target.GetFormat();
-    if (!IsMaskFormat(coverage.GetFormat())) return false;
+    if (!IsMaskFormat(coverage.GetFormat())) return std::nullopt;
     switch (request.write) {
     case DabWrite::Colour:
-        if (!request.colour || IsMaskFormat(format)) return false;
+        if (!request.colour || IsMaskFormat(format)) return std::nullopt;
         break;
     case DabWrite::ClearAlpha:
-        if (GetPixelFormatInfo(format).alphaIndex < 0) return false;
+        if (GetPixelFormatInfo(format).alphaIndex < 0) return std::nullopt;
         break;
     case DabWrite::Copy:
         if (!request.source || request.source->GetFormat() != format ||
             request.source->GetWidth() != rect.Width() || request.source->GetHeight() != rect.Height())
-            return false;
+            return std::nullopt;
         break;
     case DabWrite::FullMask:
-        if (!IsMaskFormat(format)) return false;
+        if (!IsMaskFormat(format)) return std::nullopt;
         break;
     }
     if (request.texture && (!IsMaskFormat(request.texture->GetFormat()) || request.texture->GetWidth() < 1 ||
                             request.texture->GetHeight() < 1))
-        return false;
+        return std::nullopt;
+    DabPlan plan;
+    plan.precisionBits = GetBytesPerComponent(format) == 1 ? 8 : 16;
     // The coverage is laid over the rect as asked; clipping moves where it is read from.
-    const Kernel::RectT<int> clipped = rect.Intersect(target.GetBounds());
-    if (clipped.IsEmpty()) return true;
-    if (rect.Width() > coverage.GetWidth() || rect.Height() > coverage.GetHeight()) return false;
-    const Kernel::PointT<int> coverageAt{clipped.left - rect.left, clipped.top - rect.top};
-    if (request.write == DabWrite::Copy && clipped != rect) return false;
-    switch (GetBytesPerComponent(format)) {
+    plan.rect = rect.Intersect(target.GetBounds());
+    if (plan.rect.IsEmpty()) {
+        plan.rect = {};
+        return plan;
+    }
+    if (rect.Width() > coverage.GetWidth() || rect.Height() > coverage.GetHeight()) return std::nullopt;
+    if (request.write == DabWrite::Copy && plan.rect != rect) return std::nullopt;
+    plan.coverageAt = {plan.rect.left - rect.left, plan.rect.top - rect.top};
+    const bool copy = request.write == DabWrite::Copy;
+    const bool opaque = !copy && request.path == DabPath::Opaque;
+    plan.stamp = !copy && request.path == DabPath::Stamp;
+    const double strength = std::isnan(request.strength) ? 0.0 : std::clamp(request.strength, 0.0, 1.0);
+    const double dynamic = std::isnan(request.dynamic) ? 0.0 : std::clamp(request.dynamic, 0.0, 1.0);
+    const double fraction = opaque ? dynamic : strength * dynamic;
+    plan.factor = plan.precisionBits == 8 ? Precision<8>::FromFraction(fraction)
+                                          : Precision<16>::FromFraction(fraction);
+    return plan;
+}
+
+bool CompositeDab(DynamicBuffer& target, Kernel::RectT<int> rect, const DynamicBuffer& coverage,
+                  const DabRequest& request) {
+    const auto plan = PlanDab(target, rect, coverage, request);
+    if (!plan) return false;
+    if (plan->rect.IsEmpty()) return true;
+    switch (GetBytesPerComponent(target.GetFormat())) {
     case 1:
-        return ComposeFor<std::uint8_t>(coverage.GetFormat(), target, clipped, coverageAt, coverage, request);
+        return ComposeFor<std::uint8_t>(coverage.GetFormat(), target, *plan, coverage, request);
     case 2:
-        return ComposeFor<std::uint16_t>(coverage.GetFormat(), target, clipped, coverageAt, coverage,
-                                         request);
+        return ComposeFor<std::uint16_t>(coverage.GetFormat(), target, *plan, coverage, request);
     default:
-        return ComposeFor<float>(coverage.GetFormat(), target, clipped, coverageAt, coverage, request);
+        return ComposeFor<float>(coverage.GetFormat(), target, *plan, coverage, request);
     }
 }
 

@@ -7,6 +7,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <optional>
 
 namespace Raster {
 
@@ -45,6 +46,22 @@ struct DabFixedPoint {
         return std::uint32_t(std::uint64_t(a) * b / 65535u);
     }
 };
+
+// What a request comes to once checked: the rect cut to the target (empty: nothing to do), where the
+// coverage is read from for its top-left, the precision of the weights (8 or 16 bits), the weight the
+// strength and dynamic give, and whether the dab stamps.
+struct DabPlan {
+    Kernel::RectT<int> rect;
+    Kernel::PointT<int> coverageAt;
+    int precisionBits = 8;
+    std::uint32_t factor = 0;
+    bool stamp = false;
+};
+// Nothing when the request cannot be met (see CompositeDab).
+std::optional<DabPlan> PlanDab(const DynamicBuffer& target, Kernel::RectT<int> rect,
+                               const DynamicBuffer& coverage, const DabRequest& request);
+// The texel index along one axis of a texture of size texels for a document coordinate.
+int DabTexel(int documentCoordinate, double scale, int size) noexcept;
 
 // Composes over rect (target pixels; clipped to the target) with the coverage pixel (0, 0) at rect's
 // top-left. Coverage in MaskA8, MaskA16 or MaskAF; any other coverage format, or a request missing what its
