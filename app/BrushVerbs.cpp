@@ -1,6 +1,7 @@
 #include "app/BrushVerbs.h"
 
 #include "app/Options.h"
+#include "brushes/PixelDab.h"
 #include "brushes/RasterPixelTool.h"
 #include "host/document/DocumentFile.h"
 #include "host/document/PixelEffect.h"
@@ -137,11 +138,12 @@ struct PaintArguments {
     bool erase = false;
     bool fromSnapshot = false;
     std::optional<std::size_t> snapshot;
+    std::string device; // empty: the processor
 };
 
 constexpr const char* kPaintUsage =
     "usage: rastertools doc paint DOC --stroke X0,Y0 [X1,Y1]... [--colour R,G,B] "
-    "[--size N] [--erase | --from-snapshot [--snapshot N]]";
+    "[--size N] [--erase | --from-snapshot [--snapshot N]] [--device D]";
 
 PaintArguments ParsePaintArguments(const std::vector<std::string>& args) {
     PaintArguments result;
@@ -176,6 +178,12 @@ PaintArguments ParsePaintArguments(const std::vector<std::string>& args) {
             if (!size || *size < 1.0 || *size > 4096.0 || *size != std::floor(*size))
                 throw UsageError("--size " + args[i] + ": expected a whole number of pixels, 1 to 4096");
             result.size = *size;
+        } else if (arg == "--device") {
+            if (!result.device.empty()) throw UsageError("--device is given more than once");
+            result.device = value();
+            if (result.device.empty() || !Raster::ParseHardwareSelector(result.device))
+                throw UsageError("--device " + result.device +
+                                 ": expected cpu, auto, opencl[:N] or cuda[:N]");
         } else if (arg == "--erase") {
             if (result.erase) throw UsageError("--erase is given more than once");
             result.erase = true;
@@ -235,6 +243,13 @@ int RunDocPaint(const std::vector<std::string>& args) {
     if (GetPixelTargets(*document).empty())
         throw Error(path + ": the document has no raster layer to paint on");
 
+    // Dabs are composed on the device named, the processor otherwise; a device that is not there is an error.
+    if (!arguments.device.empty() && arguments.device != "cpu") {
+        auto device = Raster::Hardware::GetDevice(arguments.device);
+        if (!device && arguments.device != "auto")
+            throw Error("--device " + arguments.device + ": no such device here");
+        RasterTools::SetDabDevice(device);
+    }
     auto controller = Kernel::MakeCounted<DocumentController>(document);
     controller->CreateTools();
     auto tool = Kernel::CountedCast<RasterTools::RasterPixelTool>(controller->FindTool(ToolID::Pixel));

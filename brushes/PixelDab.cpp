@@ -1,11 +1,13 @@
 #include "brushes/PixelDab.h"
 
+#include "brushes/DabDevice.h"
 #include "host/brush/RasterBrushCommand.h"
 #include "pipeline/Conversions.h"
 
 #include <algorithm>
 #include <cmath>
 #include <cstring>
+#include <mutex>
 
 namespace RasterTools {
 
@@ -158,6 +160,28 @@ std::optional<DabTarget> PrepareDab(Raster::BrushNozzle& nozzle, const Raster::R
         dab.coverage = brush->MakeCoverage(dab.rect);
     if (!dab.coverage) return std::nullopt;
     return dab;
+}
+
+namespace {
+std::mutex g_DabDeviceMutex;
+Kernel::Counted<Raster::HardwareDevice> g_DabDevice;
+} // namespace
+
+void SetDabDevice(Kernel::Counted<Raster::HardwareDevice> device) {
+    std::lock_guard lock(g_DabDeviceMutex);
+    g_DabDevice = std::move(device);
+}
+
+Kernel::Counted<Raster::HardwareDevice> GetDabDevice() {
+    std::lock_guard lock(g_DabDeviceMutex);
+    return g_DabDevice;
+}
+
+bool ComposeDab(Raster::DynamicBuffer& target, Kernel::RectT<int> rect, const Raster::DynamicBuffer& coverage,
+                const Raster::DabRequest& request) {
+    if (const auto device = GetDabDevice())
+        if (CompositeDabOnDevice(device.Get(), target, rect, coverage, request)) return true;
+    return Raster::CompositeDab(target, rect, coverage, request);
 }
 
 } // namespace RasterTools

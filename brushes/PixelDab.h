@@ -5,6 +5,7 @@
 #include "host/brush/DabComposite.h"
 #include "host/brush/RasterBrush.h"
 #include "host/document/DocumentController.h"
+#include "host/raster/device/Hardware.h"
 #include "host/renderer/Colour.h"
 
 #include <array>
@@ -60,5 +61,13 @@ struct DabTarget {
     Kernel::Counted<Raster::DynamicBuffer> coverage;
 };
 std::optional<DabTarget> PrepareDab(Raster::BrushNozzle& nozzle, const Raster::RasterBrush* brush);
+
+// The compute device the pixel commands compose their dabs on; none (the default) composes on the
+// processor. A dab the device cannot compose falls back to the processor, with the same pixels.
+void SetDabDevice(Kernel::Counted<Raster::HardwareDevice> device);
+Kernel::Counted<Raster::HardwareDevice> GetDabDevice();
+// Composes a dab on the dab device if there is one, else (or when it fails) on the processor.
+bool ComposeDab(Raster::DynamicBuffer& target, Kernel::RectT<int> rect, const Raster::DynamicBuffer& coverage,
+                const Raster::DabRequest& request);
 
 } // namespace RasterTools

@@ -85,7 +85,7 @@ void RasterPixelBrushCommand::PerformNozzle(Raster::BrushNozzle& nozzle) const {
         request.texture = texture.Get();
         request.textureScale = brush->GetMaskTextureScale();
         request.targetOrigin = nozzle.targetOrigin;
-        Raster::CompositeDab(*dab->target, dab->rect, *dab->coverage, request);
+        ComposeDab(*dab->target, dab->rect, *dab->coverage, request);
         return;
     }
     // A mask target, or a brush that only marks coverage: full intensity into the mask.
@@ -107,7 +107,7 @@ void RasterPixelBrushCommand::PerformNozzle(Raster::BrushNozzle& nozzle) const {
     request.texture = texture.Get();
     request.textureScale = brush->GetMaskTextureScale();
     request.targetOrigin = nozzle.targetOrigin;
-    Raster::CompositeDab(*mask, rect, *coverage, request);
+    ComposeDab(*mask, rect, *coverage, request);
 }
 
 void RasterPixelBrushCommand::Save(Kernel::OutSerialiser& out) const {

@@ -51,7 +51,7 @@ void RasterPixelEraseCommand::PerformNozzle(Raster::BrushNozzle& nozzle) const {
     request.texture = texture.Get();
     request.textureScale = brush->GetMaskTextureScale();
     request.targetOrigin = nozzle.targetOrigin;
-    Raster::CompositeDab(*dab->target, dab->rect, *dab->coverage, request);
+    ComposeDab(*dab->target, dab->rect, *dab->coverage, request);
 }
 
 } // namespace RasterTools

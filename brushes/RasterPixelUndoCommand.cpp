@@ -48,7 +48,7 @@ void RasterPixelUndoCommand::PerformNozzle(Raster::BrushNozzle& nozzle) const {
     request.texture = texture.Get();
     request.textureScale = brush->GetMaskTextureScale();
     request.targetOrigin = nozzle.targetOrigin;
-    Raster::CompositeDab(*dab->target, dab->rect, *dab->coverage, request);
+    ComposeDab(*dab->target, dab->rect, *dab->coverage, request);
 }
 
 } // namespace RasterTools
