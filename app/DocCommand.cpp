@@ -2,6 +2,7 @@
 // it, loads it, changes it in memory and writes it back atomically before letting go, so an error leaves the
 // file as it was and concurrent commands on one document each see the others' changes.
 
+#include "app/BrushVerbs.h"
 #include "app/CommandLine.h"
 #include "app/FilterArguments.h"
 #include "app/ImageFiles.h"
@@ -36,6 +37,8 @@ constexpr std::string_view kDocUsage =
     "       rastertools doc render DOC OUTPUT [--format F] [--device D] [--tile N] [--threads N]\n"
     "       rastertools doc show DOC\n"
     "       rastertools doc undo DOC | doc redo DOC\n"
+    "       rastertools doc paint DOC --stroke X0,Y0 [X1,Y1]... [--colour R,G,B] [--size N]\n"
+    "                             [--erase | --from-snapshot [--snapshot N]] [--device D]\n"
     "       (rastertools doc SUBCOMMAND --help says more)";
 
 // A doc subcommand's arguments, parsed; filter is set for doc filter.
@@ -431,10 +434,12 @@ int RunDoc(const std::vector<std::string>& args) {
         std::cout << CommandHelp("doc");
         return 0;
     }
+    // paint reads its own arguments (a stroke is a run of points; --erase stands alone).
+    if (subcommand == "paint") return RunDocPaint({args.begin() + 1, args.end()});
     if (std::find(std::begin(kDocSubcommands), std::end(kDocSubcommands), subcommand) ==
         std::end(kDocSubcommands))
         throw UsageError("unknown doc subcommand " + QuoteExcerpt(subcommand) +
-                         " (new, filter, render, show, undo, redo)");
+                         " (new, filter, render, show, undo, redo, paint)");
     const DocArguments arguments = ParseDoc(subcommand, {args.begin() + 1, args.end()});
     if (arguments.help) return 0;
     if (subcommand == "new") return RunNew(arguments);

@@ -1,6 +1,7 @@
 // rastertools play: drives the library's tools through the host as an editor would, one verb a line,
 // and prints what the host sees (hints, notifications, enqueued commands, merges, history, settings).
 
+#include "app/BrushVerbs.h"
 #include "app/FilterArguments.h"
 #include "app/Options.h"
 #include "filters/Catalogue.h"
@@ -136,8 +137,11 @@ public:
         } else if (verb == "render") {
             arguments(1, 1, "render OUTPUT");
             Render(InFolder(words[1], true));
+        } else if (auto brush = RunBrushVerb(*m_Controller, m_Tool, words, m_Out)) {
+            if (!brush->empty()) throw ScriptError(*brush);
         } else {
-            throw ScriptError("unknown verb " + QuoteExcerpt(verb) + " (verbs: " + std::string(kVerbs) + ")");
+            throw ScriptError("unknown verb " + QuoteExcerpt(verb) + " (verbs: " + std::string(kVerbs) +
+                              ", " + kBrushVerbs + ")");
         }
     }
 
@@ -157,7 +161,16 @@ private:
     void SelectTool(const std::string& name) {
         const RasterTools::FilterInfo* info = RasterTools::FindFilter(name);
         auto tool = info ? m_Controller->FindTool(info->toolID) : nullptr;
-        if (!tool) throw ScriptError("unknown tool " + QuoteExcerpt(name) + " (tools: " + ToolNames() + ")");
+        if (!tool && (tool = FindBrushTool(*m_Controller, name))) {
+            m_Filter = nullptr;
+            m_PreviousTool = m_Controller->SetActiveTool(tool);
+            m_Tool = tool;
+            m_Out << "  tool " << name << " (id " << int(tool->GetToolID()) << ")\n";
+            return;
+        }
+        if (!tool)
+            throw ScriptError("unknown tool " + QuoteExcerpt(name) + " (tools: " + ToolNames() + ", " +
+                              kBrushToolNames + ")");
         m_Filter = info;
         m_PreviousTool = m_Controller->SetActiveTool(tool);
         m_Tool = tool;
@@ -295,6 +308,8 @@ private:
     void Show(const std::string& what) {
         if (what == "params") {
             RequireTool();
+            if (!m_Filter)
+                throw ScriptError("the tool has no filter parameters (show reflected lists its properties)");
             const auto reflecteds = m_Tool->EnumerateReflecteds();
             for (const auto& spec : m_Filter->parameters)
                 for (const auto& property : reflecteds)

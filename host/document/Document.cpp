@@ -43,6 +43,7 @@ bool SwapPatchPixels(PixelPatch& patch) {
         rect.Intersect(pixels->GetBounds()) != rect || patch.pixels->GetWidth() != rect.Width() ||
         patch.pixels->GetHeight() != rect.Height())
         return false;
+    patch.layer->WillWritePixels(rect, patch.pixels.Get());
     const std::size_t bpp = std::size_t(pixels->GetBytesPerPixel());
     const std::size_t bytes = std::size_t(rect.Width()) * bpp;
     for (int y = 0; y < rect.Height(); ++y)

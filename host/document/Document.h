@@ -13,6 +13,17 @@
 #include <string>
 #include <vector>
 
+class RasterNode;
+
+// Told before a raster layer's pixels are changed in place, so that it can keep what was there.
+class PixelWriteObserver {
+public:
+    virtual ~PixelWriteObserver() = default;
+    // incoming: the pixels rect is about to receive (rect's size), or null when they are not known.
+    virtual void WillWritePixels(const RasterNode& layer, Kernel::RectT<int> rect,
+                                 const Raster::DynamicBuffer* incoming) = 0;
+};
+
 // One layer of a document. Nodes keep their identity for their whole life; history entries refer to them.
 class Node : public virtual Kernel::Countable {
 public:
@@ -40,7 +51,15 @@ public:
     std::string GetKindName() const override { return "raster"; }
 
     const Kernel::Counted<Raster::DynamicBuffer>& GetPixels() const noexcept { return m_Pixels; }
+    // Replacing the buffer leaves the old one untouched, so observers of in-place writes need no word of it.
     void SetPixels(Kernel::Counted<Raster::DynamicBuffer> pixels) { m_Pixels = std::move(pixels); }
+    // Whoever changes the pixels in place calls WillWritePixels first (rect in layer pixels).
+    void AddWriteObserver(PixelWriteObserver* observer) { m_Observers.push_back(observer); }
+    void RemoveWriteObserver(PixelWriteObserver* observer) { std::erase(m_Observers, observer); }
+    void WillWritePixels(Kernel::RectT<int> rect, const Raster::DynamicBuffer* incoming = nullptr) const {
+        for (PixelWriteObserver* observer : m_Observers)
+            observer->WillWritePixels(*this, rect, incoming);
+    }
     // Where the layer's top-left pixel sits in document pixels.
     Kernel::PointT<int> GetOffset() const noexcept { return m_Offset; }
     void SetOffset(Kernel::PointT<int> offset) noexcept { m_Offset = offset; }
@@ -57,6 +76,7 @@ private:
     Kernel::Counted<Raster::DynamicBuffer> m_Pixels;
     Kernel::PointT<int> m_Offset;
     std::vector<std::byte> m_Profile;
+    std::vector<PixelWriteObserver*> m_Observers;
 };
 
 // Gives access to the filter command of a live filter layer.

@@ -61,9 +61,67 @@ Kernel::Counted<Tool> DocumentController::SetActiveTool(Kernel::Counted<Tool> to
     return std::exchange(m_ActiveTool, std::move(tool));
 }
 
+DocumentSnapshot::DocumentSnapshot(Document::NodeList layers, Document::NodeList selection)
+    : m_Layers(std::move(layers))
+    , m_Selection(std::move(selection)) {
+    for (const auto& node : m_Layers)
+        if (auto raster = Kernel::CountedCast<RasterNode>(node))
+            m_Pixels.push_back(Kernel::MakeCounted<LayerSnapshot>(raster));
+}
+
+const LayerSnapshot* DocumentSnapshot::FindLayer(std::uint64_t layerId) const {
+    for (const auto& layer : m_Pixels)
+        if (layer->GetLayer()->GetId() == layerId) return layer.Get();
+    return nullptr;
+}
+
+Kernel::Counted<Raster::DynamicBuffer> DocumentSnapshot::ReadLayerPixels(std::uint64_t layerId,
+                                                                         Kernel::RectT<int> rect) const {
+    const LayerSnapshot* layer = FindLayer(layerId);
+    return layer ? layer->Read(rect) : nullptr;
+}
+
+std::size_t DocumentSnapshot::GetKeptBytes() const noexcept {
+    std::size_t bytes = 0;
+    for (const auto& layer : m_Pixels)
+        bytes += layer->GetKeptBytes();
+    return bytes;
+}
+
+void DocumentController::SetCurrentSnapshot(Kernel::Counted<DocumentSnapshot> snapshot) {
+    m_CurrentSnapshot = std::move(snapshot);
+    Report(m_CurrentSnapshot ? "snapshot nominated" : "snapshot cleared");
+}
+
+const Kernel::Counted<DocumentSnapshot>& DocumentController::NominateSnapshot() {
+    SetCurrentSnapshot(TakeSnapshot());
+    return m_CurrentSnapshot;
+}
+
+void DocumentController::SelectPrimaryColourContext(bool primary) {
+    m_PrimaryColourContext = primary;
+    Report(primary ? "colour context primary" : "colour context secondary");
+}
+
+void DocumentController::SetFillForContext(int context, const Renderer::ConsolidatedColour& colour) {
+    if (context != 1 && context != 2) return;
+    (context == 2 ? m_Defaults.foreground : m_Defaults.background) = colour;
+    Report(std::string(context == 2 ? "foreground" : "background") + " colour " +
+           Kernel::ReflectedValueTraits<Renderer::ConsolidatedColour>::Format(colour));
+}
+
+int DocumentController::GetFormat() const {
+    if (!m_Document) return 0;
+    for (const auto& layer : GetPixelTargets(*m_Document))
+        if (layer->GetPixels()) return int(layer->GetPixels()->GetFormat());
+    return 0;
+}
+
 void DocumentController::SetDocument(Kernel::Counted<Document> document) {
     if (!document) return;
     EndLiveEffectEdit();
+    // A snapshot names layers of the document it was taken from.
+    m_CurrentSnapshot = {};
     m_Document = std::move(document);
     Report("document replaced");
     Post(Kernel::MakeCounted<NewSelectionNotification>(this));

@@ -3,9 +3,11 @@
 
 #include "host/document/Command.h"
 #include "host/document/Document.h"
+#include "host/document/LayerSnapshot.h"
 #include "host/document/Tool.h"
 #include "host/kernel/Countable.h"
 #include "host/kernel/Notification.h"
+#include "host/renderer/Colour.h"
 
 #include <functional>
 #include <string>
@@ -16,20 +18,38 @@ struct DocumentDefaults {
     int width = 1024;
     int height = 768;
     double resolution = 72.0; // pixels per inch
+    Renderer::ConsolidatedColour foreground{0.0f, 0.0f, 0.0f, 1.0f};
+    Renderer::ConsolidatedColour background{1.0f, 1.0f, 1.0f, 1.0f};
+
+    const Renderer::ConsolidatedColour& GetForegroundColour() const noexcept { return foreground; }
+    const Renderer::ConsolidatedColour& GetBackgroundColour() const noexcept { return background; }
 };
 
-// The layer stack and selection at one moment; layers are shared, so a snapshot is cheap.
+// The colour profiles a document's colours are converted through; the reference host has no profiles of its
+// own, so colours convert by the pixel formats' fixed rules.
+struct ColourProfiles {};
+
+// The layer stack, selection and raster pixels at one moment. Layers are shared and pixels are kept a tile
+// at a time only where they later change, so a snapshot costs memory only for what changes after it.
 class DocumentSnapshot : public virtual Kernel::Countable {
 public:
-    DocumentSnapshot(Document::NodeList layers, Document::NodeList selection)
-        : m_Layers(std::move(layers))
-        , m_Selection(std::move(selection)) {}
+    DocumentSnapshot(Document::NodeList layers, Document::NodeList selection);
     const Document::NodeList& GetLayers() const noexcept { return m_Layers; }
     const Document::NodeList& GetSelection() const noexcept { return m_Selection; }
+
+    // The snapshot's pixels of rect (layer pixels) of the raster layer with this id; null when the layer is
+    // not in the snapshot or rect is not within the layer as it was.
+    Kernel::Counted<Raster::DynamicBuffer> ReadLayerPixels(std::uint64_t layerId,
+                                                           Kernel::RectT<int> rect) const;
+    // The pixel format the layer had, if it is in the snapshot.
+    const LayerSnapshot* FindLayer(std::uint64_t layerId) const;
+    // Bytes of pixels kept because they changed after the snapshot was taken.
+    std::size_t GetKeptBytes() const noexcept;
 
 private:
     Document::NodeList m_Layers;
     Document::NodeList m_Selection;
+    std::vector<Kernel::Counted<LayerSnapshot>> m_Pixels;
 };
 
 // Always held by Kernel::Counted: tools keep it alive through GetSafeDocumentController.
@@ -68,6 +88,22 @@ public:
     Kernel::Counted<DocumentSnapshot> TakeSnapshot() const;
     // Puts the snapshot's layers and selection back; history is left as it is.
     void RestoreSnapshot(const DocumentSnapshot& snapshot);
+    // The snapshot the user nominated for restoring from (the undo brush); null when none is.
+    const Kernel::Counted<DocumentSnapshot>& GetCurrentSnapshot() const noexcept { return m_CurrentSnapshot; }
+    void SetCurrentSnapshot(Kernel::Counted<DocumentSnapshot> snapshot);
+    // Takes a snapshot of the document as it is now and nominates it.
+    const Kernel::Counted<DocumentSnapshot>& NominateSnapshot();
+
+    // Two colour contexts: the primary one paints with the foreground colour, the secondary one with the
+    // background colour.
+    bool IsPrimaryColourContextSelected() const noexcept { return m_PrimaryColourContext; }
+    void SelectPrimaryColourContext(bool primary);
+    // Sets the solid fill of colour context 2 (the foreground colour) or 1 (the background colour).
+    void SetFillForContext(int context, const Renderer::ConsolidatedColour& colour);
+    const ColourProfiles& GetProfiles() const noexcept { return m_Profiles; }
+    // The document's colour format: that of the first layer painted (GetPixelTargets), as an integer
+    // PixelFormat; 0 without one.
+    int GetFormat() const;
 
     // Replaces the layer selection and tells the active tool.
     void SetSelection(Document::NodeList selection);
@@ -106,6 +142,9 @@ private:
     int m_Cursor = 0;
     Observer m_Observer;
     int m_NotifyDepth = 0;
+    Kernel::Counted<DocumentSnapshot> m_CurrentSnapshot;
+    bool m_PrimaryColourContext = true;
+    ColourProfiles m_Profiles;
 };
 
 // One line that names a command and its reflected parameters: "Add Noise inte=0.5 mono=false".

@@ -13,18 +13,20 @@ class LayerRaster final : public MutableRasterInterface {
 public:
     LayerRaster(Kernel::Counted<Raster::DynamicBuffer> pixels, Raster::AffineTransform::Params transform,
                 const SelectionRasterNode* selection, const PixelEffectOptions& options, double first,
-                double share)
+                double share, std::uint64_t layerId)
         : m_Pixels(std::move(pixels))
         , m_Transform(transform)
         , m_Selection(selection)
         , m_Options(options)
         , m_First(first)
-        , m_Share(share) {}
+        , m_Share(share)
+        , m_LayerId(layerId) {}
 
     Kernel::Counted<Raster::DynamicBuffer> GetPixels() const override { return m_Pixels; }
     Kernel::RectT<int> GetRasterBoundingBox() const override { return m_Pixels->GetBounds(); }
     Raster::AffineTransform::Params GetTransform() const override { return m_Transform; }
     const SelectionRasterNode* GetSelection() const override { return m_Selection; }
+    std::uint64_t GetLayerId() const override { return m_LayerId; }
     const bool* GetAbort() const override { return m_Options.abort; }
     void Progress(double fraction) const override {
         if (m_Options.progress) m_Options.progress(m_First + m_Share * std::clamp(fraction, 0.0, 1.0));
@@ -37,6 +39,7 @@ private:
     const PixelEffectOptions& m_Options;
     double m_First;
     double m_Share;
+    std::uint64_t m_LayerId;
 };
 
 Kernel::Counted<Raster::DynamicBuffer> Crop(const Raster::DynamicBuffer& image, Kernel::RectT<int> rect) {
@@ -83,7 +86,7 @@ std::optional<std::string> ApplyPixelCommand(Document& document,
         auto work = layer->GetPixels()->Clone();
         if (!work) return "not enough memory to change layer \"" + layer->GetName() + "\"";
         LayerRaster raster(work, layer->GetTransform(), selection, options,
-                           double(i) / double(targets.size()), 1.0 / double(targets.size()));
+                           double(i) / double(targets.size()), 1.0 / double(targets.size()), layer->GetId());
         const Kernel::RectT<int> changed =
             command->DoEffect(Kernel::NonCounted<MutableRasterInterface>(&raster))
                 .Intersect(work->GetBounds());

@@ -7,6 +7,7 @@
 #include "host/raster/AffineTransform.h"
 #include "host/raster/DynamicBuffer.h"
 
+#include <cstdint>
 #include <functional>
 
 // A pixel selection: a MaskA8 image in document pixels (255 selected, 0 not).
@@ -37,6 +38,8 @@ public:
     virtual Raster::AffineTransform::Params GetTransform() const = 0;
     // The document's pixel selection, or null when it has none.
     virtual const SelectionRasterNode* GetSelection() const = 0;
+    // The identity of the layer opened (Node::GetId), 0 when it is not a document's layer.
+    virtual std::uint64_t GetLayerId() const { return 0; }
     // Host-owned abort flag (may be null), only read.
     virtual const bool* GetAbort() const { return nullptr; }
     // Receives the fraction of the work done, from any thread, one call at a time.

@@ -3,6 +3,7 @@
 
 enum class ToolID : int {
     None = 0,
+    Pixel = 41,
     Twirl = 53,
     AddNoise = 55,
     Diffuse = 56,
