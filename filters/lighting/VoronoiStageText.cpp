@@ -51,11 +51,11 @@ v.row = VoronoiCellIndex(p.y,v.origin.y,v.cell);
 v.col = VoronoiCellIndex(p.x,v.origin.x,v.cell);
 v.line = %1;
 v.dimension = v.lineWidth > 0.0f ? 5 : 3;
-const int half = v.dimension / 2;
+const int reach = v.dimension / 2;
 float2 sites[25];
 for (int r = 0; r < v.dimension; ++r)
     for (int c = 0; c < v.dimension; ++c)
-        sites[(r + 2 - half) * 5 + c + 2 - half] = VoronoiSite(v.row - half + r,v.col - half + c,v.cell,v.origin);
+        sites[(r + 2 - reach) * 5 + c + 2 - reach] = VoronoiSite(v.row - reach + r,v.col - reach + c,v.cell,v.origin);
 float2 around[9];
 for (int r = 0; r < 3; ++r)
     for (int c = 0; c < 3; ++c)
