@@ -230,7 +230,8 @@ public:
     }
 
     // The sampler block for a render through view (source pixels to output pixels): the cell in output
-    // pixels (the size over the scale of the view's inverse, at least 2; a singular view gives 2), the line
+    // pixels (the size over the scale of the view's inverse, at least 2 and at most CellLimit, which a
+    // singular view, whose inverse has the scale 0, reaches), the line
     // width in output pixels, and the view's translation as the grid's origin.
     VoronoiSampler::Params GetSamplerParams(const Raster::AffineTransform::Params& view) const noexcept {
         double cell = m_Params.size / Scale(Raster::AffineTransform::Invert(view));
