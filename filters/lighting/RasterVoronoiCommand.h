@@ -145,8 +145,10 @@ struct VoronoiSampler {
                         total += weight;
                     }
                 }
-                acc = sum / total;
-                acc = acc * (1.0f - w) + line * w;
+                // Dividing by 1, and then mixing in none of the line, change no bit of a sum that starts at
+                // +0 (it is never -0): the usual pixel, deep inside its cell, skips both.
+                acc = total == 1.0f ? sum : sum / total;
+                if (w != 0.0f || total != 1.0f) acc = acc * (1.0f - w) + line * w;
             }
             const Stored colour = Traits::FromAccumulator(Traits::Clamp(acc));
             // The colour channels; alpha (the last) stays the source pixel's.
