@@ -31,18 +31,25 @@ struct VoronoiSampler {
         return line;
     }
 
-    // The sites of the grid cells a span needs: rows row - 2 .. row + 2 (only the middle three without
-    // lines) and a window of columns that moves on when a pixel's neighbourhood leaves it; and the border
-    // edges of the cells that turn out closest. Every value is computed by VoronoiMath as the kernel text
-    // computes it per pixel, so caching changes no bit.
+    // The sites of the grid cells around one grid row: rows row - 2 .. row + 2 (only the middle three
+    // without lines) and a window of columns that moves on when a pixel's neighbourhood leaves it; and the
+    // border edges of the cells that turn out closest. Every value is computed by VoronoiMath as the kernel
+    // text computes it per pixel, so caching changes no bit. Each rendering thread keeps one, which the
+    // spans of a tile's rows share while they lie in the same grid row.
     class SpanCells {
     public:
-        SpanCells(int row, float cell, Raster::KernelMath::float2 origin, bool lines) noexcept
-            : m_Row(row)
-            , m_Cell(cell)
-            , m_Origin(origin)
-            , m_FirstRow(lines ? 0 : 1)
-            , m_LastRow(lines ? 4 : 3) {}
+        // Starts over unless the grid and row are those already held.
+        void Use(int row, float cell, Raster::KernelMath::float2 origin, bool lines) noexcept {
+            if (m_Filled >= 0 && row == m_Row && cell == m_Cell && origin.x == m_Origin.x &&
+                origin.y == m_Origin.y && lines == (m_FirstRow == 0))
+                return;
+            m_Row = row;
+            m_Cell = cell;
+            m_Origin = origin;
+            m_FirstRow = lines ? 0 : 1;
+            m_LastRow = lines ? 4 : 3;
+            m_Filled = -1;
+        }
 
         // Makes the columns col - 2 .. col + 2 available.
         void Cover(int col) noexcept {
@@ -82,11 +89,11 @@ struct VoronoiSampler {
         }
 
     private:
-        static constexpr int Columns = 24;
-        int m_Row;
-        float m_Cell;
-        Raster::KernelMath::float2 m_Origin;
-        int m_FirstRow, m_LastRow;
+        static constexpr int Columns = 48;
+        int m_Row = 0;
+        float m_Cell = 0.0f;
+        Raster::KernelMath::float2 m_Origin{};
+        int m_FirstRow = 1, m_LastRow = 3;
         int m_FirstColumn = 0;
         int m_Filled = -1; // nothing yet: the first Cover places the window
         Raster::KernelMath::float2 m_Sites[5][Columns];
@@ -112,7 +119,8 @@ struct VoronoiSampler {
         const float py = (float)y;
         const int row = VoronoiCellIndex(py, origin.y, cell);
         const Accumulator line = LineColour<F>();
-        SpanCells cells(row, cell, origin, lines);
+        static thread_local SpanCells cells;
+        cells.Use(row, cell, origin, lines);
         for (int i = 0; i < n; ++i) {
             const float2 p = make_float2((float)(x0 + i), py);
             const int col = VoronoiCellIndex(p.x, origin.x, cell);
