@@ -34,8 +34,7 @@ struct VoronoiSampler {
     // The sites of the grid cells around one grid row: rows row - 2 .. row + 2 (only the middle three
     // without lines) and a window of columns that moves on when a pixel's neighbourhood leaves it; and the
     // border edges of the cells that turn out closest. Every value is computed by VoronoiMath as the kernel
-    // text computes it per pixel, so caching changes no bit. Each rendering thread keeps one, which the
-    // spans of a tile's rows share while they lie in the same grid row.
+    // text computes it per pixel, so caching changes no bit.
     class SpanCells {
     public:
         // Starts over unless the grid and row are those already held.
@@ -89,7 +88,7 @@ struct VoronoiSampler {
         }
 
     private:
-        static constexpr int Columns = 48;
+        static constexpr int Columns = 24;
         int m_Row = 0;
         float m_Cell = 0.0f;
         Raster::KernelMath::float2 m_Origin{};
@@ -119,7 +118,7 @@ struct VoronoiSampler {
         const float py = (float)y;
         const int row = VoronoiCellIndex(py, origin.y, cell);
         const Accumulator line = LineColour<F>();
-        static thread_local SpanCells cells;
+        SpanCells cells;
         cells.Use(row, cell, origin, lines);
         for (int i = 0; i < n; ++i) {
             const float2 p = make_float2((float)(x0 + i), py);
