@@ -196,6 +196,8 @@ public:
     // single-precision arithmetic keeps whole pixels.
     static constexpr double CellLimit = 16777216.0;
 
+    // For loading: Load then sets the fields.
+    RasterVoronoiCommand() = default;
     RasterVoronoiCommand(bool liveEffect, double size, double lineWidth)
         : SinglePassCommand(liveEffect, VoronoiParameters{size, lineWidth}) {}
     // The host's form: the layers selected when the command is made.
@@ -260,10 +262,6 @@ public:
         params.transform = Raster::AffineTransform::Invert(view);
         params.sampler = GetSamplerParams(view);
     }
-
-private:
-    friend class FilterCommand<VoronoiFilter>; // creates the default-constructed command for loading
-    RasterVoronoiCommand() = default;
 };
 
 } // namespace RasterTools
