@@ -20,6 +20,8 @@ OPERATIONS=(noise-gaussian noise-uniform diffuse edge twirl-90 sphere-50)
 OPERATIONS+=(motionblur-10 motionblur-50 motionblur-200)
 OPERATIONS+=(texture-1 texture-3)
 OPERATIONS+=(lighting-directional lighting-spot)
+# Voronoi cells of 32 pixels with lines of 10 %, once against each of GEGL's cell-like filters.
+OPERATIONS+=(voronoi-mosaic voronoi-cubism voronoi-cellnoise)
 [ $# -gt 0 ] && OPERATIONS=("$@")
 
 # ---- Peers from Debian
@@ -89,6 +91,7 @@ rastertools_command() {
   # One light; the spot over the relief of the image's own luminance, as the peers' shading takes it.
   lighting-directional) echo "$rastertools apply lighting --light 2 $common $input $2" ;;
   lighting-spot) echo "$rastertools apply lighting --light 0 --depth 5 --outercone 60 $common $input $2" ;;
+  voronoi-*) echo "$rastertools apply voronoi --size 32 --line-width 10 $common $input $2" ;;
   esac
 }
 imagemagick_command() {
@@ -137,6 +140,11 @@ gegl_command() {
   diffuse) echo "$env gegl -i $input -o $2 -- gegl:noise-spread amount-x=5 amount-y=5" ;;
   # A distant light over the image's own relief (the image again as the height map).
   lighting-*) echo "$env gegl -i $input -o $2 -- gegl:bump-map azimuth=135 elevation=30 depth=5 aux=[ gegl:load path=$input ]" ;;
+  # Cells of 32 pixels: mosaic's tiles (with its grout lines), cubism's squares, and the cell noise pattern
+  # rendered over the image's area.
+  voronoi-mosaic) echo "$env gegl -i $input -o $2 -- gegl:mosaic tile-size=32" ;;
+  voronoi-cubism) echo "$env gegl -i $input -o $2 -- gegl:cubism tile-size=32" ;;
+  voronoi-cellnoise) echo "$env gegl -i $input -o $2 -- gegl:cell-noise scale=0.03125" ;;
   esac
 }
 # TOOLS (default all four) picks the tools, e.g. TOOLS="rastertools vips" to leave out the slowest.

@@ -265,6 +265,7 @@ TEST(CommandAnswers, EveryRegisteredCommandGivesTheHostContractsAnswers) {
         {"RasterMotionBlurCommand", "RMoB", true, true, false, false, 2},
         {"RasterSphereCommand", "RSpC", true, true, false, false, 2},
         {"RasterTwirlCommand", "RTwC", true, true, false, false, 2},
+        {"RasterVoronoiCommand", "RVoC", false, true, false, false, 2},
         {"RasterCopyCommand", "RCpy", false, false, false, false, 2},
         {"RasterVerticalEdgeDetectCommand", "RVEd", true, true, false, true, 0},
         {"ProceduralTextureCommand", "PrTx", true, false, false, false, 2},

@@ -1,0 +1,272 @@
+#pragma once
+// The Voronoi command: the layer becomes irregular cells, each filled with the colour under its site, with
+// optional black border lines; alpha is kept. Also its Sample stage for the processor and its kinds of
+// render: one per layer format, source and destination alike, without or with a mask.
+
+#include "filters/lighting/Voronoi.h"
+#include "filters/lighting/VoronoiMath.h"
+#include "frame/SinglePassCommand.h"
+#include "pipeline/Conversions.h"
+#include "pipeline/Pipeline.h"
+
+#include <cmath>
+#include <cstring>
+#include <vector>
+
+namespace RasterTools {
+
+// The cell colour of each destination pixel (VoronoiMath), blended towards the line colour by the border
+// weight, with the alpha of the source pixel under the destination pixel. Sites are read through Transform
+// and Extend; the grid lies in destination pixels.
+struct VoronoiSampler {
+    struct Params {
+        float block[VoronoiMath::SamplerFloatCount] = {2.0f, 0.0f, 0.0f, 0.0f};
+    };
+
+    // Opaque black in the format, as its accumulator.
+    template <Raster::PixelFormat F>
+    static typename Raster::PixelTraits<F>::Accumulator LineColour() noexcept {
+        static const auto line = Raster::PixelTraits<F>::Accumulate(
+            FromWorking<F>(Raster::KernelMath::make_float4(0.0f, 0.0f, 0.0f, 1.0f)));
+        return line;
+    }
+
+    // The sites of the grid cells around one grid row: rows row - 2 .. row + 2 (only the middle three
+    // without lines) and a window of columns that moves on when a pixel's neighbourhood leaves it; and the
+    // border edges of the cells that turn out closest. Every value is computed by VoronoiMath as the kernel
+    // text computes it per pixel, so caching changes no bit.
+    class SpanCells {
+    public:
+        // Starts over unless the grid and row are those already held.
+        void Use(int row, float cell, Raster::KernelMath::float2 origin, bool lines) noexcept {
+            if (m_Filled >= 0 && row == m_Row && cell == m_Cell && origin.x == m_Origin.x &&
+                origin.y == m_Origin.y && lines == (m_FirstRow == 0))
+                return;
+            m_Row = row;
+            m_Cell = cell;
+            m_Origin = origin;
+            m_FirstRow = lines ? 0 : 1;
+            m_LastRow = lines ? 4 : 3;
+            m_Filled = -1;
+        }
+
+        // Makes the columns col - 2 .. col + 2 available.
+        void Cover(int col) noexcept {
+            if (m_Filled < 0 || col - 2 < m_FirstColumn || col + 2 >= m_FirstColumn + Columns) {
+                m_FirstColumn = col - 2;
+                m_Filled = 0;
+                std::memset(m_EdgesKnown, 0, sizeof m_EdgesKnown);
+            }
+            for (; m_FirstColumn + m_Filled <= col + 2; ++m_Filled)
+                for (int r = m_FirstRow; r <= m_LastRow; ++r)
+                    m_Sites[r][m_Filled] =
+                        VoronoiMath::VoronoiSite(m_Row - 2 + r, m_FirstColumn + m_Filled, m_Cell, m_Origin);
+        }
+
+        // The 3 × 3 sites around grid cell (row + rowOffset, col), row-major; rowOffset is -1, 0 or 1.
+        void Around(int rowOffset, int col, Raster::KernelMath::float2* sites) const noexcept {
+            for (int r = 0; r < 3; ++r)
+                for (int c = 0; c < 3; ++c)
+                    sites[r * 3 + c] = m_Sites[rowOffset + 1 + r][col - 1 - m_FirstColumn + c];
+        }
+
+        struct Edges {
+            Raster::KernelMath::float4 edges[8];
+            float scales[8];
+        };
+        // The bisectors between the site of grid cell (row + rowOffset, col) and its 8 neighbours' sites.
+        const Edges& EdgesOf(int rowOffset, int col) noexcept {
+            const int c = col - m_FirstColumn;
+            Edges& edges = m_Edges[rowOffset + 1][c];
+            if (!m_EdgesKnown[rowOffset + 1][c]) {
+                Raster::KernelMath::float2 ring[9];
+                Around(rowOffset, col, ring);
+                VoronoiMath::VoronoiEdges(ring, edges.edges, edges.scales);
+                m_EdgesKnown[rowOffset + 1][c] = true;
+            }
+            return edges;
+        }
+
+    private:
+        static constexpr int Columns = 24;
+        int m_Row = 0;
+        float m_Cell = 0.0f;
+        Raster::KernelMath::float2 m_Origin{};
+        int m_FirstRow = 1, m_LastRow = 3;
+        int m_FirstColumn = 0;
+        int m_Filled = -1; // nothing yet: the first Cover places the window
+        Raster::KernelMath::float2 m_Sites[5][Columns];
+        bool m_EdgesKnown[3][Columns] = {};
+        Edges m_Edges[3][Columns];
+    };
+
+    template <class Transform, class Extend, class Image>
+    static void SampleSpan(const Image& image, const Raster::PreparedTransform<Transform>& t,
+                           const Params& params, int x0, int y, int n, typename Image::Stored* out) noexcept {
+        using namespace VoronoiMath;
+        constexpr Raster::PixelFormat F = Image::Format;
+        using Traits = Raster::PixelTraits<F>;
+        using Accumulator = typename Traits::Accumulator;
+        using Stored = typename Image::Stored;
+        using Component = Raster::FormatComponent<F>;
+        constexpr int Channels = Raster::GetChannelCount(F);
+
+        const float cell = params.block[CellIndex];
+        const float lineWidth = params.block[LineWidthIndex];
+        const float2 origin = make_float2(params.block[OriginXIndex], params.block[OriginYIndex]);
+        const bool lines = lineWidth > 0.0f;
+        const float py = (float)y;
+        const int row = VoronoiCellIndex(py, origin.y, cell);
+        const Accumulator line = LineColour<F>();
+        SpanCells cells;
+        cells.Use(row, cell, origin, lines);
+        for (int i = 0; i < n; ++i) {
+            const float2 p = make_float2((float)(x0 + i), py);
+            const int col = VoronoiCellIndex(p.x, origin.x, cell);
+            cells.Cover(col);
+            float2 around[9];
+            cells.Around(0, col, around);
+            float d2[9];
+            const int closest = VoronoiClosest(around, p, d2);
+            float w = 0.0f;
+            if (lines) {
+                const auto& edges = cells.EdgesOf(closest / 3 - 1, col - 1 + closest % 3);
+                w = VoronoiLineWeight(VoronoiBorderDistance(edges.edges, edges.scales, p), lineWidth);
+            }
+            Stored pixel =
+                Extend::Read(image, Raster::TransformPixelCenterToInt<Transform>(make_int2(x0 + i, y), t));
+            Accumulator acc;
+            if (w == 1.0f) {
+                acc = line;
+            } else {
+                const float best = d2[closest];
+                const float minD = VoronoiMinDistance(best);
+                const float threshold = VoronoiThreshold(minD);
+                Accumulator sum{};
+                float total = 0.0f;
+                for (int s = 0; s < 9; ++s) {
+                    const float weight = VoronoiBlendWeight(d2[s], best, minD, threshold, around[s], p);
+                    if (weight > 0.0f) {
+                        const int2 at = convert_int2(Transform::Transform(around[s], t));
+                        sum += Traits::Accumulate(Extend::Read(image, at)) * weight;
+                        total += weight;
+                    }
+                }
+                // Dividing by 1, and then mixing in none of the line, change no bit of a sum that starts at
+                // +0 (it is never -0): the usual pixel, deep inside its cell, skips both.
+                acc = total == 1.0f ? sum : sum / total;
+                if (w != 0.0f || total != 1.0f) acc = acc * (1.0f - w) + line * w;
+            }
+            const Stored colour = Traits::FromAccumulator(Traits::Clamp(acc));
+            // The colour channels; alpha (the last) stays the source pixel's.
+            std::memcpy(&pixel, &colour, sizeof(Component) * (Channels - 1));
+            out[i] = pixel;
+        }
+    }
+};
+
+namespace VoronoiStages {
+
+// The view's inverse takes sites and pixels to the source; the layer's edge pixels continue outwards, so
+// cells whose site lies beyond the layer take the nearest edge colour.
+template <Raster::PixelFormat F>
+using Plain = PipelineStages<Raster::Copy, Raster::IdentityMask, VoronoiSampler, Raster::AffineTransform,
+                             Raster::Safe, FormatList<F>, FormatList<F>>;
+template <Raster::PixelFormat F>
+using Masked = PipelineStages<Raster::Copy, Raster::BitmapMask, VoronoiSampler, Raster::AffineTransform,
+                              Raster::Safe, FormatList<F>, FormatList<F>>;
+
+} // namespace VoronoiStages
+
+// The sampler's kernel text, per source format and language (null for an unknown language or a format that
+// is not a layer format).
+template <>
+struct StageText<VoronoiSampler> {
+    static const char* Get(HardwareKernelLanguage language, Raster::PixelFormat source);
+};
+
+class RasterVoronoiCommand final : public SinglePassCommand<VoronoiFilter> {
+public:
+    template <Raster::PixelFormat F>
+    using PlainStages = VoronoiStages::Plain<F>;
+    template <Raster::PixelFormat F>
+    using MaskedStages = VoronoiStages::Masked<F>;
+
+    // The largest cell in output pixels: far beyond any layer, and small enough that the grid's
+    // single-precision arithmetic keeps whole pixels.
+    static constexpr double CellLimit = 16777216.0;
+
+    // For loading: Load then sets the fields.
+    RasterVoronoiCommand() = default;
+    RasterVoronoiCommand(bool liveEffect, double size, double lineWidth)
+        : SinglePassCommand(liveEffect, VoronoiParameters{size, lineWidth}) {}
+    // The host's form: the layers selected when the command is made.
+    RasterVoronoiCommand(bool liveEffect, double size, double lineWidth,
+                         const std::vector<Kernel::Counted<Node>>& selection)
+        : SinglePassCommand(liveEffect, VoronoiParameters{size, lineWidth}) {
+        SetSelection(selection);
+    }
+    RasterVoronoiCommand(bool liveEffect, const VoronoiParameters& params)
+        : SinglePassCommand(liveEffect, params) {}
+
+    double GetSize() const noexcept { return m_Params.size; }
+    double GetLineWidth() const noexcept { return m_Params.lineWidth; }
+
+    bool CanAffectAlpha() const override { return false; }
+    // Cells of zero size are no effect at all.
+    bool DoesAnything() const noexcept { return std::fabs(m_Params.size) > 1e-6; }
+
+    // A pixel reads sites up to a cell away, and pixels beyond the layer take its cells too: both areas grow
+    // by the size, in whole pixels.
+    static double Margin(const VoronoiParameters& params) noexcept { return std::ceil(params.size); }
+
+    // How an affine map scales lengths here: the length of its image of (1, 1), over √2.
+    static double Scale(const Raster::AffineTransform::Params& transform) noexcept {
+        const auto& m = transform.m;
+        return std::sqrt(((m[0] + m[1]) * (m[0] + m[1]) + (m[3] + m[4]) * (m[3] + m[4])) * 0.5);
+    }
+    // The layer was transformed: the cells scale with it. The line width, a percentage, stays.
+    void ApplyTransform(const Raster::AffineTransform::Params& transform) {
+        m_Params.size *= Scale(transform);
+        BoundParameters(m_Params, VoronoiFilter::kParameters);
+    }
+    // The converse: the size divided by the scale of the inverse map. False, changing nothing, when that
+    // scale is 0 (a singular map, whose inverse collapses) or not a number.
+    bool ApplyInverseTransform(const Raster::AffineTransform::Params& transform) {
+        const double scale = Scale(Raster::AffineTransform::Invert(transform));
+        if (!(scale > 0.0) || !std::isfinite(scale)) return false;
+        m_Params.size /= scale;
+        BoundParameters(m_Params, VoronoiFilter::kParameters);
+        return true;
+    }
+
+    // The sampler block for a render through view (source pixels to output pixels): the cell in output
+    // pixels (the size over the scale of the view's inverse, at least 2 and at most CellLimit, which a
+    // singular view, whose inverse has the scale 0, reaches), the line
+    // width in output pixels, and the view's translation as the grid's origin.
+    VoronoiSampler::Params GetSamplerParams(const Raster::AffineTransform::Params& view) const noexcept {
+        double cell = m_Params.size / Scale(Raster::AffineTransform::Invert(view));
+        if (!(cell >= 2.0)) cell = 2.0;
+        if (cell > CellLimit) cell = CellLimit;
+        VoronoiSampler::Params params;
+        params.block[VoronoiMath::CellIndex] = float(cell);
+        params.block[VoronoiMath::LineWidthIndex] = float(cell * m_Params.lineWidth / 100.0);
+        params.block[VoronoiMath::OriginXIndex] = float(view.m[2]);
+        params.block[VoronoiMath::OriginYIndex] = float(view.m[5]);
+        return params;
+    }
+
+    template <class StageParams>
+    void FillStageParams(StageParams& params, const Kernel::RectT<double>&,
+                         const Raster::AffineTransform::Params& view) const noexcept {
+        params.transform = Raster::AffineTransform::Invert(view);
+        params.sampler = GetSamplerParams(view);
+    }
+};
+
+} // namespace RasterTools
+
+// One layer format's processor renders.
+#define RT_INSTANTIATE_VORONOI(Format)                                                                       \
+    RT_INSTANTIATE_PROCESSOR(RasterTools::VoronoiStages::Plain<Raster::PixelFormat::Format>, Format)         \
+    RT_INSTANTIATE_PROCESSOR(RasterTools::VoronoiStages::Masked<Raster::PixelFormat::Format>, Format)
