@@ -106,9 +106,10 @@ PixelBytes ConvertPixel(const Raster::KernelMath::float4& working, const ColourC
 } // namespace
 
 std::optional<PixelBytes> GetRasterDynamicPixel(const Renderer::ConsolidatedColour& colour,
-                                                const ColourProfiles& profiles, int documentFormat,
+                                                const Raster::ColourProfiles& profiles, int documentFormat,
                                                 Raster::PixelFormat format, const ColourCoverage& coverage) {
-    // The reference host has no profiles: every document converts by the formats' fixed rules.
+    // Brush colours are converted by the formats' fixed rules, like the pipeline's own conversions; the
+    // document's profiles are not applied to them yet.
     (void)profiles, (void)documentFormat;
     const auto finite = [](float v) { return std::isfinite(v) ? v : 0.0f; };
     Raster::KernelMath::float4 working{};

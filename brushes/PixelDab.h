@@ -5,6 +5,7 @@
 #include "host/brush/DabComposite.h"
 #include "host/brush/RasterBrush.h"
 #include "host/document/DocumentController.h"
+#include "host/raster/ICCManager.h"
 #include "host/raster/device/Hardware.h"
 #include "host/renderer/Colour.h"
 
@@ -44,7 +45,7 @@ using PixelBytes = std::array<std::byte, 32>;
 // The colour (straight, alpha ignored) as a pixel of format, converted through the document's profiles and
 // colour format, with alpha taken from coverage in the format's precision. Nothing for a non-layer format.
 std::optional<PixelBytes> GetRasterDynamicPixel(const Renderer::ConsolidatedColour& colour,
-                                                const ColourProfiles& profiles, int documentFormat,
+                                                const Raster::ColourProfiles& profiles, int documentFormat,
                                                 Raster::PixelFormat format, const ColourCoverage& coverage);
 
 // The brush dynamic's factor for the nozzle: its value when the brush has an active dynamic, else 1.

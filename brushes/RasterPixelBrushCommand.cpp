@@ -71,7 +71,7 @@ void RasterPixelBrushCommand::PerformNozzle(Raster::BrushNozzle& nozzle) const {
             FromHueSaturationLightness(hsl, r, g, b);
         }
         const auto pixel =
-            GetRasterDynamicPixel({float(r), float(g), float(b), m_Colour.a}, ColourProfiles{},
+            GetRasterDynamicPixel({float(r), float(g), float(b), m_Colour.a}, Raster::ColourProfiles{},
                                   m_DocumentFormat, format, MakeColourCoverage(m_Colour.a, nozzle.opacity));
         const auto path = ChooseDabPath(nozzle.mode, nozzle.strength);
         if (!pixel || !path) return;

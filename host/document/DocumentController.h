@@ -25,10 +25,6 @@ struct DocumentDefaults {
     const Renderer::ConsolidatedColour& GetBackgroundColour() const noexcept { return background; }
 };
 
-// The colour profiles a document's colours are converted through; the reference host has no profiles of its
-// own, so colours convert by the pixel formats' fixed rules.
-struct ColourProfiles {};
-
 // The layer stack, selection and raster pixels at one moment. Layers are shared and pixels are kept a tile
 // at a time only where they later change, so a snapshot costs memory only for what changes after it.
 class DocumentSnapshot : public virtual Kernel::Countable {
@@ -100,7 +96,6 @@ public:
     void SelectPrimaryColourContext(bool primary);
     // Sets the solid fill of colour context 2 (the foreground colour) or 1 (the background colour).
     void SetFillForContext(int context, const Renderer::ConsolidatedColour& colour);
-    const ColourProfiles& GetProfiles() const noexcept { return m_Profiles; }
     // The document's colour format: that of the first layer painted (GetPixelTargets), as an integer
     // PixelFormat; 0 without one.
     int GetFormat() const;
@@ -144,7 +139,6 @@ private:
     int m_NotifyDepth = 0;
     Kernel::Counted<DocumentSnapshot> m_CurrentSnapshot;
     bool m_PrimaryColourContext = true;
-    ColourProfiles m_Profiles;
 };
 
 // One line that names a command and its reflected parameters: "Add Noise inte=0.5 mono=false".

@@ -120,7 +120,7 @@ TEST(PixelBrushCommand, EveryLayerFormatTakesTheColourAsItsOwnPixelUnderFullCove
         doc.controller->SetDocumentDefaults({.foreground = colour});
         doc.tool->Stroke({{3, 2}});
         const auto expected =
-            GetRasterDynamicPixel(colour, ColourProfiles{}, 0, format, MakeColourCoverage(1, 1));
+            GetRasterDynamicPixel(colour, Raster::ColourProfiles{}, 0, format, MakeColourCoverage(1, 1));
         ASSERT_TRUE(expected);
         const auto after = Bytes(doc.Pixels());
         const std::size_t bpp = std::size_t(Raster::GetBytesPerPixel(format));
