@@ -33,12 +33,17 @@ render coffee-twirl.png twirl --angle 90 --radius 200
 render coffee-sphere.png sphere --intensity 50 --radius 200
 render coffee-texture-rings.png proceduraltexture --eq 'rgb=fract(hypot(rx, ry) / 24)' --eq 'a=1' --origin 300,200
 render coffee-texture-marble.png proceduraltexture --preset 3 --opacity 0.6
+render coffee-lighting.png lighting --light 0 --depth 5 --outercone 60
+render coffee-voronoi.png voronoi --size 24
 
 # A document: the photo as a layer, noise applied to its pixels, then a live noise layer on top.
 doc=out/coffee.rtd
 "$bin" doc new "$photo" -o "$doc"
 "$bin" doc filter "$doc" addnoise --intensity 10 --mono true
 "$bin" doc filter "$doc" addnoise --intensity 20 --live
+# A few strokes of the pixel brush on the document's pixels, each a step of its history.
+"$bin" doc paint "$doc" --stroke 40,40 200,120 360,60 --colour 220,40,40 --size 6
+"$bin" doc paint "$doc" --stroke 40,200 360,220 --colour 30,60,220 --size 3
 "$bin" doc render "$doc" out/coffee-document.png
 "$bin" doc show "$doc" | tee out/coffee-document.txt
 
