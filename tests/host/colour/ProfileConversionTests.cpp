@@ -7,6 +7,8 @@
 
 #include <gtest/gtest.h>
 
+#include "tests/host/TestProfiles.h"
+
 #include <lcms2.h>
 
 #include <cmath>
@@ -17,33 +19,6 @@ using Raster::ICCManager;
 using Raster::PixelFormat;
 
 namespace {
-
-std::vector<std::byte> Save(cmsHPROFILE profile) {
-    cmsUInt32Number size = 0;
-    cmsSaveProfileToMem(profile, nullptr, &size);
-    std::vector<std::byte> bytes(size);
-    cmsSaveProfileToMem(profile, bytes.data(), &size);
-    cmsCloseProfile(profile);
-    return bytes;
-}
-
-// ProPhoto RGB (ROMM): its primaries, D50 white and 1.8 gamma.
-std::vector<std::byte> ProPhoto() {
-    const cmsCIExyY white{0.3457, 0.3585, 1.0};
-    const cmsCIExyYTRIPLE primaries{{0.7347, 0.2653, 1.0}, {0.1596, 0.8404, 1.0}, {0.0366, 0.0001, 1.0}};
-    cmsToneCurve* gamma = cmsBuildGamma(nullptr, 1.8);
-    cmsToneCurve* curves[3] = {gamma, gamma, gamma};
-    cmsHPROFILE profile = cmsCreateRGBProfile(&white, &primaries, curves);
-    cmsFreeToneCurve(gamma);
-    return Save(profile);
-}
-
-std::vector<std::byte> Grey22() {
-    cmsToneCurve* gamma = cmsBuildGamma(nullptr, 2.2);
-    cmsHPROFILE profile = cmsCreateGrayProfile(cmsD50_xyY(), gamma);
-    cmsFreeToneCurve(gamma);
-    return Save(profile);
-}
 
 // A grid of 16-bit RGB colours with varying alpha.
 Kernel::Counted<Raster::DynamicBuffer> Grid16() {
@@ -67,7 +42,7 @@ std::uint16_t At(const Raster::DynamicBuffer& image, int x, int y, int c) {
 
 TEST(ProfileConversion, WideGamutRgbToLabIsWhatLcms2GivesForItsProfile) {
     ColourProfiles profiles;
-    ASSERT_TRUE(profiles.Add(ProPhoto()));
+    ASSERT_TRUE(profiles.Add(HostTests::ProPhotoProfile()));
     ASSERT_FALSE(profiles.rgb.empty());
     const auto image = Grid16();
     EXPECT_TRUE(ICCManager::NeedsProfileConversion(PixelFormat::RGBA16, profiles, PixelFormat::LabA16, {}));
@@ -116,7 +91,7 @@ TEST(ProfileConversion, WideGamutRgbToLabIsWhatLcms2GivesForItsProfile) {
 
 TEST(ProfileConversion, RoundTripsThroughLabAndBetweenProfilesComeBack) {
     ColourProfiles prophoto;
-    prophoto.Add(ProPhoto());
+    prophoto.Add(HostTests::ProPhotoProfile());
     const auto image = Grid16();
     std::string error;
     const auto lab = ICCManager::ConvertImage(*image, prophoto, PixelFormat::LabA16, {}, error);
@@ -154,7 +129,7 @@ TEST(ProfileConversion, BuiltInDefaultsAgreeWithTheClosedForms) {
     // No profile on either side: nothing to manage.
     EXPECT_FALSE(ICCManager::NeedsProfileConversion(PixelFormat::RGBA8, {}, PixelFormat::LabA16, {}));
     ColourProfiles prophoto;
-    prophoto.Add(ProPhoto());
+    prophoto.Add(HostTests::ProPhotoProfile());
     // The same profile on both sides of a depth change needs none either.
     EXPECT_FALSE(
         ICCManager::NeedsProfileConversion(PixelFormat::RGBA8, prophoto, PixelFormat::RGBA16, prophoto));
@@ -200,7 +175,7 @@ TEST(ProfileConversion, BuiltInDefaultsAgreeWithTheClosedForms) {
 
 TEST(ProfileConversion, GreyProfilesAndRefusals) {
     ColourProfiles profiles;
-    EXPECT_TRUE(profiles.Add(Grey22()));
+    EXPECT_TRUE(profiles.Add(HostTests::GreyProfile(2.2)));
     EXPECT_TRUE(profiles.rgb.empty());
     EXPECT_FALSE(profiles.grey.empty());
     // A 2.2-gamma grey of 50 % is L* = 100 * f(0.5^2.2) with the CIE function.
@@ -225,7 +200,7 @@ TEST(ProfileConversion, GreyProfilesAndRefusals) {
     EXPECT_FALSE(ICCManager::ConvertImage(*rgba, damaged, PixelFormat::LabA16, {}, error));
     EXPECT_EQ(error, "the colour profile is damaged");
     ColourProfiles mismatched;
-    mismatched.rgb = Grey22();
+    mismatched.rgb = HostTests::GreyProfile(2.2);
     EXPECT_FALSE(ICCManager::ConvertImage(*rgba, mismatched, PixelFormat::LabA16, {}, error));
     EXPECT_EQ(error, "the colour profile is for other pixels than these");
     EXPECT_FALSE(profiles.Add(std::vector<std::byte>(40)));

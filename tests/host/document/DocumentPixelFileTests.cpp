@@ -9,8 +9,10 @@
 #include "host/kernel/AtomicFile.h"
 #include "tests/host/document/PixelDocumentSupport.h"
 
+#include "tests/host/TestProfiles.h"
 #include <cstring>
 #include <gtest/gtest.h>
+
 #include <lcms2.h>
 #include <unistd.h>
 
@@ -237,39 +239,13 @@ TEST_F(PixelDocumentFiles, HostileSizesAndVersionsAreRefusedBeforeAllocating) {
 
 namespace {
 
-std::vector<std::byte> SaveProfile(cmsHPROFILE profile) {
-    cmsUInt32Number size = 0;
-    cmsSaveProfileToMem(profile, nullptr, &size);
-    std::vector<std::byte> bytes(size);
-    cmsSaveProfileToMem(profile, bytes.data(), &size);
-    cmsCloseProfile(profile);
-    return bytes;
-}
-
-std::vector<std::byte> MakeProPhoto() {
-    const cmsCIExyY white{0.3457, 0.3585, 1.0};
-    const cmsCIExyYTRIPLE primaries{{0.7347, 0.2653, 1.0}, {0.1596, 0.8404, 1.0}, {0.0366, 0.0001, 1.0}};
-    cmsToneCurve* gamma = cmsBuildGamma(nullptr, 1.8);
-    cmsToneCurve* curves[3] = {gamma, gamma, gamma};
-    cmsHPROFILE profile = cmsCreateRGBProfile(&white, &primaries, curves);
-    cmsFreeToneCurve(gamma);
-    return SaveProfile(profile);
-}
-
-std::vector<std::byte> MakeGrey18() {
-    cmsToneCurve* gamma = cmsBuildGamma(nullptr, 1.8);
-    cmsHPROFILE profile = cmsCreateGrayProfile(cmsD50_xyY(), gamma);
-    cmsFreeToneCurve(gamma);
-    return SaveProfile(profile);
-}
-
 // Each made once: a profile records when it was made, so two calls a second apart differ.
 const std::vector<std::byte>& ProPhoto() {
-    static const std::vector<std::byte> profile = MakeProPhoto();
+    static const std::vector<std::byte> profile = HostTests::ProPhotoProfile();
     return profile;
 }
 const std::vector<std::byte>& Grey18() {
-    static const std::vector<std::byte> profile = MakeGrey18();
+    static const std::vector<std::byte> profile = HostTests::GreyProfile(1.8);
     return profile;
 }
 

@@ -5,6 +5,8 @@
 
 #include <gtest/gtest.h>
 
+#include "tests/host/TestProfiles.h"
+
 #include <lcms2.h>
 
 #pragma GCC diagnostic push
@@ -19,32 +21,7 @@ using Raster::PixelFormat;
 
 namespace {
 
-std::vector<std::byte> SaveProfile(cmsHPROFILE profile) {
-    cmsUInt32Number size = 0;
-    EXPECT_TRUE(cmsSaveProfileToMem(profile, nullptr, &size));
-    std::vector<std::byte> bytes(size);
-    EXPECT_TRUE(cmsSaveProfileToMem(profile, bytes.data(), &size));
-    cmsCloseProfile(profile);
-    return bytes;
-}
-
-// ProPhoto RGB: its primaries and D50 white with a 1.8 gamma, made by lcms2.
-std::vector<std::byte> ProPhotoProfile() {
-    const cmsCIExyY white{0.3457, 0.3585, 1.0};
-    const cmsCIExyYTRIPLE primaries{{0.7347, 0.2653, 1.0}, {0.1596, 0.8404, 1.0}, {0.0366, 0.0001, 1.0}};
-    cmsToneCurve* gamma = cmsBuildGamma(nullptr, 1.8);
-    cmsToneCurve* curves[3] = {gamma, gamma, gamma};
-    cmsHPROFILE profile = cmsCreateRGBProfile(&white, &primaries, curves);
-    cmsFreeToneCurve(gamma);
-    return SaveProfile(profile);
-}
-
-std::vector<std::byte> GreyProfile() {
-    cmsToneCurve* gamma = cmsBuildGamma(nullptr, 2.2);
-    cmsHPROFILE profile = cmsCreateGrayProfile(cmsD50_xyY(), gamma);
-    cmsFreeToneCurve(gamma);
-    return SaveProfile(profile);
-}
+using HostTests::SaveProfile;
 
 // A CMYK output profile's header and description: all the writers look at.
 std::vector<std::byte> CmykProfile() {
@@ -143,7 +120,8 @@ std::string Describe(const Target& target) {
 } // namespace
 
 TEST(Profiles, SurviveARoundTripThroughEveryTypeThatHoldsOne) {
-    const std::vector<std::byte> prophoto = ProPhotoProfile(), grey = GreyProfile(), cmyk = CmykProfile();
+    const std::vector<std::byte> prophoto = HostTests::ProPhotoProfile(), grey = HostTests::GreyProfile(2.2),
+                                 cmyk = CmykProfile();
     std::vector<Target> targets(std::begin(ColourTargets), std::end(ColourTargets));
     for (IO::FileType type : {IO::FileType::PNG, IO::FileType::JPEG, IO::FileType::TIFF})
         targets.push_back({type, PixelFormat::IA8, type != IO::FileType::JPEG});
@@ -189,7 +167,7 @@ TEST(Metadata, SurvivesARoundTripThroughEveryTypeThatHoldsIt) {
         const auto image = target.lossless ? Noise(target.format, 20, 12, 3) : Ramps(target.format, 20, 12);
         IO::WriteOptions options;
         options.metadata = camera;
-        options.metadata.iccProfile = ProPhotoProfile();
+        options.metadata.iccProfile = HostTests::ProPhotoProfile();
         const IO::EncodeResult encoded = IO::EncodeImage(*image, target.type, "m", options);
         ASSERT_TRUE(encoded) << encoded.error;
 
