@@ -172,7 +172,8 @@ void AddWriteFlags(CLI::App& app, FileFlags& flags) {
             "PNG and TIFF compression: none, fast, default or best; TIFF also lzw, deflate or packbits")
         ->type_name("NAME");
     AddText(app, "--output-format", flags.outputFormat,
-            "the output's file type where no file name says it (writing to -): png, jpeg, tiff, ...")
+            "the output's file type where no file name says it (writing to -): png, jpeg, tiff, webp, avif, "
+            "heic, exr")
         ->type_name("TYPE");
 }
 
@@ -370,7 +371,8 @@ std::string BashCompletion() {
         << "  case $prev in\n"
         << "    --device) COMPREPLY=($(compgen -W 'auto cpu opencl cuda' -- \"$cur\")); return;;\n"
         << "    --format) COMPREPLY=($(compgen -W '" << formats << "' -- \"$cur\")); return;;\n"
-        << "    --output-format) COMPREPLY=($(compgen -W 'png jpeg tiff' -- \"$cur\")); return;;\n"
+        << "    --output-format) COMPREPLY=($(compgen -W 'png jpeg tiff webp avif heic exr' -- \"$cur\")); "
+           "return;;\n"
         << "  esac\n"
         << "  if [ \"$COMP_CWORD\" -eq 1 ]; then COMPREPLY=($(compgen -W \"$commands --help --version "
            "--settings --quiet\" -- \"$cur\")); return; fi\n"

@@ -9,13 +9,21 @@
 #include <iostream>
 #include <unistd.h>
 
+#include <algorithm>
+
 namespace App {
 
 namespace {
 
-// The compression names the writers know for lossless files.
-constexpr std::string_view kCompressions[] = {"none", "fast",    "default", "best",
-                                              "lzw",  "deflate", "packbits"};
+// The compression names that any writer knows, in the order the types list them.
+std::vector<std::string_view> KnownCompressions() {
+    std::vector<std::string_view> names;
+    for (const auto type : {IO::FileType::PNG, IO::FileType::JPEG, IO::FileType::TIFF, IO::FileType::WebP,
+                            IO::FileType::AVIF, IO::FileType::HEIC, IO::FileType::EXR})
+        for (const auto name : IO::GetCompressionNames(type))
+            if (std::find(names.begin(), names.end(), name) == names.end()) names.push_back(name);
+    return names;
+}
 
 // The most a standard input may hold: the readers refuse larger files anyway.
 constexpr std::size_t kMaxInputBytes = std::size_t(4) << 30;
@@ -49,7 +57,7 @@ FileSettings CheckFileFlags(const FileFlags& flags) {
     if (flags.compression.Given()) {
         const std::string& name = flags.compression.Value();
         std::string known;
-        for (const auto compression : kCompressions) {
+        for (const auto compression : KnownCompressions()) {
             if (name == compression) settings.compression = name;
             known += (known.empty() ? "" : ", ") + std::string(compression);
         }
@@ -59,12 +67,10 @@ FileSettings CheckFileFlags(const FileFlags& flags) {
     }
     if (flags.outputFormat.Given()) {
         const std::string& name = flags.outputFormat.Value();
-        settings.outputFormat = name.find_first_of("./") == std::string::npos
-                                    ? IO::GetFileTypeForExtension("output." + name)
-                                    : std::nullopt;
+        settings.outputFormat = IO::GetFileTypeForName(name);
         if (!settings.outputFormat)
-            throw UsageError("--output-format: " + QuoteExcerpt(name) +
-                             " is not a file type (png, jpeg, jpg, tiff, tif)");
+            throw UsageError("--output-format: " + QuoteExcerpt(name) + " is not a file type (" +
+                             IO::DescribeFileExtensions() + ", without the dot)");
     }
     settings.autoOrient = flags.autoOrient;
     return settings;
