@@ -1,5 +1,6 @@
 #include "app/BrushVerbs.h"
 
+#include "app/FilterArguments.h"
 #include "app/Options.h"
 #include "brushes/PixelDab.h"
 #include "brushes/RasterPixelTool.h"
@@ -93,7 +94,7 @@ std::optional<std::string> RunBrushVerb(DocumentController& controller, const Ke
                 continue;
             }
             const auto point = ParseStrokePoint(words[i]);
-            if (!point) return "\"" + words[i] + "\" is not a point (expected X,Y)";
+            if (!point) return QuoteExcerpt(words[i]) + " is not a point (expected X,Y)";
             points.push_back(*point);
         }
         if (points.empty()) return "usage: stroke X0,Y0 [X1,Y1]... [--secondary]";
@@ -162,7 +163,8 @@ PaintArguments ParsePaintArguments(const std::vector<std::string>& args) {
             once(strokeGiven);
             while (i + 1 < args.size() && !args[i + 1].starts_with("--")) {
                 const auto point = ParseStrokePoint(args[++i]);
-                if (!point) throw UsageError("--stroke: \"" + args[i] + "\" is not a point (expected X,Y)");
+                if (!point)
+                    throw UsageError("--stroke: " + QuoteExcerpt(args[i]) + " is not a point (expected X,Y)");
                 result.stroke.push_back(*point);
             }
             if (result.stroke.empty()) throw UsageError("--stroke needs at least one point X,Y");

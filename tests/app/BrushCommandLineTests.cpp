@@ -82,6 +82,12 @@ TEST_F(BrushCommandLine, PlayReportsTheMissingSnapshotAndBadBrushVerbs) {
         EXPECT_NE(result.exitCode, 0) << line;
         EXPECT_TRUE(Contains(result.output, "bad.play:2:")) << line << "\n" << result.output;
     }
+    // A point holding control bytes is quoted escaped, as every script error is (found by the play fuzzer).
+    Write("control.play", std::string("tool pixel\nstroke 10,\x02\x01 5,5\n"));
+    result = Run("play control.play");
+    EXPECT_NE(result.exitCode, 0);
+    EXPECT_TRUE(Contains(result.output, "is not a point")) << result.output;
+    EXPECT_FALSE(Contains(result.output, "\x02")) << "a raw control byte reached the message";
     Write("notool.play", "stroke 1,1\n");
     result = Run("play notool.play");
     EXPECT_TRUE(Contains(result.output, "needs the pixel tool")) << result.output;
