@@ -1,4 +1,5 @@
-// libFuzzer target: AVIF and HEIC files decode to an image or to a message, never to a crash, a hang or an
+// libFuzzer target for the decoders of WebP, HEIF (AVIF and HEIC) and OpenEXR, built once per format so that
+// each starts from its own seeds: files decode to an image or to a message, never to a crash, a hang or an
 // allocation beyond the size checks; both with and without turning the pixels upright by their metadata.
 
 #include "host/io/ImageIO.h"
