@@ -2,58 +2,21 @@
 // refusals that name the equation and the column, the same file from the processor and the OpenCL device, a
 // live layer saved, loaded and rendered, and the tool's history and presets through play.
 
-#include "host/kernel/AtomicFile.h"
-
-#include <cstdio>
-#include <filesystem>
-#include <fstream>
-#include <gtest/gtest.h>
-#include <sys/wait.h>
-#include <unistd.h>
+#include "tests/app/CommandLineSupport.h"
 
 namespace {
 
-struct Result {
-    int exitCode = -1;
-    std::string output;
-};
+using AppTests::Result;
 
-class ProceduralTextureCommandLine : public ::testing::Test {
+// The command-line fixture (a private folder, the built program) and the files it leaves there.
+class ProceduralTextureCommandLine : public AppTests::CommandLine {
 protected:
-    void SetUp() override {
-        m_Folder = std::filesystem::temp_directory_path() /
-                   ("rastertools-texture-" + std::to_string(::getpid()) + "-" +
-                    ::testing::UnitTest::GetInstance()->current_test_info()->name());
-        std::filesystem::remove_all(m_Folder);
-        std::filesystem::create_directories(m_Folder);
-    }
-    void TearDown() override { std::filesystem::remove_all(m_Folder); }
-
-    Result Run(const std::string& arguments) {
-        const std::string command = "cd '" + m_Folder.string() + "' && RASTERTOOLS_SETTINGS='" +
-                                    (m_Folder / "settings.json").string() + "' '" RASTERTOOLS_PROGRAM "' " +
-                                    arguments + " 2>&1";
-        Result result;
-        FILE* pipe = ::popen(command.c_str(), "r");
-        if (!pipe) return result;
-        char buffer[4096];
-        for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
-            result.output.append(buffer, n);
-        const int status = ::pclose(pipe);
-        result.exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-        return result;
-    }
-
     std::string Bytes(const std::string& name) {
         std::string bytes;
         const auto error = Kernel::ReadWholeFile(m_Folder / name, bytes, 1 << 24);
         EXPECT_FALSE(error) << name << ": " << error.value_or("");
         return bytes;
     }
-
-    void Write(const std::string& name, const std::string& text) { std::ofstream(m_Folder / name) << text; }
-
-    std::filesystem::path m_Folder;
 };
 
 constexpr const char* Equations = "--eq 'rgb=sin(rx / 7) * 0.5 + 0.5' --eq 'g=fract(hypot(rx, ry) / 13)' "
