@@ -2,6 +2,7 @@
 #include "bench/BenchSupport.h"
 
 #include <cstdint>
+#include <string>
 
 namespace Bench {
 
@@ -52,6 +53,19 @@ void RenderWhole(benchmark::State& state, const RasterTools::PipelineCommand& co
     }
     if (setup.opencl && processorTiles > 0) state.SkipWithError("tiles fell back to the processor");
     ReportPixels(state, source->GetWidth());
+}
+
+void RegisterRGBA8Renders(int side, std::span<const NamedCommand> commands) {
+    for (const auto& [name, command] : commands)
+        for (const auto& [path, label] : Paths)
+            benchmark::RegisterBenchmark((std::string(name) + "/RGBA8/" + label).c_str(),
+                                         [side, command, path](benchmark::State& state) {
+                                             RenderWhole(state, *command,
+                                                         MakeImage(side, Raster::PixelFormat::RGBA8),
+                                                         Raster::PixelFormat::RGBA8, SetupFor(path));
+                                         })
+                ->Unit(benchmark::kMillisecond)
+                ->UseRealTime();
 }
 
 void ReportPixels(benchmark::State& state, int side) {

@@ -5,6 +5,7 @@
 
 #include <benchmark/benchmark.h>
 
+#include <span>
 #include <utility>
 
 namespace Bench {
@@ -35,6 +36,11 @@ RenderSetup SetupFor(Path path);
 void RenderWhole(benchmark::State& state, const RasterTools::PipelineCommand& command,
                  const Kernel::Counted<Raster::DynamicBuffer>& source, Raster::PixelFormat destFormat,
                  const RenderSetup& setup);
+
+// Registers "NAME/RGBA8/PATH" for each named command and path: the whole of a side × side RGBA8 image of
+// seeded noise rendered into RGBA8 (RenderWhole).
+using NamedCommand = std::pair<const char*, const RasterTools::PipelineCommand*>;
+void RegisterRGBA8Renders(int side, std::span<const NamedCommand> commands);
 
 // The "Mpx/s" counter for one side × side image per iteration.
 void ReportPixels(benchmark::State& state, int side);

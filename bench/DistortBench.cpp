@@ -19,24 +19,13 @@ using Raster::PixelFormat;
 
 constexpr int Side = 4096;
 
-void Render(benchmark::State& state, const RasterTools::PipelineCommand* command, Bench::Path path) {
-    Bench::RenderWhole(state, *command, Bench::MakeImage(Side, PixelFormat::RGBA8), PixelFormat::RGBA8,
-                       Bench::SetupFor(path));
-}
-
 void Register() {
     static const Kernel::Counted<RasterTools::RasterTwirlCommand> twirl(
         new RasterTools::RasterTwirlCommand(false, 90.0, Side / 2.0, RasterTools::UnsetCentre));
     static const Kernel::Counted<RasterTools::RasterSphereCommand> sphere(
         new RasterTools::RasterSphereCommand(false, 50.0, Side / 2.0, RasterTools::UnsetCentre));
-    const std::pair<const char*, const RasterTools::PipelineCommand*> commands[] = {
-        {"twirl/90", twirl.Get()}, {"sphere/50", sphere.Get()}};
-    for (const auto& [name, command] : commands)
-        for (const auto& [path, label] : Bench::Paths)
-            benchmark::RegisterBenchmark((std::string(name) + "/RGBA8/" + label).c_str(), Render, command,
-                                         path)
-                ->Unit(benchmark::kMillisecond)
-                ->UseRealTime();
+    const Bench::NamedCommand commands[] = {{"twirl/90", twirl.Get()}, {"sphere/50", sphere.Get()}};
+    Bench::RegisterRGBA8Renders(Side, commands);
 }
 
 } // namespace

@@ -32,22 +32,12 @@ Kernel::Counted<RasterTools::ProceduralTextureCommand> Make(const char* text, st
                                                                       config, nullptr);
 }
 
-void Render(benchmark::State& state, const RasterTools::PipelineCommand* command, Bench::Path path) {
-    static const auto image = Bench::MakeImage(Side, PixelFormat::RGBA8);
-    Bench::RenderWhole(state, *command, image, PixelFormat::RGBA8, Bench::SetupFor(path));
-}
-
 void Register() {
     static const auto one = Make(OneChannel, 1);
     static const auto three = Make(ThreeChannels, 7);
-    const std::pair<const char*, const RasterTools::PipelineCommand*> commands[] = {
-        {"texture/1-channel", one.Get()}, {"texture/3-channel", three.Get()}};
-    for (const auto& [name, command] : commands)
-        for (const auto& [path, label] : Bench::Paths)
-            benchmark::RegisterBenchmark((std::string(name) + "/RGBA8/" + label).c_str(), Render, command,
-                                         path)
-                ->Unit(benchmark::kMillisecond)
-                ->UseRealTime();
+    const Bench::NamedCommand commands[] = {{"texture/1-channel", one.Get()},
+                                            {"texture/3-channel", three.Get()}};
+    Bench::RegisterRGBA8Renders(Side, commands);
 }
 
 } // namespace

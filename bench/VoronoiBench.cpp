@@ -17,24 +17,14 @@ using Raster::PixelFormat;
 
 constexpr int Side = 4096;
 
-void Render(benchmark::State& state, const RasterTools::PipelineCommand* command, Bench::Path path) {
-    Bench::RenderWhole(state, *command, Bench::MakeImage(Side, PixelFormat::RGBA8), PixelFormat::RGBA8,
-                       Bench::SetupFor(path));
-}
-
 void Register() {
     static const Kernel::Counted<RasterTools::RasterVoronoiCommand> lines(
         new RasterTools::RasterVoronoiCommand(false, 32.0, 10.0));
     static const Kernel::Counted<RasterTools::RasterVoronoiCommand> plain(
         new RasterTools::RasterVoronoiCommand(false, 32.0, 0.0));
-    const std::pair<const char*, const RasterTools::PipelineCommand*> commands[] = {
-        {"voronoi/32/lines10", lines.Get()}, {"voronoi/32/nolines", plain.Get()}};
-    for (const auto& [name, command] : commands)
-        for (const auto& [path, label] : Bench::Paths)
-            benchmark::RegisterBenchmark((std::string(name) + "/RGBA8/" + label).c_str(), Render, command,
-                                         path)
-                ->Unit(benchmark::kMillisecond)
-                ->UseRealTime();
+    const Bench::NamedCommand commands[] = {{"voronoi/32/lines10", lines.Get()},
+                                            {"voronoi/32/nolines", plain.Get()}};
+    Bench::RegisterRGBA8Renders(Side, commands);
 }
 
 } // namespace
