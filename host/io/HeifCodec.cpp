@@ -5,6 +5,7 @@
 
 #include <libheif/heif.h>
 
+#include <cmath>
 #include <cstring>
 #include <memory>
 
@@ -33,6 +34,15 @@ using Encoder = std::unique_ptr<heif_encoder, EncoderDeleter>;
 
 std::string Reason(const heif_error& error) {
     return error.message && *error.message ? error.message : "unknown error";
+}
+
+// The longest side whose square fits the pixel limit.
+int LongestHeifSide(PixelFormat format) {
+    int side =
+        int(std::sqrt(double(Raster::DynamicBuffer::MaxStorageBytes) / Raster::GetBytesPerPixel(format)));
+    while (side > 1 && !Raster::DynamicBuffer::IsSizeAllowed(side, side, format))
+        --side;
+    return side;
 }
 
 // The metadata blocks of one kind ("Exif", or "mime" XMP), the first of each.
@@ -92,6 +102,17 @@ ReadResult DecodeHeif(std::span<const std::byte> data, std::string_view name) {
     result.error =
         CheckImageSize(name, std::uint64_t(std::max(width, 0)), std::uint64_t(std::max(height, 0)), format);
     if (!result.error.empty()) return result;
+    // A grid or overlay states its canvas size apart from the size above, and the decoder fills that canvas
+    // before it reads any picture: a few bytes could ask for gigabytes. The decoder only bounds each side,
+    // so the square on the longer side must fit the pixel limit, and the canvas may not outgrow it.
+    const int side = std::max(width, height);
+    if (!Raster::DynamicBuffer::IsSizeAllowed(side, side, format)) {
+        result.error = Describe(name, "HEIF image " + std::to_string(width) + " x " + std::to_string(height) +
+                                          " is too long: sides beyond " +
+                                          std::to_string(LongestHeifSide(format)) + " pixels are not read");
+        return result;
+    }
+    heif_context_set_maximum_image_size_limit(context.get(), side + 1);
 
     heif_image* rawImage = nullptr;
     error =

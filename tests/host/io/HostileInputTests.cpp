@@ -521,6 +521,46 @@ TEST(HostileInput, AncillaryPngChunkLengthsCannotMakeTheReaderAllocate) {
     EXPECT_EQ(Difference(*result.image, *image), "");
 }
 
+TEST(HostileInput, HeifCanvasesCannotOutgrowTheDeclaredImage) {
+    // A 1225-byte file whose overlay canvas claims 45619 x 53437 pixels: the decoder filled gigabytes.
+    const auto overlay = ReadBytes(DataFolder() / "overlay-canvas.heic");
+    const long grown = PeakGrowthKiB([&] {
+        const IO::ReadResult result = IO::DecodeImage(overlay, "overlay.heic");
+        return !result && StartsWith(result.error, "overlay.heic: truncated or damaged HEIF data");
+    });
+    ASSERT_GE(grown, 0) << "not refused as damaged";
+    EXPECT_LT(grown, 256 << 10) << "KiB of address space taken for a 1225-byte file";
+
+    // A long thin image is refused when the square on its longer side passes the pixel limit, and read
+    // when it does not: the size box of the primary image (the one of the picture's own size) is patched.
+    auto image = Ramps(PixelFormat::RGBA8, 8, 6);
+    const auto heic = IO::EncodeImage(*image, IO::FileType::HEIC, "").bytes;
+    auto claiming = [&](std::uint32_t width, std::uint32_t height) {
+        std::vector<std::byte> bytes = heic;
+        const std::string_view text(reinterpret_cast<const char*>(bytes.data()), bytes.size());
+        const std::byte own[8] = {std::byte{0}, std::byte{0}, std::byte{0}, std::byte{8},
+                                  std::byte{0}, std::byte{0}, std::byte{0}, std::byte{6}};
+        int patched = 0;
+        for (std::size_t at = text.find("ispe"); at != std::string_view::npos; at = text.find("ispe", at + 4))
+            if (at + 16 <= bytes.size() && std::memcmp(&bytes[at + 8], own, 8) == 0) {
+                for (int i = 0; i < 4; ++i) {
+                    bytes[at + 8 + std::size_t(i)] = std::byte(width >> (24 - 8 * i));
+                    bytes[at + 12 + std::size_t(i)] = std::byte(height >> (24 - 8 * i));
+                }
+                ++patched;
+            }
+        EXPECT_GT(patched, 0);
+        return bytes;
+    };
+    const IO::ReadResult thin = IO::DecodeImage(claiming(30000, 2), "thin.heic");
+    EXPECT_FALSE(thin);
+    EXPECT_EQ(thin.error,
+              "thin.heic: HEIF image 30000 x 2 is too long: sides beyond 23168 pixels are not read");
+    const IO::ReadResult honest = IO::DecodeImage(heic, "small.heic");
+    ASSERT_TRUE(honest) << honest.error;
+    EXPECT_EQ(honest.image->GetWidth(), 8);
+}
+
 TEST(HostileInput, FilesAreRecognisedByContentNotName) {
     ScratchFolder folder;
     const auto png = IO::EncodeImage(*Noise(PixelFormat::RGBA8, 3, 3, 7), IO::FileType::PNG, "").bytes;
