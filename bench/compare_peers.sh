@@ -7,8 +7,13 @@
 #
 #   bench/compare_peers.sh [OPERATION...]      (default: every operation below)
 #
-# RASTERTOOLS (default build/release/app/rastertools), RUNS (best of, default 3) and WORK (scratch folder)
-# may be set. Later filters add a line to OPERATIONS and a case to each tool's function.
+# RASTERTOOLS (default build/release/app/rastertools), RUNS (best of, default 3), PEER_LIMIT (seconds a peer
+# may take for one run, default 120; a slower peer's rate is left out) and WORK (scratch folder) may be set.
+# Later filters add a line to OPERATIONS and a case to each tool's function.
+#
+# Run with every operation and every tool, it also keeps the speed record: bench/speed-record.md gets the
+# table with the date, the machine and the commit, and the README's Speed table is made again from it
+# (bench/update_readme_speed.sh), so that the README shows only what the code of that commit renders.
 set -euo pipefail
 
 root=$(cd "$(dirname "$0")/.." && pwd)
@@ -22,7 +27,10 @@ OPERATIONS+=(texture-1 texture-3)
 OPERATIONS+=(lighting-directional lighting-spot)
 # Voronoi cells of 32 pixels with lines of 10 %, once against each of GEGL's cell-like filters.
 OPERATIONS+=(voronoi-mosaic voronoi-cubism voronoi-cellnoise)
-[ $# -gt 0 ] && OPERATIONS=("$@")
+complete_run=1
+[ $# -gt 0 ] && { OPERATIONS=("$@"); complete_run=0; }
+[ -n "${TOOLS:-}" ] && complete_run=0
+peer_limit=${PEER_LIMIT:-120}
 
 # ---- Peers from Debian
 packages=(imagemagick libvips-tools gegl bc)
@@ -155,7 +163,7 @@ best_time() {
   local best="" start end t
   for _ in $(seq "$runs"); do
     start=$(date +%s.%N)
-    if ! eval "$1" >/dev/null 2>&1; then echo ""; return; fi
+    if ! timeout "$peer_limit" bash -c "$1" >/dev/null 2>&1; then echo ""; return; fi
     end=$(date +%s.%N)
     t=$(echo "$end - $start" | bc -l)
     if [ -z "$best" ] || [ "$(echo "$t < $best" | bc -l)" = 1 ]; then best=$t; fi
@@ -178,6 +186,8 @@ best_render_time() {
 
 megapixels=$(echo "$size * $size / 1000000" | bc -l)
 printf '%-16s %-12s %7s %12s %10s\n' operation tool threads "Mpix/s" "ours/best"
+record_rows=$(mktemp)
+trap 'rm -f "$record_rows"' EXIT
 for threads in 1 2; do
   declare -A baseline=()
   for tool in "${tools[@]}"; do
@@ -205,6 +215,11 @@ for threads in 1 2; do
       [ "$tool" = rastertools ] || [ -z "${rate[$tool]:-}" ] && continue
       [ "$(echo "${rate[$tool]} > $fastest_peer" | bc -l)" = 1 ] && fastest_peer=${rate[$tool]}
     done
+    fastest_name="-"
+    for tool in "${tools[@]}"; do
+      [ "$tool" = rastertools ] || [ -z "${rate[$tool]:-}" ] && continue
+      [ "${rate[$tool]}" = "$fastest_peer" ] && fastest_name=$tool
+    done
     for tool in "${tools[@]}"; do
       [ -n "${rate[$tool]:-}" ] || continue
       ratio="-"
@@ -213,7 +228,33 @@ for threads in 1 2; do
       fi
       printf '%-16s %-12s %7s %12.1f %10s\n' "$op" "$tool" "$threads" "${rate[$tool]}" "$ratio"
     done
+    if [ -n "${rate[rastertools]:-}" ]; then
+      if [ "$fastest_name" = "-" ]; then
+        printf '| %s | %s | %.1f | none | - | - |\n' "$op" "$threads" "${rate[rastertools]}" >>"$record_rows"
+      else
+        printf '| %s | %s | %.1f | %s | %.1f | %.2f× |\n' "$op" "$threads" "${rate[rastertools]}" "$fastest_name" \
+          "$fastest_peer" "$(echo "${rate[rastertools]} / $fastest_peer" | bc -l)" >>"$record_rows"
+      fi
+    fi
     unset rate
   done
   unset baseline
 done
+
+# ---- The speed record, from a complete run only.
+if [ "$complete_run" = 1 ]; then
+  record=$root/bench/speed-record.md
+  commit=$(git -C "$root" log -1 --format='%h (%s)' 2>/dev/null || echo unknown)
+  [ -z "$(git -C "$root" status --porcelain --untracked-files=no 2>/dev/null)" ] || commit="$commit with changes not committed"
+  cpu=$(sed -n 's/^model name[[:space:]]*: //p' /proc/cpuinfo | head -1)
+  {
+    echo "Measured $(date -u +%Y-%m-%d) by \`bench/compare_peers.sh\` at commit $commit, on ${cpu:-an unknown processor}"
+    echo "with $(nproc) cores: $size × $size RGBA8, best of $runs runs, Mpix/s of the operation alone."
+    echo
+    echo "| operation | threads | rastertools | fastest peer | peer | ratio |"
+    echo "|---|---|---|---|---|---|"
+    cat "$record_rows"
+  } >"$record"
+  "$root/bench/update_readme_speed.sh"
+  echo "compare_peers: wrote $record and the README's Speed table" >&2
+fi
