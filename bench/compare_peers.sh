@@ -8,7 +8,7 @@
 #   bench/compare_peers.sh [OPERATION...]      (default: every operation below)
 #
 # RASTERTOOLS (default build/release/app/rastertools), RUNS (best of, default 3), PEER_LIMIT (seconds a peer
-# may take for one run, default 120; a slower peer's rate is left out) and WORK (scratch folder) may be set.
+# may take for one run, default 30; a slower peer's rate is left out) and WORK (scratch folder) may be set.
 # Later filters add a line to OPERATIONS and a case to each tool's function.
 #
 # Run with every operation and every tool, it also keeps the speed record: bench/speed-record.md gets the
@@ -30,7 +30,7 @@ OPERATIONS+=(voronoi-mosaic voronoi-cubism voronoi-cellnoise)
 complete_run=1
 [ $# -gt 0 ] && { OPERATIONS=("$@"); complete_run=0; }
 [ -n "${TOOLS:-}" ] && complete_run=0
-peer_limit=${PEER_LIMIT:-120}
+peer_limit=${PEER_LIMIT:-30}
 
 # ---- Peers from Debian
 packages=(imagemagick libvips-tools gegl bc)
