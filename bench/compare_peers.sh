@@ -79,7 +79,7 @@ printf '3 3 1 0\n-1 0 1\n-2 0 2\n-1 0 1\n' > "$work/gradient.mat"
 # ---- One command per tool and operation; "copy" is the tool's load-and-save baseline. Prints nothing when
 # the tool lacks the operation. $1 operation, $2 output, $3 threads.
 rastertools_command() {
-  local common="--threads $3 --device cpu --quiet"
+  local common="--threads $3 --device cpu"
   case $1 in
   copy) echo "$rastertools apply copy $common $input $2" ;;
   noise-gaussian) echo "$rastertools apply addnoise --intensity 30 --gaussian true $common $input $2" ;;
