@@ -1,0 +1,18 @@
+# Fails unless the lines of README between the speed record markers are those of the record (see
+# bench/update_readme_speed.sh).
+file(READ ${README} readme)
+file(READ ${RECORD} record)
+set(begin "<!-- speed record: made from bench/speed-record.md by bench/update_readme_speed.sh -->\n")
+set(end "<!-- end of speed record -->")
+string(FIND "${readme}" "${begin}" first)
+string(FIND "${readme}" "${end}" last)
+if(first LESS 0 OR last LESS first)
+  message(FATAL_ERROR "README.md lacks the speed record markers")
+endif()
+string(LENGTH "${begin}" skip)
+math(EXPR from "${first} + ${skip}")
+math(EXPR length "${last} - ${from}")
+string(SUBSTRING "${readme}" ${from} ${length} shown)
+if(NOT shown STREQUAL record)
+  message(FATAL_ERROR "README.md's Speed table differs from bench/speed-record.md: run bench/update_readme_speed.sh")
+endif()
