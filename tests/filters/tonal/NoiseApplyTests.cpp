@@ -2,48 +2,15 @@
 // from every tile size, in every layer format (--format converts the input when it is read).
 
 #include "host/io/ImageIO.h"
-#include "host/kernel/AtomicFile.h"
 #include "host/raster/PixelFormat.h"
-
-#include <cstdio>
-#include <filesystem>
-#include <gtest/gtest.h>
-#include <sys/wait.h>
-#include <unistd.h>
+#include "tests/app/CommandLineSupport.h"
 
 namespace {
 
-struct Result {
-    int exitCode = -1;
-    std::string output;
-};
+using AppTests::Result;
 
-class ApplyNoise : public ::testing::Test {
+class ApplyNoise : public AppTests::CommandLine {
 protected:
-    void SetUp() override {
-        m_Folder = std::filesystem::temp_directory_path() /
-                   ("rastertools-noise-" + std::to_string(::getpid()) + "-" +
-                    ::testing::UnitTest::GetInstance()->current_test_info()->name());
-        std::filesystem::remove_all(m_Folder);
-        std::filesystem::create_directories(m_Folder);
-    }
-    void TearDown() override { std::filesystem::remove_all(m_Folder); }
-
-    Result Run(const std::string& arguments) {
-        const std::string command = "cd '" + m_Folder.string() + "' && RASTERTOOLS_SETTINGS='" +
-                                    (m_Folder / "settings.json").string() + "' '" RASTERTOOLS_PROGRAM "' " +
-                                    arguments + " 2>&1";
-        Result result;
-        FILE* pipe = ::popen(command.c_str(), "r");
-        if (!pipe) return result;
-        char buffer[4096];
-        for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
-            result.output.append(buffer, n);
-        const int status = ::pclose(pipe);
-        result.exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-        return result;
-    }
-
     std::string Bytes(const std::string& name) {
         std::string bytes;
         const auto error = Kernel::ReadWholeFile(m_Folder / name, bytes, 1 << 24);
@@ -67,16 +34,14 @@ protected:
         const auto written = IO::WriteImage(m_Folder / name, *image);
         ASSERT_TRUE(written) << written.error;
     }
-
-    std::filesystem::path m_Folder;
 };
 
 TEST_F(ApplyNoise, DeviceAndTilesGiveIdenticalFilesInEveryFormat) {
     WriteInput("in.png");
     const bool opencl = Run("apply addnoise --device opencl in.png probe.tif").exitCode == 0;
     for (const char* format : {"rgba8", "rgba16", "rgbauf", "ia8", "ia16", "cmyka8", "laba16"}) {
-        for (const char* kind : {"--intensity 30 --mono false --gaussian true",
-                                 "--intensity 30 --mono true --gaussian false"}) {
+        for (const char* kind :
+             {"--intensity 30 --mono false --gaussian true", "--intensity 30 --mono true --gaussian false"}) {
             const std::string common = std::string("apply addnoise ") + kind + " --format " + format + " ";
             const Result reference = Run(common + "--device cpu --tile 512 in.png cpu512.tif");
             ASSERT_EQ(reference.exitCode, 0) << reference.output;
