@@ -140,9 +140,12 @@ TEST(TileGrid, EveryPixelOnceAndNoTileCrossesTheGrid) {
         {1000, 2000, 1513, 2257},
     };
     const int sizes[] = {1, 7, 32, 33, 256, 5000, 0, -3};
+    // Tiles are handed out from as many bands of rows as threads are asked for, however many cores there
+    // are: thread counts that split the rows unevenly, or into more bands than rows, must still give every
+    // tile once.
     for (const Rect& area : areas)
         for (const int size : sizes)
-            for (const int threads : {1, 0})
+            for (const int threads : {1, 2, 3, 7, 0})
                 RenderAndCheck(area, size, threads);
 }
 
