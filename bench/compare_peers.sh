@@ -204,7 +204,7 @@ for threads in 1 2; do
         [ -n "$net" ] || { echo "compare_peers: $tool failed on $op" >&2; continue; }
       else
         t=$(best_time "$command")
-        [ -n "$t" ] || { echo "compare_peers: $tool failed on $op" >&2; continue; }
+        [ -n "$t" ] || { echo "compare_peers: $tool failed on $op or took longer than $peer_limit s" >&2; continue; }
         # At least a millisecond of work, so that a result within the baseline's noise stays finite.
         net=$(echo "t = $t - ${baseline[$tool]}; if (t < 0.001) t = 0.001; t" | bc -l)
       fi
