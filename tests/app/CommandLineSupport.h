@@ -2,6 +2,7 @@
 // Runs the built rastertools in a private folder and collects its output and exit code, for the command-line
 // tests.
 
+#include "host/io/ImageIO.h"
 #include "host/kernel/AtomicFile.h"
 
 #include <cstdio>
@@ -11,6 +12,7 @@
 #include <string>
 #include <sys/wait.h>
 #include <unistd.h>
+#include <vector>
 
 namespace AppTests {
 
@@ -60,6 +62,19 @@ protected:
 
     std::filesystem::path m_Folder;
 };
+
+// The pixel bytes of an image file, row after row without padding; empty (and a failure) when it cannot be
+// read.
+inline std::vector<std::byte> Pixels(const std::filesystem::path& path) {
+    const IO::ReadResult read = IO::ReadImage(path);
+    EXPECT_TRUE(read) << read.error;
+    std::vector<std::byte> bytes;
+    if (!read) return bytes;
+    for (int y = 0; y < read.image->GetHeight(); ++y)
+        bytes.insert(bytes.end(), read.image->RowBytes(y),
+                     read.image->RowBytes(y) + read.image->GetRowBytes());
+    return bytes;
+}
 
 inline bool Contains(const std::string& text, const std::string& part) {
     return text.find(part) != std::string::npos;

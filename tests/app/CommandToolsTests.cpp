@@ -31,17 +31,6 @@ Kernel::Counted<Raster::DynamicBuffer> Picture(int width, int height, int seed) 
     return image;
 }
 
-std::vector<std::byte> Pixels(const std::filesystem::path& path) {
-    const IO::ReadResult read = IO::ReadImage(path);
-    EXPECT_TRUE(read) << read.error;
-    std::vector<std::byte> bytes;
-    if (!read) return bytes;
-    for (int y = 0; y < read.image->GetHeight(); ++y)
-        bytes.insert(bytes.end(), read.image->RowBytes(y),
-                     read.image->RowBytes(y) + read.image->GetRowBytes());
-    return bytes;
-}
-
 class CommandTools : public CommandLine {
 protected:
     void SetUp() override {

@@ -19,17 +19,6 @@ namespace {
 // A catalogue filter that renders, with its default parameters.
 const std::string kFilter = "copy";
 
-std::vector<std::byte> Pixels(const std::filesystem::path& path) {
-    const IO::ReadResult read = IO::ReadImage(path);
-    EXPECT_TRUE(read) << read.error;
-    std::vector<std::byte> bytes;
-    if (!read) return bytes;
-    for (int y = 0; y < read.image->GetHeight(); ++y)
-        bytes.insert(bytes.end(), read.image->RowBytes(y),
-                     read.image->RowBytes(y) + read.image->GetRowBytes());
-    return bytes;
-}
-
 std::string ReadBytes(const std::filesystem::path& path) {
     std::string text;
     Kernel::ReadWholeFile(path, text, 1 << 24);

@@ -5,8 +5,7 @@
 #include "host/io/ImageIO.h"
 #include "host/raster/ICCManager.h"
 #include "tests/app/CommandLineSupport.h"
-
-#include <lcms2.h>
+#include "tests/host/TestProfiles.h"
 
 #pragma GCC diagnostic push
 #pragma GCC diagnostic ignored "-Wdeprecated-declarations"
@@ -20,24 +19,9 @@ using Raster::PixelFormat;
 
 namespace {
 
-std::vector<std::byte> MakeProPhoto() {
-    const cmsCIExyY white{0.3457, 0.3585, 1.0};
-    const cmsCIExyYTRIPLE primaries{{0.7347, 0.2653, 1.0}, {0.1596, 0.8404, 1.0}, {0.0366, 0.0001, 1.0}};
-    cmsToneCurve* gamma = cmsBuildGamma(nullptr, 1.8);
-    cmsToneCurve* curves[3] = {gamma, gamma, gamma};
-    cmsHPROFILE profile = cmsCreateRGBProfile(&white, &primaries, curves);
-    cmsFreeToneCurve(gamma);
-    cmsUInt32Number size = 0;
-    cmsSaveProfileToMem(profile, nullptr, &size);
-    std::vector<std::byte> bytes(size);
-    cmsSaveProfileToMem(profile, bytes.data(), &size);
-    cmsCloseProfile(profile);
-    return bytes;
-}
-
 // Made once: a profile records when it was made, so two calls a second apart differ.
 const std::vector<std::byte>& ProPhoto() {
-    static const std::vector<std::byte> profile = MakeProPhoto();
+    static const std::vector<std::byte> profile = HostTests::ProPhotoProfile();
     return profile;
 }
 
