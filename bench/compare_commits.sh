@@ -53,9 +53,7 @@ run() {
   local side=$1 bin=$2 name
   for name in "${programs[@]}"; do
     "$bin/$name" --benchmark_filter="$filter" --benchmark_min_time="$min_time" --benchmark_format=csv \
-      2>/dev/null | awk -F, -v side="$side" '
-        NR == 1 { for (i = 1; i <= NF; i++) if ($i == "\"Mpx/s\"") column = i; next }
-        column && $column != "" { gsub(/"/, "", $1); print side, $1, $column }'
+      2>/dev/null | awk -f "$root/bench/csv_rates.awk" | sed "s/^/$side /"
   done
 }
 

@@ -9,10 +9,8 @@ printf '%-64s %9s %9s %7s\n' benchmark "1 thread" "2 threads" ratio
 for program in "$bin"/*_bench; do
   "$program" --benchmark_filter='(rgba8|RGBA8).*processor|MotionBlur.*tile:1024/threads' --benchmark_min_time=0.3 \
     --benchmark_repetitions="${REPS:-4}" --benchmark_format=csv 2>/dev/null |
-    awk -F, 'NR == 1 { for (i = 1; i <= NF; i++) if ($i == "\"Mpx/s\"") column = i; next }
-      column && $column != "" && $1 !~ /_(mean|median|stddev|cv)"?$/ {
-        gsub(/"/, "", $1); name = $1; sub(/\/real_time$/, "", name)
-        if ($column > best[name]) best[name] = $column }
+    awk -f "$root/bench/csv_rates.awk" |
+    awk '$2 > best[$1] { best[$1] = $2 }
       END { for (name in best) if (name ~ /threads:1/) {
               other = name; sub(/threads:1/, "threads:2", other)
               if (other in best) {
