@@ -3,6 +3,7 @@
 // means the pixels are not what the file meant: libtiff goes on after those with made-up data.
 
 #include "host/io/Codecs.h"
+#include "host/kernel/UnalignedBytes.h"
 
 #include <tiffio.h>
 
@@ -309,17 +310,8 @@ Route ReadLayout(TIFF* tif, Layout& layout, std::string& why) {
 // ---------------------------------------------------------------------------------------------------------
 // Reading: samples to pixels
 
-template <class T>
-T Load(const std::byte* p) {
-    T value;
-    std::memcpy(&value, p, sizeof value);
-    return value;
-}
-
-template <class T>
-void Store(std::byte* p, T value) {
-    std::memcpy(p, &value, sizeof value);
-}
+using Kernel::LoadBytes;
+using Kernel::StoreBytes;
 
 // Straight colour from colour premultiplied by alpha, rounded; zero where alpha is zero.
 template <class T>
@@ -350,17 +342,18 @@ void ConvertIntegerRow(const Layout& layout, const std::byte* in, std::byte* out
     for (std::uint32_t x = 0; x < width; ++x) {
         const std::byte* pixel = in + x * inPixel;
         std::byte* to = out + x * std::size_t(channels + 1) * outComponent;
-        const T alpha = layout.alpha >= 0 ? Load<T>(pixel + std::size_t(layout.alpha) * sizeof(T)) : T(max);
+        const T alpha =
+            layout.alpha >= 0 ? LoadBytes<T>(pixel + std::size_t(layout.alpha) * sizeof(T)) : T(max);
         for (int c = 0; c <= channels; ++c) {
-            T value = c == channels ? alpha : Load<T>(pixel + std::size_t(c) * sizeof(T));
+            T value = c == channels ? alpha : LoadBytes<T>(pixel + std::size_t(c) * sizeof(T));
             if (c < channels) {
                 if (layout.minIsWhite) value = T(max - value);
                 if (layout.associated) value = Unpremultiply(value, alpha, max);
             }
             if (reduce16)
-                Store(to + std::size_t(c), std::uint8_t((std::uint32_t(value) + 128u) / 257u));
+                StoreBytes(to + std::size_t(c), std::uint8_t((std::uint32_t(value) + 128u) / 257u));
             else
-                Store(to + std::size_t(c) * sizeof(T), value);
+                StoreBytes(to + std::size_t(c) * sizeof(T), value);
         }
     }
 }
@@ -370,17 +363,18 @@ void ConvertFloatRow(const Layout& layout, const std::byte* in, std::byte* out, 
     const std::size_t inPixel = std::size_t(layout.samples) * 4;
     for (std::uint32_t x = 0; x < width; ++x) {
         const std::byte* pixel = in + x * inPixel;
-        const float alpha = layout.alpha >= 0 ? Load<float>(pixel + std::size_t(layout.alpha) * 4) : 1.0f;
+        const float alpha =
+            layout.alpha >= 0 ? LoadBytes<float>(pixel + std::size_t(layout.alpha) * 4) : 1.0f;
         float rgb[3];
         for (int c = 0; c < 3; ++c) {
-            float value = Load<float>(pixel + (layout.colourSamples == 1 ? 0 : std::size_t(c) * 4));
+            float value = LoadBytes<float>(pixel + (layout.colourSamples == 1 ? 0 : std::size_t(c) * 4));
             if (layout.minIsWhite) value = 1.0f - value;
             rgb[c] = layout.associated ? UnpremultiplyFloat(value, alpha) : value;
         }
         std::byte* to = out + std::size_t(x) * 16;
         for (int c = 0; c < 3; ++c)
-            Store(to + std::size_t(c) * 4, rgb[c]);
-        Store(to + 12, alpha);
+            StoreBytes(to + std::size_t(c) * 4, rgb[c]);
+        StoreBytes(to + 12, alpha);
     }
 }
 
@@ -392,19 +386,20 @@ void ConvertLabRow(const Layout& layout, const std::byte* in, std::byte* out, st
     const bool icc = layout.colour == Colour::ICCLab;
     constexpr double neutral = Raster::LabA16Encoding::OpponentNeutral;
     auto lightness = [&](const std::byte* p) -> double {
-        if (layout.isFloat) return double(Load<float>(p)) * Raster::LabA16Encoding::LightnessScale;
-        return bytes == 1 ? double(Load<std::uint8_t>(p)) * 257.0 : double(Load<std::uint16_t>(p));
+        if (layout.isFloat) return double(LoadBytes<float>(p)) * Raster::LabA16Encoding::LightnessScale;
+        return bytes == 1 ? double(LoadBytes<std::uint8_t>(p)) * 257.0 : double(LoadBytes<std::uint16_t>(p));
     };
     auto opponent = [&](const std::byte* p) -> double {
-        if (layout.isFloat) return double(Load<float>(p)) * Raster::LabA16Encoding::OpponentScale + neutral;
+        if (layout.isFloat)
+            return double(LoadBytes<float>(p)) * Raster::LabA16Encoding::OpponentScale + neutral;
         if (bytes == 1)
-            return icc ? double(Load<std::uint8_t>(p)) * 256.0
-                       : (double(Load<std::int8_t>(p)) + 128.0) * 256.0;
-        return icc ? double(Load<std::uint16_t>(p)) : double(Load<std::int16_t>(p)) + neutral;
+            return icc ? double(LoadBytes<std::uint8_t>(p)) * 256.0
+                       : (double(LoadBytes<std::int8_t>(p)) + 128.0) * 256.0;
+        return icc ? double(LoadBytes<std::uint16_t>(p)) : double(LoadBytes<std::int16_t>(p)) + neutral;
     };
     auto alphaOf = [&](const std::byte* p) -> double {
-        if (layout.isFloat) return double(Load<float>(p)) * 65535.0;
-        return bytes == 1 ? double(Load<std::uint8_t>(p)) * 257.0 : double(Load<std::uint16_t>(p));
+        if (layout.isFloat) return double(LoadBytes<float>(p)) * 65535.0;
+        return bytes == 1 ? double(LoadBytes<std::uint8_t>(p)) * 257.0 : double(LoadBytes<std::uint16_t>(p));
     };
     for (std::uint32_t x = 0; x < width; ++x) {
         const std::byte* pixel = in + x * inPixel;
@@ -424,10 +419,10 @@ void ConvertLabRow(const Layout& layout, const std::byte* in, std::byte* out, st
             }
         }
         std::byte* to = out + std::size_t(x) * 8;
-        Store(to, ClampRound16(l));
-        Store(to + 2, ClampRound16(a));
-        Store(to + 4, ClampRound16(b));
-        Store(to + 6, ClampRound16(alpha));
+        StoreBytes(to, ClampRound16(l));
+        StoreBytes(to + 2, ClampRound16(a));
+        StoreBytes(to + 4, ClampRound16(b));
+        StoreBytes(to + 6, ClampRound16(alpha));
     }
 }
 
@@ -877,7 +872,7 @@ EncodeResult EncodeTiff(const Raster::DynamicBuffer& image, std::string_view nam
                 for (std::uint32_t x = 0; x < width; ++x)
                     for (std::size_t c : {std::size_t(1), std::size_t(2)}) {
                         std::byte* p = to + std::size_t(x) * storedPixelBytes + c * 2;
-                        Store(p, std::uint16_t(Load<std::uint16_t>(p) ^ 0x8000u));
+                        StoreBytes(p, std::uint16_t(LoadBytes<std::uint16_t>(p) ^ 0x8000u));
                     }
         }
         const auto size = tmsize_t(std::size_t(rows) * rowBytes);

@@ -1,6 +1,7 @@
 #include "host/raster/ICCManager.h"
 
 #include "host/kernel/Simd.h"
+#include "host/kernel/UnalignedBytes.h"
 #include "host/raster/LabMath.h"
 
 #include <algorithm>
@@ -203,16 +204,8 @@ int ColourCount(Model model) {
     return model == Model::Grey ? 1 : model == Model::CMYK ? 4 : 3;
 }
 
-template <class T>
-T Load(const std::byte* p) {
-    T v;
-    std::memcpy(&v, p, sizeof v);
-    return v;
-}
-template <class T>
-void Store(std::byte* p, T v) {
-    std::memcpy(p, &v, sizeof v);
-}
+using Kernel::LoadBytes;
+using Kernel::StoreBytes;
 
 // One pixel's stored components to the numbers lcms2 reads (0..1 RGB and grey, 0..100 ink, Lab as it is) and
 // its alpha as 0..1.
@@ -225,21 +218,21 @@ void Unpack(PixelFormat format, const std::byte* p, bool formula, float* colour,
         break;
     case PixelFormat::RGBA16:
         for (int c = 0; c < 3; ++c)
-            colour[c] = float(Load<std::uint16_t>(p + c * 2)) / 65535.0f;
-        alpha = float(Load<std::uint16_t>(p + 6)) / 65535.0f;
+            colour[c] = float(LoadBytes<std::uint16_t>(p + c * 2)) / 65535.0f;
+        alpha = float(LoadBytes<std::uint16_t>(p + 6)) / 65535.0f;
         break;
     case PixelFormat::RGBAUF:
         for (int c = 0; c < 3; ++c)
-            colour[c] = Load<float>(p + c * 4);
-        alpha = Load<float>(p + 12);
+            colour[c] = LoadBytes<float>(p + c * 4);
+        alpha = LoadBytes<float>(p + 12);
         break;
     case PixelFormat::IA8:
         colour[0] = float(std::uint8_t(p[0])) / 255.0f;
         alpha = float(std::uint8_t(p[1])) / 255.0f;
         break;
     case PixelFormat::IA16:
-        colour[0] = float(Load<std::uint16_t>(p)) / 65535.0f;
-        alpha = float(Load<std::uint16_t>(p + 2)) / 65535.0f;
+        colour[0] = float(LoadBytes<std::uint16_t>(p)) / 65535.0f;
+        alpha = float(LoadBytes<std::uint16_t>(p + 2)) / 65535.0f;
         break;
     case PixelFormat::CMYKA8: {
         float ink[4];
@@ -255,11 +248,12 @@ void Unpack(PixelFormat format, const std::byte* p, bool formula, float* colour,
         break;
     }
     case PixelFormat::LabA16:
-        colour[0] = float(Load<std::uint16_t>(p)) / float(LabA16Encoding::LightnessScale);
+        colour[0] = float(LoadBytes<std::uint16_t>(p)) / float(LabA16Encoding::LightnessScale);
         for (int c = 1; c < 3; ++c)
-            colour[c] = (float(Load<std::uint16_t>(p + c * 2)) - float(LabA16Encoding::OpponentNeutral)) /
-                        float(LabA16Encoding::OpponentScale);
-        alpha = float(Load<std::uint16_t>(p + 6)) / 65535.0f;
+            colour[c] =
+                (float(LoadBytes<std::uint16_t>(p + c * 2)) - float(LabA16Encoding::OpponentNeutral)) /
+                float(LabA16Encoding::OpponentScale);
+        alpha = float(LoadBytes<std::uint16_t>(p + 6)) / 65535.0f;
         break;
     default:
         break;
@@ -281,21 +275,21 @@ void Pack(PixelFormat format, const float* colour, float alpha, bool formula, st
         break;
     case PixelFormat::RGBA16:
         for (int c = 0; c < 3; ++c)
-            Store(p + c * 2, Quantise<std::uint16_t>(colour[c] * 65535.0f, 65535.0f));
-        Store(p + 6, Quantise<std::uint16_t>(alpha * 65535.0f, 65535.0f));
+            StoreBytes(p + c * 2, Quantise<std::uint16_t>(colour[c] * 65535.0f, 65535.0f));
+        StoreBytes(p + 6, Quantise<std::uint16_t>(alpha * 65535.0f, 65535.0f));
         break;
     case PixelFormat::RGBAUF:
         for (int c = 0; c < 3; ++c)
-            Store(p + c * 4, colour[c]);
-        Store(p + 12, alpha);
+            StoreBytes(p + c * 4, colour[c]);
+        StoreBytes(p + 12, alpha);
         break;
     case PixelFormat::IA8:
         p[0] = std::byte(Quantise<std::uint8_t>(colour[0] * 255.0f, 255.0f));
         p[1] = std::byte(Quantise<std::uint8_t>(alpha * 255.0f, 255.0f));
         break;
     case PixelFormat::IA16:
-        Store(p, Quantise<std::uint16_t>(colour[0] * 65535.0f, 65535.0f));
-        Store(p + 2, Quantise<std::uint16_t>(alpha * 65535.0f, 65535.0f));
+        StoreBytes(p, Quantise<std::uint16_t>(colour[0] * 65535.0f, 65535.0f));
+        StoreBytes(p + 2, Quantise<std::uint16_t>(alpha * 65535.0f, 65535.0f));
         break;
     case PixelFormat::CMYKA8: {
         float ink[4];
@@ -316,12 +310,12 @@ void Pack(PixelFormat format, const float* colour, float alpha, bool formula, st
         break;
     }
     case PixelFormat::LabA16:
-        Store(p, Quantise<std::uint16_t>(colour[0] * float(LabA16Encoding::LightnessScale), 65535.0f));
+        StoreBytes(p, Quantise<std::uint16_t>(colour[0] * float(LabA16Encoding::LightnessScale), 65535.0f));
         for (int c = 1; c < 3; ++c)
-            Store(p + c * 2, Quantise<std::uint16_t>(colour[c] * float(LabA16Encoding::OpponentScale) +
-                                                         float(LabA16Encoding::OpponentNeutral),
-                                                     65535.0f));
-        Store(p + 6, Quantise<std::uint16_t>(alpha * 65535.0f, 65535.0f));
+            StoreBytes(p + c * 2, Quantise<std::uint16_t>(colour[c] * float(LabA16Encoding::OpponentScale) +
+                                                              float(LabA16Encoding::OpponentNeutral),
+                                                          65535.0f));
+        StoreBytes(p + 6, Quantise<std::uint16_t>(alpha * 65535.0f, 65535.0f));
         break;
     default:
         break;
