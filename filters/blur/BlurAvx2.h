@@ -73,6 +73,31 @@ template <class Read>
     });
 }
 
+// Two neighbouring 4-byte pixels at each lane's offset: the first of each pair in first, the second in
+// second. Half the loads of fetching the two corners apart.
+[[gnu::always_inline]] RT_TARGET_AVX2 inline void LoadPairs(const std::byte* base, __m256i offset,
+                                                            __m256i& first, __m256i& second) noexcept {
+    auto pair = [base](std::int32_t at) {
+        std::int64_t both;
+        __builtin_memcpy(&both, base + at, sizeof both);
+        return both;
+    };
+    const __m128i low = _mm256_castsi256_si128(offset), high = _mm256_extracti128_si256(offset, 1);
+    // Lanes 0, 1 | 4, 5 and 2, 3 | 6, 7, each pixel pair in one 64-bit half.
+    const __m256i even = _mm256_set_m128i(_mm_insert_epi64(_mm_cvtsi64_si128(pair(_mm_cvtsi128_si32(high))),
+                                                           pair(_mm_extract_epi32(high, 1)), 1),
+                                          _mm_insert_epi64(_mm_cvtsi64_si128(pair(_mm_cvtsi128_si32(low))),
+                                                           pair(_mm_extract_epi32(low, 1)), 1));
+    const __m256i odd = _mm256_set_m128i(_mm_insert_epi64(_mm_cvtsi64_si128(pair(_mm_extract_epi32(high, 2))),
+                                                          pair(_mm_extract_epi32(high, 3)), 1),
+                                         _mm_insert_epi64(_mm_cvtsi64_si128(pair(_mm_extract_epi32(low, 2))),
+                                                          pair(_mm_extract_epi32(low, 3)), 1));
+    first = _mm256_castps_si256(
+        _mm256_shuffle_ps(_mm256_castsi256_ps(even), _mm256_castsi256_ps(odd), _MM_SHUFFLE(2, 0, 2, 0)));
+    second = _mm256_castps_si256(
+        _mm256_shuffle_ps(_mm256_castsi256_ps(even), _mm256_castsi256_ps(odd), _MM_SHUFFLE(3, 1, 3, 1)));
+}
+
 // Eight pixels of a format: gathered from their byte offsets, split into float components, and the results
 // rounded, packed and stored. Raw holds eight pixels as stored, so that exact copies keep their bits. N is
 // the number of components, A alpha's.
@@ -271,6 +296,41 @@ RT_TARGET_AVX2 inline void Split(const double* at, double low, double high, __m1
     fraction = _mm256_cvtpd_ps(_mm256_sub_pd(clamped, floor));
 }
 
+// Fills corners (x0, y0), (x1, y0), (x0, y1), (x1, y1) of four-byte pixels from pairs where the grid's
+// pixels lie next to each other along an axis; false, filling nothing, where they do not. A pair starts one
+// pixel short of the grid's last, so that it stays within the grid; where the corner is the last pixel, the
+// pair's second stands for both, as the clamped x1 or y1 does.
+template <class P>
+[[gnu::always_inline]] RT_TARGET_AVX2 inline bool
+PairedCorners(const Access& grid, __m256i x0, __m256i y0, __m256i column0, __m256i column1, __m256i row0,
+              __m256i row1, typename P::Raw (&corners)[4]) noexcept {
+    if constexpr (sizeof(typename P::Raw) != sizeof(__m256i)) {
+        return false;
+    } else {
+        const bool alongX = grid.xStride == 4 && grid.lastX > grid.left;
+        if (!alongX && !(grid.yStride == 4 && grid.lastY > grid.top)) return false;
+        const __m256i whole = alongX ? x0 : y0;
+        const __m256i start =
+            _mm256_min_epi32(whole, _mm256_set1_epi32((alongX ? grid.lastX : grid.lastY) - 1));
+        const __m256i offset =
+            _mm256_mullo_epi32(_mm256_sub_epi32(start, _mm256_set1_epi32(alongX ? grid.left : grid.top)),
+                               _mm256_set1_epi32(alongX ? grid.xStride : grid.yStride));
+        const __m256i last = _mm256_cmpgt_epi32(whole, start);
+        // Along x the pairs are rows 0 and 1 (corners 0, 1 and 2, 3); along y columns 0 and 1 (0, 2 and 1,
+        // 3).
+        const int second = alongX ? 1 : 2;
+        for (int k = 0; k < 2; ++k) {
+            const int first = alongX ? 2 * k : k;
+            __m256i a, b;
+            LoadPairs(grid.base,
+                      _mm256_add_epi32(offset, alongX ? (k ? row1 : row0) : (k ? column1 : column0)), a, b);
+            corners[first].v = _mm256_blendv_epi8(a, b, last);
+            corners[first + second].v = b;
+        }
+        return true;
+    }
+}
+
 template <Raster::PixelFormat F>
 [[gnu::always_inline]] RT_TARGET_AVX2 inline void
 Sample8(const Access& grid, const double* xs, const double* ys, typename FormatPixels<F>::T* out) noexcept {
@@ -296,10 +356,13 @@ Sample8(const Access& grid, const double* xs, const double* ys, typename FormatP
 
     // The corners as stored; their components are taken out where they are used, which keeps the
     // registers free.
-    const typename P::Raw corners[4] = {P::Gather(grid.base, _mm256_add_epi32(column0, row0)),
-                                        P::Gather(grid.base, _mm256_add_epi32(column1, row0)),
-                                        P::Gather(grid.base, _mm256_add_epi32(column0, row1)),
-                                        P::Gather(grid.base, _mm256_add_epi32(column1, row1))};
+    typename P::Raw corners[4];
+    if (!PairedCorners<P>(grid, x0, y0, column0, column1, row0, row1, corners)) {
+        corners[0] = P::Gather(grid.base, _mm256_add_epi32(column0, row0));
+        corners[1] = P::Gather(grid.base, _mm256_add_epi32(column1, row0));
+        corners[2] = P::Gather(grid.base, _mm256_add_epi32(column0, row1));
+        corners[3] = P::Gather(grid.base, _mm256_add_epi32(column1, row1));
+    }
     const __m256 unit = _mm256_set1_ps(1.0f);
     const __m256 gx = _mm256_sub_ps(unit, fx), gy = _mm256_sub_ps(unit, fy);
     const __m256 weight[4] = {_mm256_mul_ps(gx, gy), _mm256_mul_ps(fx, gy), _mm256_mul_ps(gx, fy),

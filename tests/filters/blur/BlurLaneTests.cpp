@@ -101,6 +101,7 @@ TYPED_TEST(BlurRuns, RunsOfSamplesEqualSingleSamples) {
     const auto image = Grid<F>(29, 19, 21);
     const Blur::RowGrid<F> rows{*image, 3, -5};
     const Blur::LineGrid<F> lines{*image, -7, 2, 17}; // 17 of the 19 rows, each a column of the frame
+    const auto thin = Grid<F>(1, 19, 23);
     std::mt19937 random(31);
     std::uniform_real_distribution<double> anywhere(-12.0, 40.0);
     std::vector<double> xs(160), ys(160);
@@ -130,6 +131,9 @@ TYPED_TEST(BlurRuns, RunsOfSamplesEqualSingleSamples) {
         };
         check(rows, "rows");
         check(lines, "lines");
+        // Grids one pixel across, whose neighbours cannot be fetched in pairs.
+        check(Blur::RowGrid<F>{*thin, 0, 2}, "rows of one column");
+        check(Blur::LineGrid<F>{*thin, 1, -3, 17}, "lines of one pixel");
     }
 }
 
