@@ -36,8 +36,10 @@ struct ProceduralTextureFilter {
     static constexpr ToolID kToolID = ToolID::ProceduralTexture;
     static constexpr int kStarterPresetCount = 5;
     // --config FILE.json, or --eq CHANNELS=EXPRESSION (repeatable) with --colour FORMAT, --angles deg|rad and
-    // --input NAME=VALUE (repeatable; a new input is a real number).
-    static constexpr std::array<std::string_view, 5> kTextFlags{"config", "eq", "colour", "angles", "input"};
+    // --input NAME=VALUE (repeatable; a new input is a real number); --blend MODE names the blend mode
+    // ("multiply", "colour-dodge", ...).
+    static constexpr std::array<std::string_view, 6> kTextFlags{"config", "eq",    "colour",
+                                                                "angles", "input", "blend"};
 
     // Every starter preset, at an origin off the pixel grid, and one half-transparent.
     static constexpr std::array<Params, 6> kSamples{{

@@ -279,6 +279,37 @@ std::string ProceduralTextureCommand::FormatEquation(Config::ColourFormat format
     return Config::FormatChannels(format, equation.GetChannelMask()) + "=" + equation.GetText();
 }
 
+namespace {
+// A blend mode's name on the command line: the host's name in lower case, spaces as hyphens.
+std::string BlendModeFlagName(int mode) {
+    std::string name = Kernel::ReflectedBlendMode::GetBlendModeNames()[std::size_t(mode)].GetEnglish();
+    for (char& c : name)
+        c = c == ' ' ? '-' : char(std::tolower(static_cast<unsigned char>(c)));
+    return name;
+}
+
+std::string BlendModeList() {
+    std::string list;
+    for (int mode = 0; mode < ProceduralTextureCommand::BlendModeCount; ++mode)
+        list += (mode ? ", " : "") + BlendModeFlagName(mode);
+    return list;
+}
+} // namespace
+
+std::optional<ProceduralTextureCommand::BlendModeType>
+ProceduralTextureCommand::ParseBlendMode(std::string_view text) {
+    std::string wanted(text);
+    for (char& c : wanted)
+        c = c == ' ' || c == '_' ? '-' : char(std::tolower(static_cast<unsigned char>(c)));
+    for (int mode = 0; mode < BlendModeCount; ++mode) {
+        const std::string name = BlendModeFlagName(mode);
+        std::string american = name;
+        if (const auto at = american.find("colour"); at != std::string::npos) american.erase(at + 4, 1);
+        if (wanted == name || wanted == american) return mode;
+    }
+    return std::nullopt;
+}
+
 Counted<RasterCommand>
 ProceduralTextureCommand::MakeCommandWithText(bool liveEffect, const std::vector<ParameterValue>& values,
                                               const std::vector<std::pair<std::string, std::string>>& texts,
@@ -296,8 +327,16 @@ ProceduralTextureCommand::MakeCommandWithText(bool liveEffect, const std::vector
     std::optional<bool> radians;
     std::vector<std::string> equations, assignments;
     bool fromFile = false;
+    BlendModeType blendMode = 0;
     for (const auto& [flag, text] : texts) {
-        if (flag == "config") {
+        if (flag == "blend") {
+            const auto mode = ParseBlendMode(text);
+            if (!mode) {
+                error = "--blend: \"" + text + "\" is not a blend mode (" + BlendModeList() + ")";
+                return nullptr;
+            }
+            blendMode = *mode;
+        } else if (flag == "config") {
             if (fromFile) {
                 error = "--config is given more than once";
                 return nullptr;
@@ -406,8 +445,8 @@ ProceduralTextureCommand::MakeCommandWithText(bool liveEffect, const std::vector
         }
     }
     if (!ValidateConfig(config, valuesCopy, &error)) return nullptr;
-    return Counted<RasterCommand>(
-        new ProceduralTextureCommand(liveEffect, params.origin, params.opacity, 0, config, valuesCopy));
+    return Counted<RasterCommand>(new ProceduralTextureCommand(liveEffect, params.origin, params.opacity,
+                                                               blendMode, config, valuesCopy));
 }
 
 // ---- The device's Sample text
@@ -455,10 +494,12 @@ const float h = sampler_params[9];
 const float rx = sx - ox;
 const float ry = sy - oy;
 const float opacity = sampler_params[%5];
+const int blend_mode = (int)sampler_params[%6];
 %1
 const source_type pixel = Extend(TransformPixelCenterToInt(location,transform_params),source_bounds,input_pixels,source_params);
 %2
 %3
+%7
 source_type result = pixel;
 %4
 (void)sampler_bounds;
@@ -517,6 +558,13 @@ std::string BuildSampleText(const Config& config, const ProceduralTextureState& 
         reads += "const float ch" + n + " = raw" + n + " / " + access->maximum + ";\n";
         reads += "float out" + n + " = raw" + n + ";\n";
     }
+    // The layer's normalised values and the texture's, which the equations' calls fill in.
+    reads += "float src[5];\nfloat tex[5];\n";
+    for (int c = 0; c < channels; ++c) {
+        const std::string n = std::to_string(c);
+        reads += "src[" + n + "] = ch" + n + ";\ntex[" + n + "] = ch" + n + ";\n";
+    }
+    std::uint32_t written = 0;
 
     std::string functions, calls;
     for (std::size_t e = 0; e < state.equations.size(); ++e) {
@@ -540,17 +588,30 @@ std::string BuildSampleText(const Config& config, const ProceduralTextureState& 
             const std::string value = components < 2   ? std::string("res")
                                       : k < components ? "res.v[" + std::to_string(k) + "]"
                                                        : std::string("0.0f");
-            if (access->stored)
-                stores += "out" + n + "=ProceduralIntegerChannel(" + value + ",raw" + n + "," +
-                          access->maximum + ",opacity);";
-            else
-                stores += "out" + n + "=ProceduralFloatChannel(" + value + ",raw" + n + ",opacity," +
-                          (c == channels - 1 ? "1" : "0") + ");";
+            stores += "tex[" + n + "]=" + value + ";";
+            written |= 1u << c;
             ++k;
         }
         calls += "{const " + type + " res = " + (cpp ? "Utils::Process" : "ProceduralProcess") + number +
                  "(" + arguments + "); " + stores + "}\n";
     }
+
+    // Blended by the mode (Normal keeps the texture's values), then mixed with the layer by the opacity.
+    std::string blend = "const uint stored = blend_mode == 0 ? " + std::to_string(written) +
+                        "u : ProceduralBlend(blend_mode," + std::to_string(int(config.GetColourFormat())) +
+                        "," + std::to_string(written) + "u," + (access->stored ? "1" : "0") + ",src,tex);\n";
+    for (int c = 0; c < channels; ++c) {
+        const std::string n = std::to_string(c);
+        if (access->stored)
+            blend += "if (stored & " + std::to_string(1u << c) + "u) out" + n +
+                     "=ProceduralIntegerChannel(tex[" + n + "],raw" + n + "," + access->maximum +
+                     ",opacity);\n";
+        else
+            blend += "if (stored & " + std::to_string(1u << c) + "u) out" + n +
+                     "=ProceduralFloatChannel(tex[" + n + "],raw" + n + ",opacity," +
+                     (c == channels - 1 ? "1" : "0") + ");\n";
+    }
+    if (!written) blend = "(void)src;\n(void)blend_mode;\n";
 
     std::string writes;
     for (int c = 0; c < channels; ++c) {
@@ -559,10 +620,13 @@ std::string BuildSampleText(const Config& config, const ProceduralTextureState& 
                   (access->stored ? std::string("(") + access->stored + ")out" + n : "out" + n) + ";\n";
     }
 
-    std::string body =
-        Raster::FormatKernelText(SampleBody, {declarations, reads, calls, writes,
-                                              std::to_string(ProceduralTextureMath::OpacityIndex)});
-    std::string text = std::string(prelude) + ProceduralTextureMath::GetProceduralTextureMathText();
+    std::string body = Raster::FormatKernelText(
+        SampleBody, {declarations, reads, calls, writes, std::to_string(ProceduralTextureMath::OpacityIndex),
+                     std::to_string(ProceduralTextureMath::BlendIndex), blend});
+    const char* blendMath = Raster::GetBlendModeMathText(language);
+    if (!blendMath) return {};
+    std::string text =
+        std::string(prelude) + blendMath + ProceduralTextureMath::GetProceduralTextureMathText();
     if (cpp) {
         // Language 0 keeps the equations as static functions of a local structure, beside the expression
         // prelude's namespace.
@@ -748,6 +812,7 @@ ProceduralTextureCommand::GetSamplerParams(const Kernel::RectT<double>& bounds,
     params.block[8] = float(bounds.Width());
     params.block[9] = float(bounds.Height());
     params.block[ProceduralTextureMath::OpacityIndex] = float(m_Params.opacity);
+    params.block[ProceduralTextureMath::BlendIndex] = float(m_BlendMode);
     int slot = ProceduralTextureMath::FirstInputSlot;
     const int end = ProceduralTextureMath::FirstInputSlot + ProceduralTextureMath::InputSlots;
     if (!m_Config) return params;

@@ -19,7 +19,7 @@ public:
     using State = ProceduralTextureState;
     // An index into the host's blend-mode names (Kernel::ReflectedBlendMode); 0 is Normal.
     using BlendModeType = int;
-    static constexpr int BlendModeCount = 16;
+    static constexpr int BlendModeCount = Raster::BlendModeCount;
 
     template <Raster::PixelFormat F>
     using PlainStages = ProceduralTextureStages::Plain<F>;
@@ -63,6 +63,8 @@ public:
     // '='.
     static std::optional<ProceduralTextureEquation>
     ParseEquation(Config::ColourFormat format, std::string_view text, std::string* error = nullptr);
+    // A blend mode named as on the command line ("multiply", "colour-dodge" or "color-dodge", any case).
+    static std::optional<BlendModeType> ParseBlendMode(std::string_view text);
     static std::string FormatEquation(Config::ColourFormat format, const ProceduralTextureEquation& equation);
     // The catalogue's form for the command line: the table's values and the text flags (see kTextFlags).
     static Kernel::Counted<RasterCommand>

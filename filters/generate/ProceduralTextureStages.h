@@ -52,6 +52,7 @@ public:
     // each channel an equation writes gets its new (unscaled) value in result. Returns the channels written.
     unsigned Evaluate(int x0, int y, int n, const float* block, const float (*source)[Lanes],
                       float (*result)[Lanes]);
+    ProceduralTextureConfig::ColourFormat GetColourFormat() const noexcept { return m_State.colourFormat; }
 
 private:
     const ProceduralTextureState& m_State;
@@ -94,6 +95,8 @@ struct ProceduralTextureSampler {
         using Component = Raster::FormatComponent<F>;
         constexpr float Maximum = Raster::PixelTraits<F>::Maximum;
         constexpr int Lanes = ProceduralTextureEvaluator::Lanes;
+        constexpr int MaxChannels = ProceduralTextureEvaluator::MaxChannels;
+        static_assert(Channels <= MaxChannels);
 
         for (int i = 0; i < n; ++i)
             out[i] =
@@ -114,17 +117,29 @@ struct ProceduralTextureSampler {
         const unsigned written = params.evaluator->Evaluate(x0, y, n, params.block, source, result);
         if (!written) return;
         const float opacity = params.block[ProceduralTextureMath::OpacityIndex];
+        const int mode = int(params.block[ProceduralTextureMath::BlendIndex]);
+        const int colourFormat = int(params.evaluator->GetColourFormat());
         for (int i = 0; i < n; ++i) {
             Component components[Channels];
             std::memcpy(components, &out[i], sizeof components);
+            // Sized for any format, so that the blend's channel indexing stays in bounds for every one.
+            float layer[MaxChannels] = {}, texture[MaxChannels] = {};
             for (int c = 0; c < Channels; ++c) {
-                if (!(written & (1u << c))) continue;
+                layer[c] = source[c][i];
+                texture[c] = (written & (1u << c)) ? result[c][i] : layer[c];
+            }
+            const unsigned stored =
+                mode == 0 ? written
+                          : ProceduralTextureMath::ProceduralBlend(mode, colourFormat, written,
+                                                                   !Raster::IsFloatFormat(F), layer, texture);
+            for (int c = 0; c < Channels; ++c) {
+                if (!(stored & (1u << c))) continue;
                 if constexpr (Raster::IsFloatFormat(F))
-                    components[c] = ProceduralTextureMath::ProceduralFloatChannel(result[c][i], raw[c][i],
+                    components[c] = ProceduralTextureMath::ProceduralFloatChannel(texture[c], raw[c][i],
                                                                                   opacity, c == Channels - 1);
                 else
                     components[c] = Component(ProceduralTextureMath::ProceduralIntegerChannel(
-                        result[c][i], raw[c][i], Maximum, opacity));
+                        texture[c], raw[c][i], Maximum, opacity));
             }
             std::memcpy(&out[i], components, sizeof components);
         }

@@ -1,5 +1,6 @@
 // The host's kernel fragments: image access, extends, the normal blend, conversion wrappers and the per-pixel
 // loop, for both kernel languages.
+#include "host/raster/BlendModeMath.h"
 #include "host/raster/KernelFragments.h"
 #include "host/raster/KernelText.h"
 
@@ -309,6 +310,18 @@ const char* GetBlendFragment(BlendMode mode, HardwareKernelLanguage language) {
         return NormalBlend::GetHardwareFragment(language);
     }
     return nullptr;
+}
+
+const char* GetBlendModeMathText(HardwareKernelLanguage language) {
+    static const KernelTextPair texts([](Language textLanguage) -> std::string {
+        const char* sqrt = textLanguage == Language::OpenCLC   ? "sqrt"
+                           : textLanguage == Language::CudaCpp ? "sqrtf"
+                                                               : nullptr;
+        if (!sqrt) return {};
+        return std::string("#ifndef RT_BLEND_MODE_MATH\n#define RT_BLEND_MODE_MATH\n#define rt_sqrt ") +
+               sqrt + "\n" + RASTER_KERNEL_STRINGIFY(RT_BLEND_MODE_SOURCE) + "\n#endif\n";
+    });
+    return texts.Get(language);
 }
 
 const char* KernelPerPixel<Horizontal>::GetHardwareFragment(HardwareKernelLanguage language, bool readsMask,

@@ -38,8 +38,9 @@ Config::Handle MakeConfig(Config::ColourFormat format, std::initializer_list<Eq>
 
 Counted<ProceduralTextureCommand> MakeCommand(const Config::Handle& config,
                                               Counted<const ExpressionConstantValues> values = nullptr,
-                                              Kernel::PointT<double> origin = {}, double opacity = 1.0) {
-    return Kernel::MakeCounted<ProceduralTextureCommand>(false, origin, opacity, 0, config, values);
+                                              Kernel::PointT<double> origin = {}, double opacity = 1.0,
+                                              int blendMode = 0) {
+    return Kernel::MakeCounted<ProceduralTextureCommand>(false, origin, opacity, blendMode, config, values);
 }
 
 // An RGBA8 image of every pixel (r, g, b, a).
@@ -155,6 +156,93 @@ TEST(ProceduralTextureValues, OpacityMixesWithTheLayer) {
     EXPECT_EQ(
         RenderPixel(*MakeCommand(MakeConfig(Config::RGB, {{"1", 1}}), nullptr, {}, 0.0), source, 0, 0)[0],
         100);
+}
+
+// Every blend mode on one pixel pair, worked out from the modes' defining formulas (B(b, s) channel by
+// channel for the separable ones; luminosity 0.3 R + 0.59 G + 0.11 B with the set-luminosity, set-saturation
+// and clip steps for the others) with the layer b = (201, 57, 113) / 255 and the texture s = (0.31, 0.67,
+// 0.53), the result times 255 truncated. Alpha is replaced by the texture, never blended.
+TEST(ProceduralTextureBlendModes, EveryModeOnAHandWorkedPixel) {
+    const auto source = Filled(201, 57, 113, 200);
+    const auto config = MakeConfig(Config::RGB, {{"vec3(0.31, 0.67, 0.53)", 7}, {"0.5", 8}});
+    const std::vector<std::vector<double>> expected = {
+        {79, 170, 135, 127},  // Normal: the texture
+        {62, 38, 59, 127},    // Multiply: b s
+        {217, 189, 188, 127}, // Screen: b + s - b s
+        {180, 76, 119, 127},  // Overlay: hard light with b and s swapped
+        {79, 57, 113, 127},   // Darken: the smaller
+        {201, 170, 135, 127}, // Lighten: the larger
+        {255, 172, 240, 127}, // Colour dodge: b / (1 - s), at most 1
+        {80, 0, 0, 127},      // Colour burn: 1 - (1 - b) / s, at least 0
+        {124, 124, 121, 127}, // Hard light: 2 b s below s = 0.5, screen with 2 s - 1 above
+        {184, 78, 116, 127},  // Soft light: b - (1 - 2s) b (1 - b), or toward sqrt(b) above s = 0.5
+        {121, 113, 22, 127},  // Difference: |b - s|
+        {155, 151, 128, 127}, // Exclusion: b + s - 2 b s
+        {11, 155, 99, 127},   // Hue: the texture's hue at the layer's saturation and luminosity
+        {166, 74, 110, 127},  // Saturation: the texture's saturation
+        {46, 137, 102, 127},  // Colour: the texture's hue and saturation at the layer's luminosity
+        {234, 90, 146, 127},  // Luminosity: the layer's hue and saturation at the texture's luminosity
+    };
+    ASSERT_EQ(int(expected.size()), ProceduralTextureCommand::BlendModeCount);
+    for (int mode = 0; mode < ProceduralTextureCommand::BlendModeCount; ++mode)
+        EXPECT_EQ(RenderPixel(*MakeCommand(config, nullptr, {}, 1.0, mode), source, 1, 1),
+                  expected[std::size_t(mode)])
+            << Kernel::ReflectedBlendMode::GetBlendModeNames()[std::size_t(mode)].GetEnglish();
+
+    // The opacity mixes the blended value with the layer: multiply's 62.31 at one half from 201 is 131.66.
+    EXPECT_EQ(RenderPixel(*MakeCommand(config, nullptr, {}, 0.5, 1), source, 0, 0)[0], 131);
+    // A texture that writes only red leaves green and blue to the separable modes ...
+    const auto red = MakeConfig(Config::RGB, {{"0.31", 1}});
+    EXPECT_EQ(RenderPixel(*MakeCommand(red, nullptr, {}, 1.0, 1), source, 0, 0), Px(62, 57, 113, 200));
+    // ... while luminosity moves every colour channel: the texture pixel (0.31, 57/255, 113/255) has the
+    // luminosity 0.27363 and the layer 0.41710, so the layer's colour shifts by -0.14347 (no clipping
+    // needed): (0.64477, 0.08006, 0.29967) -> (164, 20, 76).
+    EXPECT_EQ(RenderPixel(*MakeCommand(red, nullptr, {}, 1.0, 15), source, 0, 0), Px(164, 20, 76, 200));
+}
+
+TEST(ProceduralTextureBlendModes, OtherColourFormats) {
+    // CMYK blends the inks' complements, so multiply adds ink: 1 - (1 - 101/255)(1 - 0.33) = 0.59537 -> 151,
+    // and screen multiplies the inks: 101/255 * 0.33 = 0.13071 -> 33.
+    const std::uint8_t cmykPixel[5] = {101, 0, 0, 0, 255};
+    const auto cmyk = PipelineTest::MakeFilled(PixelFormat::CMYKA8, 4, 4, cmykPixel);
+    const auto cmykConfig = MakeConfig(Config::CMYK, {{"0.33", 1}});
+    EXPECT_EQ(RenderPixel(*MakeCommand(cmykConfig, nullptr, {}, 1.0, 1), cmyk, 0, 0),
+              (std::vector<double>{151, 0, 0, 0, 255}));
+    EXPECT_EQ(RenderPixel(*MakeCommand(cmykConfig, nullptr, {}, 1.0, 2), cmyk, 0, 0),
+              (std::vector<double>{33, 0, 0, 0, 255}));
+
+    // Lab: multiply acts on lightness and keeps the layer's a and b; colour takes a and b from the texture
+    // (0.1 and 0.9 of 65535, truncated) and luminosity takes lightness alone.
+    const std::uint16_t labPixel[4] = {40000, 20000, 50000, 65535};
+    const auto lab = PipelineTest::MakeFilled(PixelFormat::LabA16, 4, 4, labPixel);
+    const auto labConfig = MakeConfig(Config::Lab, {{"vec3(0.5, 0.1, 0.9)", 7}});
+    EXPECT_EQ(RenderPixel(*MakeCommand(labConfig, nullptr, {}, 1.0, 1), lab, 0, 0),
+              Px(20000, 20000, 50000, 65535));
+    EXPECT_EQ(RenderPixel(*MakeCommand(labConfig, nullptr, {}, 1.0, 14), lab, 0, 0),
+              Px(40000, 6553, 58981, 65535));
+    EXPECT_EQ(RenderPixel(*MakeCommand(labConfig, nullptr, {}, 1.0, 15), lab, 0, 0),
+              Px(32767, 20000, 50000, 65535));
+
+    // A grey has no hue or saturation: hue, saturation and colour keep the layer; luminosity takes the
+    // texture.
+    const std::uint8_t greyPixel[2] = {200, 255};
+    const auto grey = PipelineTest::MakeFilled(PixelFormat::IA8, 4, 4, greyPixel);
+    const auto greyConfig = MakeConfig(Config::Intensity, {{"0.5", 1}});
+    EXPECT_EQ(RenderPixel(*MakeCommand(greyConfig, nullptr, {}, 1.0, 1), grey, 0, 0),
+              (std::vector<double>{100, 255}));
+    for (const int mode : {12, 13, 14})
+        EXPECT_EQ(RenderPixel(*MakeCommand(greyConfig, nullptr, {}, 1.0, mode), grey, 0, 0),
+                  (std::vector<double>{200, 255}));
+    EXPECT_EQ(RenderPixel(*MakeCommand(greyConfig, nullptr, {}, 1.0, 15), grey, 0, 0),
+              (std::vector<double>{127, 255}));
+
+    // Out-of-range texture values are clamped before blending on integer channels (a stored layer could not
+    // hold them): multiply by 1.7 is multiply by 1, the layer's 201 exactly; by -0.2 is 0.
+    const auto source = Filled(201, 57, 113, 255);
+    EXPECT_EQ(
+        RenderPixel(*MakeCommand(MakeConfig(Config::RGB, {{"1.7", 1}, {"-0.2", 2}}), nullptr, {}, 1.0, 1),
+                    source, 0, 0),
+        Px(201, 0, 113, 255));
 }
 
 TEST(ProceduralTextureValidation, EmptyBrokenAndMismatchedConfigs) {
@@ -283,6 +371,34 @@ TEST(ProceduralTextureAgreement, ProcessorAndDeviceAgreeInEveryAcceptedFormatAnd
                 if (const auto difference = PipelineTest::Compare(*result, *reference, 0.0))
                     ADD_FAILURE() << (onDevice ? "device" : "processor") << ", tiles " << tile << ": "
                                   << difference->Describe();
+            }
+        }
+    }
+    if (!device) GTEST_SKIP() << "no OpenCL device: only processor tilings were compared";
+}
+
+// Every blend mode, at an opacity below 1, gives the same bytes on the device as on the processor.
+TEST(ProceduralTextureAgreement, EveryBlendModeAgreesInEveryAcceptedFormatAndTiling) {
+    const auto device = PipelineTest::OpenCLDevice();
+    for (const FormatCase& c : AgreementCases()) {
+        SCOPED_TRACE(Raster::GetPixelFormatName(c.format));
+        const auto source = PipelineTest::MakeImage(c.format, 83, 45, 5u);
+        for (int mode = 1; mode < ProceduralTextureCommand::BlendModeCount; ++mode) {
+            SCOPED_TRACE(mode);
+            const auto command = MakeCommand(c.config, AgreementValues(), {20.25, 9.5}, 0.75, mode);
+            const auto reference = PipelineTest::Render(*command, source, 0);
+            ASSERT_TRUE(reference);
+            for (const bool onDevice : {false, true}) {
+                if (onDevice && !device) continue;
+                for (const int tile : {0, 37}) {
+                    if (!onDevice && tile == 0) continue;
+                    const auto result =
+                        PipelineTest::Render(*command, source, tile, onDevice ? device : nullptr);
+                    ASSERT_TRUE(result);
+                    if (const auto difference = PipelineTest::Compare(*result, *reference, 0.0))
+                        ADD_FAILURE() << (onDevice ? "device" : "processor") << ", tiles " << tile << ": "
+                                      << difference->Describe();
+                }
             }
         }
     }
