@@ -86,6 +86,29 @@ TEST_F(ProceduralTextureCommandLine, LiveLayerSavesLoadsAndRendersAsApplied) {
     EXPECT_EQ(Bytes("applied.png"), Bytes("live.png"));
 }
 
+TEST_F(ProceduralTextureCommandLine, BlendModeSurvivesALiveLayerSavedAndLoaded) {
+    const std::string in = "'" EXAMPLE_IMAGE "'";
+    const std::string texture =
+        "--eq 'rgb=vec3(fract(x / 17), 0.4, y / h)' --blend colour-dodge --opacity 0.8";
+    ASSERT_EQ(Run("apply proceduraltexture " + texture + " --device cpu " + in + " dodge.png").exitCode, 0);
+    ASSERT_EQ(Run("apply proceduraltexture --eq 'rgb=vec3(fract(x / 17), 0.4, y / h)' --opacity 0.8 "
+                  "--device cpu " +
+                  in + " normal.png")
+                  .exitCode,
+              0);
+    EXPECT_NE(Bytes("dodge.png"), Bytes("normal.png")) << "the blend mode changes the picture";
+    ASSERT_EQ(Run("doc new " + in + " -o b.rtd").exitCode, 0);
+    const Result added = Run("doc filter b.rtd proceduraltexture " + texture + " --live");
+    ASSERT_EQ(added.exitCode, 0) << added.output;
+    const Result rendered = Run("doc render b.rtd live.png --device cpu");
+    ASSERT_EQ(rendered.exitCode, 0) << rendered.output;
+    EXPECT_EQ(Bytes("dodge.png"), Bytes("live.png"));
+
+    const Result unknown = Run("apply proceduraltexture --eq 'rgb=1' --blend dissolve " + in + " x.png");
+    EXPECT_EQ(unknown.exitCode, 1);
+    EXPECT_NE(unknown.output.find("colour-dodge"), std::string::npos) << unknown.output;
+}
+
 TEST_F(ProceduralTextureCommandLine, ToolHistoryAndPresetsThroughPlay) {
     Write("t.play", "tool proceduraltexture\nstart\nshow hint\nset Prst 3\nset AdEq x\nset Eq03 a=x/w\n"
                     "click 40,30\nset TUnd x\nshow reflected\nset TRed x\ncommit\nshow history\n");
