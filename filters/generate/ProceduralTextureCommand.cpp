@@ -481,8 +481,13 @@ std::optional<FormatAccess> DescribeFormat(Raster::PixelFormat format) {
 }
 
 // The Sample body: the pixel centre in texture space and the variables every equation reads (%1 the inputs'
-// declarations), the source pixel's channels (%2), the calls that store the results (%3) and the stores
-// into the returned pixel (%4).
+// declarations), the source pixel's channels (%2), the calls that store the results (%3), the blend and the
+// opacity (%6) and the stores into the returned pixel (%4).
+//
+// The texture's stages are the identity transform and the zero extend, so the source pixel is the one at
+// the pixel's own location (the identity takes the centre x + 0.5 to x), or zero outside the source. It is
+// read from clamped coordinates and then selected, without a branch around the load, so that compilers
+// that run work items as loops can keep them free of control flow.
 constexpr const char* SampleBody = R"(const float olx = (float)location.x + 0.5f;
 const float oly = (float)location.y + 0.5f;
 const float sx = (olx * sampler_params[0]) + (oly * sampler_params[1]) + sampler_params[2];
@@ -494,20 +499,23 @@ const float h = sampler_params[9];
 const float rx = sx - ox;
 const float ry = sy - oy;
 const float opacity = sampler_params[%5];
-const int blend_mode = (int)sampler_params[%6];
 %1
-const source_type pixel = Extend(TransformPixelCenterToInt(location,transform_params),source_bounds,input_pixels,source_params);
+const int inside = location.x >= 0 && location.y >= 0 && location.x < (int)source_bounds.x && location.y < (int)source_bounds.y;
+const source_type loaded = LoadSource(input_pixels, source_bounds, make_int2(rt_clampi(location.x, 0, (int)source_bounds.x - 1), rt_clampi(location.y, 0, (int)source_bounds.y - 1)));
+const source_type pixel = inside ? loaded : source_minimum();
 %2
 %3
-%7
+%6
 source_type result = pixel;
 %4
+(void)transform_params;
+(void)source_params;
 (void)sampler_bounds;
 (void)sampler_pixels;
 return result;)";
 
 std::string BuildSampleText(const Config& config, const ProceduralTextureState& state,
-                            Raster::PixelFormat format, HardwareKernelLanguage language) {
+                            Raster::PixelFormat format, HardwareKernelLanguage language, bool blended) {
     const auto access = DescribeFormat(format);
     if (!access) return {};
     const bool cpp = language == HardwareKernelLanguage::CudaCpp;
@@ -558,11 +566,10 @@ std::string BuildSampleText(const Config& config, const ProceduralTextureState& 
         reads += "const float ch" + n + " = raw" + n + " / " + access->maximum + ";\n";
         reads += "float out" + n + " = raw" + n + ";\n";
     }
-    // The layer's normalised values and the texture's, which the equations' calls fill in.
-    reads += "float src[5];\nfloat tex[5];\n";
+    // The texture's values, which the equations' calls fill in.
     for (int c = 0; c < channels; ++c) {
         const std::string n = std::to_string(c);
-        reads += "src[" + n + "] = ch" + n + ";\ntex[" + n + "] = ch" + n + ";\n";
+        reads += "float tex" + n + " = ch" + n + ";\n";
     }
     std::uint32_t written = 0;
 
@@ -578,8 +585,8 @@ std::string BuildSampleText(const Config& config, const ProceduralTextureState& 
             functions +=
                 "static " + type + " Process" + number + "(" + parameters + ")\n{\n" + fragment + "}\n";
         else
-            functions += "inline " + type + " ProceduralProcess" + number + "(" + parameters + ")\n{\n" +
-                         fragment + "}\n";
+            functions += "__attribute__((always_inline)) inline " + type + " ProceduralProcess" + number +
+                         "(" + parameters + ")\n{\n" + fragment + "}\n";
         std::string stores;
         int k = 0;
         for (int c = 0; c < channels; ++c) {
@@ -588,7 +595,7 @@ std::string BuildSampleText(const Config& config, const ProceduralTextureState& 
             const std::string value = components < 2   ? std::string("res")
                                       : k < components ? "res.v[" + std::to_string(k) + "]"
                                                        : std::string("0.0f");
-            stores += "tex[" + n + "]=" + value + ";";
+            stores += "tex" + n + "=" + value + ";";
             written |= 1u << c;
             ++k;
         }
@@ -596,22 +603,36 @@ std::string BuildSampleText(const Config& config, const ProceduralTextureState& 
                  "(" + arguments + "); " + stores + "}\n";
     }
 
-    // Blended by the mode (Normal keeps the texture's values), then mixed with the layer by the opacity.
-    std::string blend = "const uint stored = blend_mode == 0 ? " + std::to_string(written) +
-                        "u : ProceduralBlend(blend_mode," + std::to_string(int(config.GetColourFormat())) +
-                        "," + std::to_string(written) + "u," + (access->stored ? "1" : "0") + ",src,tex);\n";
+    // Blended by the mode, then mixed with the layer by the opacity. Normal has a text of its own that pays
+    // nothing for the other modes, which share one text that reads the mode from the block (so that changing
+    // the mode builds no new kernel).
+    std::string blend;
+    std::string value = "tex", stored = std::to_string(written);
+    if (blended && written) {
+        std::string src = "const float src[5] = {", tex = "float tex[5] = {";
+        for (int c = 0; c < channels; ++c) {
+            const std::string n = std::to_string(c);
+            src += (c ? ",ch" : "ch") + n;
+            tex += (c ? ",tex" : "tex") + n;
+        }
+        blend = src + "};\n" + tex + "};\nconst uint stored = ProceduralBlend((int)sampler_params[" +
+                std::to_string(ProceduralTextureMath::BlendIndex) + "]," +
+                std::to_string(int(config.GetColourFormat())) + "," + std::to_string(written) + "u," +
+                (access->stored ? "1" : "0") + ",src,tex);\n";
+        value = "tex[";
+        stored = "stored";
+    }
     for (int c = 0; c < channels; ++c) {
         const std::string n = std::to_string(c);
+        const std::string texture = value == "tex" ? "tex" + n : "tex[" + n + "]";
+        const std::string condition = "if ((" + stored + ") & " + std::to_string(1u << c) + "u) ";
         if (access->stored)
-            blend += "if (stored & " + std::to_string(1u << c) + "u) out" + n +
-                     "=ProceduralIntegerChannel(tex[" + n + "],raw" + n + "," + access->maximum +
-                     ",opacity);\n";
+            blend += condition + "out" + n + "=ProceduralIntegerChannel(" + texture + ",raw" + n + "," +
+                     access->maximum + ",opacity);\n";
         else
-            blend += "if (stored & " + std::to_string(1u << c) + "u) out" + n +
-                     "=ProceduralFloatChannel(tex[" + n + "],raw" + n + ",opacity," +
+            blend += condition + "out" + n + "=ProceduralFloatChannel(" + texture + ",raw" + n + ",opacity," +
                      (c == channels - 1 ? "1" : "0") + ");\n";
     }
-    if (!written) blend = "(void)src;\n(void)blend_mode;\n";
 
     std::string writes;
     for (int c = 0; c < channels; ++c) {
@@ -620,9 +641,9 @@ std::string BuildSampleText(const Config& config, const ProceduralTextureState& 
                   (access->stored ? std::string("(") + access->stored + ")out" + n : "out" + n) + ";\n";
     }
 
-    std::string body = Raster::FormatKernelText(
-        SampleBody, {declarations, reads, calls, writes, std::to_string(ProceduralTextureMath::OpacityIndex),
-                     std::to_string(ProceduralTextureMath::BlendIndex), blend});
+    std::string body =
+        Raster::FormatKernelText(SampleBody, {declarations, reads, calls, writes,
+                                              std::to_string(ProceduralTextureMath::OpacityIndex), blend});
     const char* blendMath = Raster::GetBlendModeMathText(language);
     if (!blendMath) return {};
     std::string text =
@@ -634,13 +655,16 @@ std::string BuildSampleText(const Config& config, const ProceduralTextureState& 
     } else {
         text += functions;
     }
+    // Inlined whole into the per-pixel loop: a call left in it keeps an OpenCL compiler for processors from
+    // running the work items as one straight loop.
+    if (!cpp) text += "__attribute__((always_inline)) ";
     return text + MakeStage(StageSignature::Sample, body);
 }
 
 struct TextCache {
     Kernel::CriticalSectionSpin lock;
     // Each entry keeps its config alive, so that no other config can take its address.
-    std::map<std::tuple<const Config*, int, int>, std::pair<Config::Handle, std::string>> texts;
+    std::map<std::tuple<const Config*, int, int, bool>, std::pair<Config::Handle, std::string>> texts;
 };
 
 TextCache& GetTextCache() {
@@ -652,16 +676,18 @@ TextCache& GetTextCache() {
 
 const char* ProceduralTextureCommand::GetSampleText(const Config::Handle& config, const State& state,
                                                     Raster::PixelFormat format,
-                                                    HardwareKernelLanguage language) {
-    if (!config) return nullptr;
+                                                    HardwareKernelLanguage language,
+                                                    BlendModeType blendMode) {
+    if (!config || blendMode < 0 || blendMode >= BlendModeCount) return nullptr;
     TextCache& cache = GetTextCache();
     std::lock_guard lock(cache.lock);
-    const auto key = std::make_tuple(config.Get(), int(format), int(language));
+    const bool blended = blendMode != 0;
+    const auto key = std::make_tuple(config.Get(), int(format), int(language), blended);
     auto found = cache.texts.find(key);
     if (found == cache.texts.end()) {
         std::string text;
         try {
-            text = BuildSampleText(*config, state, format, language);
+            text = BuildSampleText(*config, state, format, language, blended);
         } catch (const std::bad_alloc&) {
             text.clear(); // remembered as a failure: the processor renders
         }
@@ -836,7 +862,8 @@ std::optional<Raster::HardwareKernelDescriptor> ProceduralTextureCommand::Descri
     const auto language = Raster::GetKernelLanguage(device);
     auto descriptor = DescribeKernel<Stages>(language, GetKernelShape<Stages>(target));
     if (!descriptor || !state) return descriptor;
-    const char* text = GetSampleText(m_Config, *state, target.source.pixels->GetFormat(), language);
+    const char* text =
+        GetSampleText(m_Config, *state, target.source.pixels->GetFormat(), language, m_BlendMode);
     if (!text) return std::nullopt;
     (*descriptor)[Raster::HardwareKernelFragment::Sample] = text;
     return descriptor;

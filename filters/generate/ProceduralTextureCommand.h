@@ -54,10 +54,11 @@ public:
     static bool Init(Raster::PixelFormat format, Kernel::PointT<double> documentSize, double pixelsPerInch,
                      Kernel::PointT<double> origin, const Config::Handle& config,
                      const Kernel::Counted<const ExpressionConstantValues>& values, State& state);
-    // The Sample stage text of a config for a source format and language, cached per config for the process;
-    // null when the device cannot express an equation (the processor then renders).
+    // The Sample stage text of a config for a source format, language and blend mode, cached per config for
+    // the process; null when the device cannot express an equation (the processor then renders).
     static const char* GetSampleText(const Config::Handle& config, const State& state,
-                                     Raster::PixelFormat format, HardwareKernelLanguage language);
+                                     Raster::PixelFormat format, HardwareKernelLanguage language,
+                                     BlendModeType blendMode = 0);
     // The short form of an equation, "rgb=EXPR": the channels it writes (single-letter names run together,
     // otherwise separated by commas, in any case), '=', then its text. Nothing for an unknown channel or no
     // '='.

@@ -38,7 +38,7 @@
     /* layer holds it). Alpha is replaced, never blended; the single channel of a mask is blended as a    */ \
     /* grey. CMYK blends the inks' complements (multiply darkens), and black follows the luminosity      */  \
     /* modes; Lab's separable modes blend lightness and keep the layer's a and b. Returns the channels to */ \
-    /* store: a non-separable mode changes every colour channel. */                                                                                                          \
+    /* store: a non-separable mode changes every colour channel. */                                          \
     inline uint ProceduralBlend(int mode, int colourFormat, uint written, int bounded, const float* s,       \
                                 float* t) {                                                                  \
         const int colours = colourFormat == 1 ? 4 : colourFormat >= 3 ? 1 : 3;                               \

@@ -448,17 +448,20 @@ TEST(ProceduralTextureKernelText, CachedPerConfigAndCompiledForLanguageZero) {
         SCOPED_TRACE(Raster::GetPixelFormatName(c.format));
         ASSERT_TRUE(
             ProceduralTextureCommand::Init(c.format, {8, 4}, 72, {}, c.config, AgreementValues(), state));
-        const char* text = ProceduralTextureCommand::GetSampleText(c.config, state, c.format,
-                                                                   Raster::HardwareKernelLanguage::CudaCpp);
-        ASSERT_NE(text, nullptr);
-        auto descriptor = DescribeKernel<ProceduralTextureStages::Plain<PixelFormat::RGBA8>>(
-            Raster::HardwareKernelLanguage::CudaCpp, {c.format, c.format, std::nullopt, false});
-        ASSERT_TRUE(descriptor);
-        (*descriptor)[Raster::HardwareKernelFragment::Sample] = text;
-        const auto ptx = Raster::CompileToPtx(
-            Raster::AssembleKernelSource(*descriptor, Raster::HardwareKernelLanguage::CudaCpp),
-            descriptor->entryPoint);
-        EXPECT_TRUE(ptx.ptx) << ptx.log;
+        // Normal's text and the one the other blend modes share.
+        for (const int mode : {0, 12}) {
+            const char* text = ProceduralTextureCommand::GetSampleText(
+                c.config, state, c.format, Raster::HardwareKernelLanguage::CudaCpp, mode);
+            ASSERT_NE(text, nullptr);
+            auto descriptor = DescribeKernel<ProceduralTextureStages::Plain<PixelFormat::RGBA8>>(
+                Raster::HardwareKernelLanguage::CudaCpp, {c.format, c.format, std::nullopt, false});
+            ASSERT_TRUE(descriptor);
+            (*descriptor)[Raster::HardwareKernelFragment::Sample] = text;
+            const auto ptx = Raster::CompileToPtx(
+                Raster::AssembleKernelSource(*descriptor, Raster::HardwareKernelLanguage::CudaCpp),
+                descriptor->entryPoint);
+            EXPECT_TRUE(ptx.ptx) << ptx.log;
+        }
     }
 }
 
