@@ -118,28 +118,34 @@ struct ProceduralTextureSampler {
         if (!written) return;
         const float opacity = params.block[ProceduralTextureMath::OpacityIndex];
         const int mode = int(params.block[ProceduralTextureMath::BlendIndex]);
-        const int colourFormat = int(params.evaluator->GetColourFormat());
+        // The blend, in place in result: the channels it gives are the same for every pixel of the span.
+        unsigned stored = written;
+        if (mode != 0) {
+            const int colourFormat = int(params.evaluator->GetColourFormat());
+            for (int i = 0; i < n; ++i) {
+                // Sized for any format, so that the blend's channel indexing stays in bounds for every one.
+                float layer[MaxChannels] = {}, texture[MaxChannels] = {};
+                for (int c = 0; c < Channels; ++c) {
+                    layer[c] = source[c][i];
+                    texture[c] = (written & (1u << c)) ? result[c][i] : layer[c];
+                }
+                stored = ProceduralTextureMath::ProceduralBlend(mode, colourFormat, written,
+                                                                !Raster::IsFloatFormat(F), layer, texture);
+                for (int c = 0; c < Channels; ++c)
+                    result[c][i] = texture[c];
+            }
+        }
         for (int i = 0; i < n; ++i) {
             Component components[Channels];
             std::memcpy(components, &out[i], sizeof components);
-            // Sized for any format, so that the blend's channel indexing stays in bounds for every one.
-            float layer[MaxChannels] = {}, texture[MaxChannels] = {};
-            for (int c = 0; c < Channels; ++c) {
-                layer[c] = source[c][i];
-                texture[c] = (written & (1u << c)) ? result[c][i] : layer[c];
-            }
-            const unsigned stored =
-                mode == 0 ? written
-                          : ProceduralTextureMath::ProceduralBlend(mode, colourFormat, written,
-                                                                   !Raster::IsFloatFormat(F), layer, texture);
             for (int c = 0; c < Channels; ++c) {
                 if (!(stored & (1u << c))) continue;
                 if constexpr (Raster::IsFloatFormat(F))
-                    components[c] = ProceduralTextureMath::ProceduralFloatChannel(texture[c], raw[c][i],
+                    components[c] = ProceduralTextureMath::ProceduralFloatChannel(result[c][i], raw[c][i],
                                                                                   opacity, c == Channels - 1);
                 else
                     components[c] = Component(ProceduralTextureMath::ProceduralIntegerChannel(
-                        texture[c], raw[c][i], Maximum, opacity));
+                        result[c][i], raw[c][i], Maximum, opacity));
             }
             std::memcpy(&out[i], components, sizeof components);
         }
