@@ -5,17 +5,11 @@
 //   procedural_texture_bench [--benchmark_filter=...]
 //
 // Every render is the whole image through RenderImage in 256-pixel tiles; device renders include copying the
-// source to the device and the result back. The device's kernel is built once per texture and kept for the
-// process, as a live layer's is: the first device render, which waits for the build, is made before timing
-// and reported on its own ("first_s"). PoCL's thread count is its own: POCL_CPU_MAX_CU_NUM=1 (or
-// POCL_MAX_PTHREAD_COUNT=1) gives it one thread.
+// source to the device and the result back.
 
 #include "bench/BenchSupport.h"
 #include "filters/generate/ProceduralTextureCommand.h"
 
-#include "host/raster/device/Hardware.h"
-
-#include <chrono>
 #include <string>
 
 namespace {
@@ -43,32 +37,7 @@ void Register() {
     static const auto three = Make(ThreeChannels, 7);
     const Bench::NamedCommand commands[] = {{"texture/1-channel", one.Get()},
                                             {"texture/3-channel", three.Get()}};
-    for (const auto& [name, command] : commands)
-        for (const auto& [path, label] : Bench::Paths)
-            benchmark::RegisterBenchmark(
-                (std::string(name) + "/RGBA8/" + label).c_str(),
-                [command, path](benchmark::State& state) {
-                    const auto source = Bench::MakeImage(Side, PixelFormat::RGBA8);
-                    const Bench::RenderSetup setup = Bench::SetupFor(path);
-                    if (setup.opencl) {
-                        const auto device = Raster::Hardware::GetDevice("opencl");
-                        if (!device) {
-                            state.SkipWithError("no OpenCL device");
-                            return;
-                        }
-                        auto destination = Raster::DynamicBuffer::Create(Side, Side, PixelFormat::RGBA8);
-                        RasterTools::RenderJobOptions options;
-                        options.tileSize = setup.tileSize;
-                        options.device = device;
-                        const auto start = std::chrono::steady_clock::now();
-                        RasterTools::RenderImage(*command, source, destination, nullptr, options);
-                        state.counters["first_s"] =
-                            std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
-                    }
-                    Bench::RenderWhole(state, *command, source, PixelFormat::RGBA8, setup);
-                })
-                ->Unit(benchmark::kMillisecond)
-                ->UseRealTime();
+    Bench::RegisterRGBA8Renders(Side, commands);
 }
 
 } // namespace
