@@ -215,17 +215,15 @@ ApplyPlan Plan(const std::vector<std::string>& args, bool printHelp) {
         all.files.autoOrient = all.files.autoOrient || flags.files.autoOrient;
         plan.inputs.insert(plan.inputs.end(), flags.positional.begin(), flags.positional.end());
     }
-    Once(all.render.device, "--device");
-    Once(all.render.tile, "--tile");
-    Once(all.render.threads, "--threads");
     Once(all.mask, "--mask");
     Once(all.channels, "--channels");
     Once(all.output, "--output");
     plan.checked.command = plan.checked.chain.front();
     plan.checked.loadFormat = loadFormat ? int(*loadFormat) : -1;
-    if (all.render.tile.Given()) plan.checked.tileSize = ParseTileSize(all.render.tile.Value());
-    if (all.render.threads.Given()) plan.checked.threads = ParseThreadCount(all.render.threads.Value());
-    if (all.render.device.Given()) plan.device = all.render.device.Value();
+    const RenderSettings render = CheckRenderFlags(all.render);
+    plan.checked.tileSize = render.tileSize;
+    plan.checked.threads = render.threads;
+    plan.device = render.device;
     if (all.mask.Given()) plan.mask = all.mask.Value();
     if (all.channels.Given()) plan.channels = all.channels.Value();
     plan.files = CheckFileFlags(all.files);

@@ -165,6 +165,17 @@ void AddRenderFlags(CLI::App& app, RenderFlags& flags) {
         ->type_name("N");
 }
 
+RenderSettings CheckRenderFlags(const RenderFlags& flags) {
+    Once(flags.device, "--device");
+    Once(flags.tile, "--tile");
+    Once(flags.threads, "--threads");
+    RenderSettings settings;
+    if (flags.device.Given()) settings.device = flags.device.Value();
+    if (flags.tile.Given()) settings.tileSize = ParseTileSize(flags.tile.Value());
+    if (flags.threads.Given()) settings.threads = ParseThreadCount(flags.threads.Value());
+    return settings;
+}
+
 void AddWriteFlags(CLI::App& app, FileFlags& flags) {
     AddText(app, "--quality", flags.quality, "JPEG, WebP and AVIF quality, 1 to 100 (default 92)")
         ->type_name("N");
@@ -233,7 +244,7 @@ std::unique_ptr<CLI::App> MakeDocApp(const std::string& subcommand, DocFlags& fl
             "of rastertools apply FILTER --help.");
         app->add_option("DOC FILTER", flags.positional, "the document and the filter")->type_name("");
         app->add_flag("--live", flags.live, "adds a live filter layer instead of changing pixels");
-        AddText(*app, "--device", flags.render.device, "as for apply")->type_name("DEVICE");
+        AddRenderFlags(*app, flags.render);
     } else if (subcommand == "render") {
         app->description("Flattens the document into an image file.");
         app->add_option("DOC OUTPUT", flags.positional, "the document and the image to write")->type_name("");

@@ -31,6 +31,13 @@ struct RenderFlags {
     TextOption device, tile, threads;
 };
 void AddRenderFlags(CLI::App& app, RenderFlags& flags);
+// The rendering options as given, checked: each at most once, the tile side and threads within their bounds.
+struct RenderSettings {
+    std::string device; // empty: not given
+    int tileSize = 0;   // 0: chosen for the filter and image
+    int threads = 0;    // 0: every core
+};
+RenderSettings CheckRenderFlags(const RenderFlags& flags);
 
 // Output and input flags wired to the image reader and writer.
 struct FileFlags {

@@ -33,7 +33,8 @@ namespace {
 
 constexpr std::string_view kDocUsage =
     "usage: rastertools doc new IMAGE -o DOC [--format F] [--force]\n"
-    "       rastertools doc filter DOC FILTER [--PARAM VALUE]... [--live] [--device D]\n"
+    "       rastertools doc filter DOC FILTER [--PARAM VALUE]... [--live] [--device D] [--tile N] "
+    "[--threads N]\n"
     "       rastertools doc render DOC OUTPUT [--format F] [--device D] [--tile N] [--threads N]\n"
     "       rastertools doc show DOC\n"
     "       rastertools doc undo DOC | doc redo DOC\n"
@@ -46,6 +47,7 @@ struct DocArguments {
     DocFlags flags;
     const RasterTools::FilterInfo* filter = nullptr;
     std::vector<std::pair<std::string, std::string>> parameters; // the filter's, as typed
+    RenderSettings render;
     bool help = false;
 };
 
@@ -113,9 +115,7 @@ DocArguments ParseDoc(const std::string& subcommand, std::vector<std::string> wo
         }
     if (arguments.flags.live && subcommand != "filter") throw UsageError("--live belongs to doc filter");
     if (arguments.flags.force && subcommand != "new") throw UsageError("--force belongs to doc new");
-    Once(arguments.flags.render.device, "--device");
-    Once(arguments.flags.render.tile, "--tile");
-    Once(arguments.flags.render.threads, "--threads");
+    arguments.render = CheckRenderFlags(arguments.flags.render);
     Once(arguments.flags.output, "-o");
     Once(arguments.flags.format, "--format");
     if (arguments.filter) arguments.parameters = FilterParameterTexts(*arguments.filter, values);
@@ -171,11 +171,11 @@ std::string DescribeSize(const Raster::DynamicBuffer& image) {
 
 // The device for live filters and pixel commands, which pick theirs from the process's selection: --device
 // overrides it. A device that is not there is refused before any work.
-RenderDevice UseDevice(const TextOption& option) {
-    const DeviceSelection selection = ResolveDeviceSelector(option.Given() ? option.Value() : std::string());
+RenderDevice UseDevice(const std::string& option) {
+    const DeviceSelection selection = ResolveDeviceSelector(option);
     const RenderDevice device = FindRenderDevice(selection);
     if (!device.IsValid()) throw UsageError(device.error);
-    if (option.Given()) ::setenv(Raster::Hardware::SelectorVariable, selection.selector.c_str(), 1);
+    if (!option.empty()) ::setenv(Raster::Hardware::SelectorVariable, selection.selector.c_str(), 1);
     return device;
 }
 
@@ -236,12 +236,18 @@ int RunNew(const DocArguments& arguments) {
 
 int RunFilter(const DocArguments& arguments) {
     if (arguments.flags.positional.size() != 2 || !arguments.filter)
-        throw UsageError("usage: rastertools doc filter DOC FILTER [--PARAM VALUE]... [--live] [--device D]");
+        throw UsageError("usage: rastertools doc filter DOC FILTER [--PARAM VALUE]... [--live] [--device D] "
+                         "[--tile N] [--threads N]");
+    // A live filter renders when the document does; its tiles and threads are doc render's to choose.
+    if (arguments.flags.live && (arguments.render.tileSize || arguments.flags.render.threads.Given()))
+        throw UsageError(std::string(arguments.render.tileSize ? "--tile" : "--threads") +
+                         " sets how pixels are changed now; a live filter layer is rendered by doc render, "
+                         "which takes it");
     const std::string& path = arguments.flags.positional[0];
     const RasterTools::FilterInfo& filter = *arguments.filter;
     const auto command = MakeFilterCommand(filter, arguments.flags.live, arguments.parameters);
     if (!command) throw Error(std::string(filter.name) + ": the command could not be made");
-    UseDevice(arguments.flags.render.device);
+    UseDevice(arguments.render.device);
     const Kernel::FileLock lock = LockDocument(path);
     auto document = LoadDocument(path);
 
@@ -269,6 +275,8 @@ int RunFilter(const DocArguments& arguments) {
     PixelEffectOptions options;
     // The bar covers the filter (nine tenths) and saving the document.
     options.progress = [&progress](double fraction) { progress.Update(0.9 * fraction); };
+    options.tileSize = arguments.render.tileSize;
+    options.threads = arguments.render.threads;
     const std::size_t droppedBefore = document->GetDroppedHistoryCount();
     const auto error = ApplyPixelCommand(*document, command, options);
     if (error) throw Error(path + ": " + *error);
@@ -302,9 +310,9 @@ int RunRender(const DocArguments& arguments) {
     const auto* type = &outputType;
     FlattenOptions flatten;
     if (flags.format.Given()) flatten.format = ParseLayerFormat(flags.format.Value());
-    if (flags.render.tile.Given()) flatten.tileSize = ParseTileSize(flags.render.tile.Value());
-    if (flags.render.threads.Given()) flatten.threads = ParseThreadCount(flags.render.threads.Value());
-    const RenderDevice device = UseDevice(flags.render.device);
+    if (arguments.render.tileSize) flatten.tileSize = arguments.render.tileSize;
+    flatten.threads = arguments.render.threads;
+    const RenderDevice device = UseDevice(arguments.render.device);
 
     const auto document = LoadDocument(path);
     if (!flatten.format) {

@@ -122,6 +122,8 @@ Kernel::RectT<int> PipelineCommand::RenderDirectly(const MutableRasterInterface&
     RenderJobOptions options;
     options.area = area;
     options.abort = raster.GetAbort();
+    if (raster.GetTileSize() > 0) options.tileSize = raster.GetTileSize();
+    options.threads = raster.GetThreads();
     options.progress = [&raster](double fraction) { raster.Progress(fraction); };
     const RenderJobResult result = RenderImage(*this, source, pixels, nullptr, options);
     return result.complete ? area : Kernel::RectT<int>{};

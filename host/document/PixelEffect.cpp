@@ -28,6 +28,8 @@ public:
     const SelectionRasterNode* GetSelection() const override { return m_Selection; }
     std::uint64_t GetLayerId() const override { return m_LayerId; }
     const bool* GetAbort() const override { return m_Options.abort; }
+    int GetTileSize() const override { return m_Options.tileSize; }
+    int GetThreads() const override { return m_Options.threads; }
     void Progress(double fraction) const override {
         if (m_Options.progress) m_Options.progress(m_First + m_Share * std::clamp(fraction, 0.0, 1.0));
     }

@@ -12,6 +12,8 @@ struct PixelEffectOptions {
     const bool* abort = nullptr; // host-owned, only read
     // A rising fraction of the work over every target layer, one call at a time.
     std::function<void(double fraction)> progress;
+    int tileSize = 0; // the renderer's tile side; 0: its own choice
+    int threads = 0;  // worker threads; 0: every core
 };
 
 // The layers a pixel command changes: the selected raster layers, else the top raster layer.

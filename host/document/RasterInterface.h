@@ -42,6 +42,10 @@ public:
     virtual std::uint64_t GetLayerId() const { return 0; }
     // Host-owned abort flag (may be null), only read.
     virtual const bool* GetAbort() const { return nullptr; }
+    // How a command that renders in tiles splits the work: the tile side (0: its own choice) and the worker
+    // threads (0: every core). The pixels must not depend on either.
+    virtual int GetTileSize() const { return 0; }
+    virtual int GetThreads() const { return 0; }
     // Receives the fraction of the work done, from any thread, one call at a time.
     virtual void Progress(double fraction) const { (void)fraction; }
 };

@@ -376,3 +376,51 @@ TEST_F(DocCommand, AnInterruptedWriteLeavesNoTemporaryFile) {
     }
     EXPECT_TRUE(caught) << "every write finished before it could be interrupted";
 }
+
+// doc filter takes apply's rendering options: a filter that reads around each pixel changes a layer into the
+// same pixels whatever the tiles and threads, the pixels apply gives; bad values are refused before the
+// document is touched.
+TEST_F(DocCommand, FilterRendersTheSamePixelsInEveryTiling) {
+    auto image = Raster::DynamicBuffer::Create(75, 50, Raster::PixelFormat::RGBA8);
+    std::uint32_t state = 12345;
+    for (int y = 0; y < 50; ++y)
+        for (int x = 0; x < 4 * 75; ++x) {
+            state = state * 1664525u + 1013904223u;
+            image->Row<std::uint8_t>(y)[x] = std::uint8_t(x % 4 == 3 ? 255 : state >> 24);
+        }
+    ASSERT_TRUE(IO::WriteImage(m_Folder / "big.png", *image));
+    const std::string filter = "motionblur --radius 6 --angle 30";
+    ASSERT_EQ(Run("apply " + filter + " big.png applied.png --device cpu").exitCode, 0);
+    ASSERT_NE(Pixels(m_Folder / "applied.png"), Pixels(m_Folder / "big.png"));
+    for (const std::string options : {"", "--tile 16 --threads 1", "--tile 16 --threads 3",
+                                      "--tile=32 --threads=2", "--threads 0 --tile 48"}) {
+        ASSERT_EQ(Run("doc new big.png -o d.rtd").exitCode, 0);
+        const Result result = Run("doc filter d.rtd " + filter + " " + options);
+        ASSERT_EQ(result.exitCode, 0) << options << "\n" << result.output;
+        ASSERT_EQ(Run("doc render d.rtd out.png --device cpu").exitCode, 0);
+        EXPECT_EQ(Pixels(m_Folder / "out.png"), Pixels(m_Folder / "applied.png")) << options;
+    }
+
+    const std::string saved = ReadBytes(m_Folder / "d.rtd");
+    const std::pair<std::string, std::string> refused[] = {
+        {"--tile 8", "--tile needs a whole number from 16 to 65536, not \"8\""},
+        {"--tile big", "--tile needs a whole number from 16 to 65536, not \"big\""},
+        {"--threads -1", "--threads needs a whole number from 0 to 256, not \"-1\""},
+        {"--threads 2 --threads 3", "--threads is given more than once"},
+        {"--tile", "\"--tile\" needs a value"},
+        {"--device nonesuch", "nonesuch"},
+        {"--live --tile 16", "--tile sets how pixels are changed now; a live filter layer is rendered by doc "
+                             "render"},
+    };
+    for (const auto& [options, message] : refused) {
+        const Result result = Run("doc filter d.rtd " + filter + " " + options);
+        EXPECT_EQ(result.exitCode, 2) << options << "\n" << result.output;
+        EXPECT_TRUE(Contains(result.output, message))
+            << options << "\nexpected: " << message << "\ngot: " << result.output;
+        EXPECT_EQ(ReadBytes(m_Folder / "d.rtd"), saved) << options;
+    }
+    const Result help = Run("doc filter --help");
+    EXPECT_TRUE(Contains(help.output, "--tile") && Contains(help.output, "--threads") &&
+                Contains(help.output, "--device"))
+        << help.output;
+}
