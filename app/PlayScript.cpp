@@ -284,8 +284,8 @@ private:
     void Render(const std::string& output) {
         const auto type = IO::GetFileTypeForExtension(output);
         if (!type)
-            throw ScriptError(EscapeBytes(output) +
-                              ": unknown file type (use .png, .jpg, .jpeg, .tif or .tiff)");
+            throw ScriptError(EscapeBytes(output) + ": unknown file type (use " +
+                              IO::DescribeFileExtensions() + ")");
         const auto& document = *m_Controller->GetDocument();
         FlattenOptions options;
         for (const auto& node : document.GetLayers())
@@ -298,7 +298,10 @@ private:
         for (const auto& warning : result.warnings)
             m_Out << "  warning: " << warning << '\n';
         if (!result.image) throw ScriptError("cannot render: " + result.error);
-        if (const IO::WriteResult written = IO::WriteImage(output, *result.image); !written)
+        // The picture keeps the profile and metadata of the image the document was made from.
+        IO::WriteOptions write;
+        write.metadata = GetFlattenedMetadata(document, result.image->GetFormat());
+        if (const IO::WriteResult written = IO::WriteImage(output, *result.image, write); !written)
             throw ScriptError(written.error);
         m_Out << "  rendered " << output << " (" << result.image->GetWidth() << "x"
               << result.image->GetHeight() << " " << Raster::GetPixelFormatName(result.image->GetFormat())

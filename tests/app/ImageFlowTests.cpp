@@ -126,3 +126,27 @@ TEST_F(ImageFlow, LabFromATaggedPictureUsesItsProfile) {
     const auto srgb = Raster::ICCManager::ConvertImage(*Picture(), {}, PixelFormat::LabA16, {}, why);
     EXPECT_NE(std::memcmp(srgb->RowBytes(0), expected->RowBytes(0), 6 * 8), 0);
 }
+
+// A play script that loads a document renders pictures that carry what the document's picture carried.
+TEST_F(ImageFlow, PlayRendersKeepTheDocumentsProfileAndMetadata) {
+    const Result made = Run("doc new portrait.png -o photo.rtd");
+    ASSERT_EQ(made.exitCode, 0) << made.output;
+    Write("render.play", "load photo.rtd\nadd-live copy\nrender played.png\nrender played.jpg\n");
+    const Result played = Run("play render.play");
+    ASSERT_EQ(played.exitCode, 0) << played.output;
+    for (const char* output : {"played.png", "played.jpg"}) {
+        SCOPED_TRACE(output);
+        const IO::ReadResult read = IO::ReadImage(m_Folder / output);
+        ASSERT_TRUE(read) << read.error;
+        EXPECT_EQ(read.metadata.iccProfile, ProPhoto());
+        EXPECT_EQ(Tag(read.metadata, "Exif.Image.Make"), "Testmaker");
+        EXPECT_EQ(Tag(read.metadata, "Exif.Image.Copyright"), "(c) 2026 Ada");
+        EXPECT_EQ(Tag(read.metadata, "Exif.Image.Orientation"), "6");
+    }
+    // A script's own document was made from no picture: its renders carry nothing.
+    Write("fresh.play", "render fresh.png\n");
+    ASSERT_EQ(Run("play fresh.play").exitCode, 0);
+    const IO::ReadResult fresh = IO::ReadImage(m_Folder / "fresh.png");
+    ASSERT_TRUE(fresh) << fresh.error;
+    EXPECT_TRUE(fresh.metadata.IsEmpty());
+}
