@@ -75,6 +75,12 @@ EncodeResult EncodeExr(const Raster::DynamicBuffer& image, std::string_view name
 void ReadMetadata(std::span<const std::byte> data, FileType type, Raster::ImageMetadata& metadata);
 std::optional<std::string> WriteMetadata(std::vector<std::byte>& bytes, FileType type,
                                          const Raster::ImageMetadata& metadata);
+// Whether type has a block of its own for IPTC (PNG, JPEG and TIFF do; WebP, HEIF and OpenEXR do not).
+bool HoldsIptc(FileType type);
+// The XMP packet of metadata with its IPTC datasets added as the XMP properties that stand for them (author,
+// copyright, captions, places), for types that cannot hold IPTC; a property the packet already has keeps its
+// own value. The packet as it was when there is no IPTC or either block cannot be read.
+std::string MirrorIptcIntoXmp(const Raster::ImageMetadata& metadata);
 // The EXIF Orientation in exif (1..8), or 1 when there is none or it is out of range.
 int GetExifOrientation(std::span<const std::byte> exif);
 // exif with its Orientation set to 1 (and nothing else changed in meaning); exif itself when it has none.

@@ -425,7 +425,16 @@ EncodeResult EncodeImage(const Raster::DynamicBuffer& image, FileType type, std:
         if (Detail::ProfileFits(options.metadata.iccProfile, format))
             request.icc = options.metadata.iccProfile;
         request.alpha = !Detail::IsOpaque(image);
-        request.metadata = &options.metadata;
+        // IPTC has no block in WebP and HEIF: its author, copyright and captions travel in the XMP instead.
+        Raster::ImageMetadata mirrored;
+        const Raster::ImageMetadata* metadata = &options.metadata;
+        if (!metadata->iptc.empty() && !Detail::HoldsIptc(type) && type != FileType::EXR) {
+            mirrored = options.metadata;
+            mirrored.xmp = Detail::MirrorIptcIntoXmp(options.metadata);
+            mirrored.iptc.clear();
+            metadata = &mirrored;
+        }
+        request.metadata = metadata;
         switch (type) {
         case FileType::PNG:
             result = Detail::EncodePng(image, name, request);
@@ -446,9 +455,8 @@ EncodeResult EncodeImage(const Raster::DynamicBuffer& image, FileType type, std:
             return Detail::EncodeExr(image, name, request);
         }
         if (!result) return result;
-        const Raster::ImageMetadata& metadata = options.metadata;
-        if (!metadata.exif.empty() || !metadata.xmp.empty() || !metadata.iptc.empty()) {
-            if (auto error = Detail::WriteMetadata(result.bytes, type, metadata)) {
+        if (!metadata->exif.empty() || !metadata->xmp.empty() || !metadata->iptc.empty()) {
+            if (auto error = Detail::WriteMetadata(result.bytes, type, *metadata)) {
                 result.bytes.clear();
                 result.error = Detail::Describe(name, *error);
             }

@@ -86,7 +86,9 @@ struct WriteOptions {
     // "zstd". Empty: "default" and "deflate". Other types have no choices and refuse a name.
     std::string compression;
     // Embedded where the type can hold it: the profile when it describes pixels of the written kind (RGB,
-    // grey or CMYK); EXIF, XMP and IPTC in PNG, JPEG, TIFF, WebP, AVIF and HEIC (IPTC not in the last three).
+    // grey or CMYK); EXIF, XMP and IPTC in PNG, JPEG, TIFF, WebP, AVIF and HEIC. The last three have no IPTC
+    // block: its datasets are written as the XMP properties that stand for them (dc:creator, dc:rights, ...),
+    // where the XMP does not already have them.
     Raster::ImageMetadata metadata;
 };
 

@@ -24,10 +24,6 @@ void InitialiseExiv2() {
     });
 }
 
-bool HoldsIptc(FileType type) {
-    return type == FileType::PNG || type == FileType::JPEG || type == FileType::TIFF;
-}
-
 std::vector<std::byte> EncodeExif(const Exiv2::ExifData& exif, Exiv2::ByteOrder order) {
     Exiv2::Blob blob;
     Exiv2::ExifParser::encode(blob, order == Exiv2::invalidByteOrder ? Exiv2::littleEndian : order, exif);
@@ -75,6 +71,39 @@ bool IsStorageTag(const std::string& key) {
 }
 
 } // namespace
+
+bool HoldsIptc(FileType type) {
+    return type == FileType::PNG || type == FileType::JPEG || type == FileType::TIFF;
+}
+
+std::string MirrorIptcIntoXmp(const Raster::ImageMetadata& metadata) {
+    if (metadata.iptc.empty()) return metadata.xmp;
+    InitialiseExiv2();
+    try {
+        Exiv2::IptcData iptc;
+        if (Exiv2::IptcParser::decode(iptc, reinterpret_cast<const Exiv2::byte*>(metadata.iptc.data()),
+                                      std::uint32_t(metadata.iptc.size())) != 0)
+            return metadata.xmp;
+        Exiv2::XmpData mirrored;
+        Exiv2::copyIptcToXmp(iptc, mirrored);
+        Exiv2::XmpData xmp;
+        // A packet that cannot be read is kept as it stands rather than replaced.
+        if (!metadata.xmp.empty() && Exiv2::XmpParser::decode(xmp, metadata.xmp) != 0) return metadata.xmp;
+        bool added = false;
+        for (const auto& datum : mirrored)
+            if (xmp.findKey(Exiv2::XmpKey(datum.key())) == xmp.end()) {
+                xmp.add(datum);
+                added = true;
+            }
+        std::string packet;
+        if (!added || Exiv2::XmpParser::encode(packet, xmp) != 0) return metadata.xmp;
+        return packet;
+    } catch (const std::bad_alloc&) {
+        throw;
+    } catch (...) {
+        return metadata.xmp;
+    }
+}
 
 void ReadMetadata(std::span<const std::byte> data, FileType type, Raster::ImageMetadata& metadata) {
     InitialiseExiv2();

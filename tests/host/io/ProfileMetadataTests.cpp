@@ -220,6 +220,70 @@ TEST(Metadata, SurvivesARoundTripThroughEveryTypeThatHoldsIt) {
     }
 }
 
+// WebP and HEIF have no IPTC block: the author, copyright and place a photographer set in IPTC come back as
+// the XMP properties that stand for them, from the project's reader and from libexiv2's, while a property the
+// XMP already had keeps its value; types with an IPTC block keep the XMP as it was.
+TEST(Metadata, IptcIsKeptAsXmpWhereTheTypeHasNoIptcBlock) {
+    Exiv2::XmpParser::initialize();
+    Exiv2::enableBMFF(true);
+    Exiv2::IptcData iptc;
+    iptc["Iptc.Application2.Byline"] = "Ada Photographer";
+    iptc["Iptc.Application2.Copyright"] = "(c) 2026 Ada";
+    iptc["Iptc.Application2.City"] = "Paris";
+    iptc["Iptc.Application2.Headline"] = "Spring";
+    const Exiv2::DataBuf encoded = Exiv2::IptcParser::encode(iptc);
+    Raster::ImageMetadata onlyIptc;
+    const auto* p = reinterpret_cast<const std::byte*>(encoded.pData_);
+    onlyIptc.iptc.assign(p, p + encoded.size_);
+    Raster::ImageMetadata both = onlyIptc;
+    Exiv2::XmpData xmp;
+    xmp["Xmp.photoshop.Headline"] = "Spring in Paris";
+    xmp["Xmp.xmp.Rating"] = "4";
+    ASSERT_EQ(Exiv2::XmpParser::encode(both.xmp, xmp), 0);
+
+    // 128 × 96: libexiv2 0.27 finds no metadata in a HEIC cropped from a larger coded picture (sides under
+    // 64).
+    for (const IO::FileType type : {IO::FileType::WebP, IO::FileType::AVIF, IO::FileType::HEIC}) {
+        for (const bool withXmp : {false, true}) {
+            SCOPED_TRACE(std::string(IO::GetFileTypeName(type)) + (withXmp ? " with XMP" : ""));
+            IO::WriteOptions options;
+            options.metadata = withXmp ? both : onlyIptc;
+            const IO::EncodeResult written =
+                IO::EncodeImage(*Ramps(PixelFormat::RGBA8, 128, 96), type, "m", options);
+            ASSERT_TRUE(written) << written.error;
+            const IO::ReadResult read = IO::DecodeImage(written.bytes, "m");
+            ASSERT_TRUE(read) << read.error;
+            EXPECT_EQ(XmpText(read.metadata.xmp, "Xmp.dc.creator"), "Ada Photographer");
+            EXPECT_EQ(XmpText(read.metadata.xmp, "Xmp.dc.rights"), "lang=\"x-default\" (c) 2026 Ada");
+            EXPECT_EQ(XmpText(read.metadata.xmp, "Xmp.photoshop.City"), "Paris");
+            EXPECT_EQ(XmpText(read.metadata.xmp, "Xmp.photoshop.Headline"),
+                      withXmp ? "Spring in Paris" : "Spring");
+            EXPECT_EQ(XmpText(read.metadata.xmp, "Xmp.xmp.Rating"), withXmp ? "4" : "(none)");
+
+            auto file = Exiv2::ImageFactory::open(reinterpret_cast<const Exiv2::byte*>(written.bytes.data()),
+                                                  long(written.bytes.size()));
+            ASSERT_TRUE(file.get());
+            file->readMetadata();
+            const auto creator = file->xmpData().findKey(Exiv2::XmpKey("Xmp.dc.creator"));
+            ASSERT_NE(creator, file->xmpData().end());
+            EXPECT_EQ(creator->toString(), "Ada Photographer");
+            const auto rights = file->xmpData().findKey(Exiv2::XmpKey("Xmp.dc.rights"));
+            ASSERT_NE(rights, file->xmpData().end());
+            EXPECT_EQ(rights->toString(), "lang=\"x-default\" (c) 2026 Ada");
+        }
+    }
+    // Where IPTC has its own block it is written there, and the XMP is left as it was.
+    IO::WriteOptions options;
+    options.metadata = both;
+    const IO::EncodeResult jpeg =
+        IO::EncodeImage(*Ramps(PixelFormat::RGBA8, 16, 12), IO::FileType::JPEG, "m", options);
+    ASSERT_TRUE(jpeg) << jpeg.error;
+    const IO::ReadResult read = IO::DecodeImage(jpeg.bytes, "m");
+    ASSERT_TRUE(read) << read.error;
+    EXPECT_EQ(IptcText(read.metadata.iptc, "Iptc.Application2.Byline"), "Ada Photographer");
+    EXPECT_EQ(XmpText(read.metadata.xmp, "Xmp.dc.creator"), "(none)");
+}
+
 TEST(Metadata, OpenExrHoldsNoneAndIsStillWritten) {
     IO::WriteOptions options;
     options.metadata = CameraMetadata(1);
