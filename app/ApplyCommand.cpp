@@ -1,6 +1,7 @@
 // rastertools apply FILTER [--PARAM VALUE]... INPUT OUTPUT: one filter on one image, through the pixel
 // pipeline on the chosen device or the processor.
 
+#include "app/ChainRender.h"
 #include "app/CommandLine.h"
 #include "app/FilterArguments.h"
 #include "app/ImageFiles.h"
@@ -322,14 +323,14 @@ FileReport ProcessFile(const ApplyPlan& plan, const RenderDevice& device, const 
                     std::string(Raster::GetPixelFormatName(format)) + " pixels (choose another --format or " +
                     std::string(Raster::GetPixelFormatName(IO::GetWritableFormat(outputType, format))) + ")");
 
-    Kernel::Counted<Raster::DynamicBuffer> current = source;
-    long deviceTiles = 0, processorTiles = 0;
-    const auto started = std::chrono::steady_clock::now();
+    std::vector<ChainLink> links;
     for (std::size_t i = 0; i < checked.chain.size(); ++i) {
         const auto& command = checked.chain[i];
-        const auto* pipeline = dynamic_cast<const RasterTools::PipelineCommand*>(command.Get());
         const auto& shape = shapes[i];
-        int channelMask = -1;
+        ChainLink link;
+        link.command = command.Get();
+        link.pipeline = dynamic_cast<const RasterTools::PipelineCommand*>(command.Get());
+        link.shape = shape;
         if (!plan.channels.empty()) {
             const auto mask = RasterTools::ParseChannelMask(shape.format, plan.channels);
             if (!mask)
@@ -337,39 +338,25 @@ FileReport ProcessFile(const ApplyPlan& plan, const RenderDevice& device, const 
                                  std::string(Raster::GetPixelFormatName(shape.format)) +
                                  " (a number, or channels named " +
                                  RasterTools::DescribeChannelNames(shape.format) + ")");
-            channelMask = *mask;
+            link.channelMask = *mask;
         }
-        // Channels the write mask keeps come from the input where the output has its size and format.
-        auto destination = Raster::DynamicBuffer::Create(shape.width, shape.height, shape.format);
-        if (destination && shape.width == current->GetWidth() && shape.height == current->GetHeight() &&
-            shape.format == current->GetFormat() && channelMask >= 0)
-            for (int y = 0; y < shape.height; ++y)
-                std::memcpy(destination->RowBytes(y), current->RowBytes(y), current->GetRowBytes());
-        if (!destination)
-            throw Error(outputName + ": a " + std::to_string(shape.width) + "x" +
-                        std::to_string(shape.height) + " " +
-                        std::string(Raster::GetPixelFormatName(shape.format)) + " image is too large");
-        Kernel::Counted<Raster::DynamicBuffer> mask;
-        if (!plan.mask.empty()) mask = ReadMask(plan.mask, shape.width, shape.height);
-
-        RasterTools::RenderJobOptions job;
-        job.tileSize = checked.tileSize
-                           ? checked.tileSize
-                           : DefaultTileSize(*command, shape.width, shape.height, checked.threads);
-        job.threads = checked.threads;
-        job.device = device.device;
-        job.channelMask = channelMask;
-        const double first = 0.1 + 0.8 * double(i) / double(checked.chain.size());
-        const double share = 0.8 / double(checked.chain.size());
-        job.progress = [&progress, first, share](double fraction) {
-            progress.Update(first + share * fraction);
-        };
-        const auto result = RasterTools::RenderImage(*pipeline, current, destination, mask, job);
-        if (!result.complete) throw Error(checked.names[i] + ": " + result.error);
-        deviceTiles += result.deviceTiles;
-        processorTiles += result.processorTiles;
-        current = destination;
+        if (!plan.mask.empty()) link.mask = ReadMask(plan.mask, shape.width, shape.height);
+        link.tileSize = checked.tileSize
+                            ? checked.tileSize
+                            : DefaultTileSize(*command, shape.width, shape.height, checked.threads);
+        links.push_back(std::move(link));
     }
+    ChainOptions chain;
+    chain.threads = checked.threads;
+    chain.device = device.device;
+    chain.progress = [&progress](double fraction) { progress.Update(0.1 + 0.8 * fraction); };
+    const auto started = std::chrono::steady_clock::now();
+    const ChainResult rendered = RenderChain(source, links, chain);
+    if (!rendered.image)
+        throw Error(rendered.filterFailed ? checked.names[rendered.failedLink] + ": " + rendered.error
+                                          : outputName + ": " + rendered.error);
+    const Kernel::Counted<Raster::DynamicBuffer> current = rendered.image;
+    const long deviceTiles = rendered.deviceTiles, processorTiles = rendered.processorTiles;
     const std::chrono::duration<double, std::milli> renderTime = std::chrono::steady_clock::now() - started;
 
     FileReport report;

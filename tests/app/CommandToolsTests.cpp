@@ -1,6 +1,7 @@
 // What a photographer meets on the command line: help generated from the parameter tables, values in the
 // units the panels show, chains, batches, pipes, the default device and interrupted writes.
 
+#include "app/ChainRender.h"
 #include "app/FilterArguments.h"
 #include "app/Options.h"
 #include "filters/Catalogue.h"
@@ -134,16 +135,50 @@ TEST_F(CommandTools, ValuesAreTypedAndShownInDegreesAndPercent) {
     EXPECT_GE(largest, 60);
 }
 
+// A chain renders in bands carried through its filters; whatever the tiles and threads, and whether a filter
+// reads around its pixels (unsharp mask, motion blur), changes the image's size (a scaled copy) or reads an
+// unbounded area (a twirl about the middle, which needs its input whole), the pixels are those of the filters
+// applied one after another.
 TEST_F(CommandTools, AChainGivesWhatTheFiltersGiveOneAfterAnother) {
-    const Result chain = Run(
-        "apply twirl --angle 90 --radius 25 : unsharpmask --radius 2 --factor 1.5 : motionblur --radius 3 "
-        "--angle 30 --device cpu --tile 16 in.png chain.png");
-    ASSERT_EQ(chain.exitCode, 0) << chain.output;
-    ASSERT_EQ(Run("apply twirl --angle 90 --radius 25 --device cpu in.png a.png").exitCode, 0);
-    ASSERT_EQ(Run("apply unsharpmask --radius=2 --factor=1.5 --device cpu a.png b.png").exitCode, 0);
-    ASSERT_EQ(Run("apply motionblur --radius 3 --angle 30 --device cpu b.png c.png").exitCode, 0);
-    EXPECT_EQ(Pixels(m_Folder / "chain.png"), Pixels(m_Folder / "c.png"));
-    EXPECT_NE(Pixels(m_Folder / "chain.png"), Pixels(m_Folder / "in.png"));
+    ASSERT_TRUE(IO::WriteImage(m_Folder / "tall.png", *Picture(67, 150, 4)));
+    // Each chain with the options given to all its filters.
+    const std::vector<std::pair<std::vector<std::string>, std::string>> chains = {
+        {{"twirl --angle 90 --radius 25", "unsharpmask --radius 2 --factor 1.5",
+          "motionblur --radius 3 --angle 30"},
+         ""},
+        {{"twirl --angle 120 --radius 30 --centre 20,40", "motionblur --radius 9 --angle 80",
+          "unsharpmask --radius 6 --factor 2"},
+         ""},
+        {{"unsharpmask --radius 3 --factor 1.5", "twirl --angle 60 --radius 20",
+          "motionblur --radius 2 --angle 90"},
+         ""},
+        {{"motionblur --radius 4 --angle 90", "copy --scale 1.5,0.75", "unsharpmask --radius 5 --factor 1.2"},
+         ""},
+        {{"copy --format rgba16", "motionblur --radius 5 --angle 100", "unsharpmask --radius 2"}, ""},
+        {{"motionblur --radius 5 --angle 100", "unsharpmask --radius 2 --factor 3"}, " --channels rg"},
+    };
+    for (const auto& [chain, options] : chains) {
+        std::string previous = "tall.png";
+        for (std::size_t i = 0; i < chain.size(); ++i) {
+            const std::string next = "step" + std::to_string(i) + ".png";
+            const Result step = Run("apply " + chain[i] + options + " --device cpu " + previous + " " + next);
+            ASSERT_EQ(step.exitCode, 0) << chain[i] << "\n" << step.output;
+            previous = next;
+        }
+        const auto expected = Pixels(m_Folder / previous);
+        std::string joined;
+        for (const auto& filter : chain)
+            joined += (joined.empty() ? "" : " : ") + filter;
+        for (const std::string tiling :
+             {"", "--tile 16 --threads 1", "--tile 16 --threads 3", "--tile 40 --threads 2", "--tile 64"}) {
+            SCOPED_TRACE(joined + " " + tiling);
+            const Result run =
+                Run("apply " + joined + options + " --device cpu " + tiling + " tall.png chain.png");
+            ASSERT_EQ(run.exitCode, 0) << run.output;
+            EXPECT_EQ(Pixels(m_Folder / "chain.png"), expected);
+        }
+    }
+    EXPECT_NE(Pixels(m_Folder / "chain.png"), Pixels(m_Folder / "tall.png"));
 
     for (const auto& [arguments, message] : std::vector<std::pair<std::string, std::string>>{
              {"apply twirl in.png out.png :", "must be followed by a filter name"},
@@ -155,6 +190,31 @@ TEST_F(CommandTools, AChainGivesWhatTheFiltersGiveOneAfterAnother) {
         EXPECT_EQ(result.exitCode, 2) << arguments;
         EXPECT_TRUE(Contains(result.output, message)) << arguments << "\n" << result.output;
     }
+}
+
+// Which filters of a chain take their input a band at a time: those whose read area is bounded; a twirl about
+// the image's middle (its centre unset) reads an unbounded area, and on a device every filter renders whole.
+TEST(ChainRender, OnlyFiltersWithAnUnboundedReadAreaNeedTheirInputWhole) {
+    const auto link = [](const char* name, std::vector<std::pair<std::string, std::string>> parameters) {
+        App::ChainLink made;
+        static std::vector<Kernel::Counted<RasterCommand>> kept;
+        kept.push_back(App::MakeFilterCommand(Filter(name), false, parameters));
+        made.command = kept.back().Get();
+        made.pipeline = dynamic_cast<const RasterTools::PipelineCommand*>(made.command);
+        made.shape = {40, 30, Raster::PixelFormat::RGBA8};
+        return made;
+    };
+    const std::vector<App::ChainLink> links = {
+        link("twirl", {{"angle", "90"}}),
+        link("unsharpmask", {{"radius", "3"}}),
+        link("motionblur", {{"radius", "4"}}),
+        link("twirl", {{"angle", "90"}}),
+        link("twirl", {{"angle", "90"}, {"centre", "10,10"}}),
+        link("copy", {{"scale", "2,2"}}),
+    };
+    EXPECT_EQ(App::GetWholeInputLinks(links, false),
+              (std::vector<bool>{true, false, false, true, false, false}));
+    EXPECT_EQ(App::GetWholeInputLinks(links, true), std::vector<bool>(links.size(), true));
 }
 
 TEST_F(CommandTools, ABatchProcessesTheGoodFilesAndFailsForTheBadOne) {
