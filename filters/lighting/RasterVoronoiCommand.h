@@ -9,11 +9,181 @@
 #include "pipeline/Conversions.h"
 #include "pipeline/Pipeline.h"
 
+#include <algorithm>
 #include <cmath>
 #include <cstring>
 #include <vector>
 
 namespace RasterTools {
+
+// The sites of the grid cells around one grid row: rows row - 2 .. row + 2 (only the middle three without
+// lines) and a window of columns that moves on when a pixel's neighbourhood leaves it; and the border edges
+// of the cells that turn out closest. Every value is computed by VoronoiMath as the kernel text computes it
+// per pixel, so caching changes no bit.
+class VoronoiSpanCells {
+public:
+    // Starts over unless the grid and row are those already held.
+    void Use(int row, float cell, Raster::KernelMath::float2 origin, bool lines) noexcept {
+        if (m_Filled >= 0 && row == m_Row && cell == m_Cell && origin.x == m_Origin.x &&
+            origin.y == m_Origin.y && lines == (m_FirstRow == 0))
+            return;
+        m_Row = row;
+        m_Cell = cell;
+        m_Origin = origin;
+        m_FirstRow = lines ? 0 : 1;
+        m_LastRow = lines ? 4 : 3;
+        m_Filled = -1;
+    }
+
+    // Makes the columns col - 2 .. col + 2 available.
+    void Cover(int col) noexcept {
+        if (m_Filled < 0 || col - 2 < m_FirstColumn || col + 2 >= m_FirstColumn + Columns) {
+            m_FirstColumn = col - 2;
+            m_Filled = 0;
+            std::memset(m_EdgesKnown, 0, sizeof m_EdgesKnown);
+        }
+        for (; m_FirstColumn + m_Filled <= col + 2; ++m_Filled)
+            for (int r = m_FirstRow; r <= m_LastRow; ++r)
+                m_Sites[r][m_Filled] =
+                    VoronoiMath::VoronoiSite(m_Row - 2 + r, m_FirstColumn + m_Filled, m_Cell, m_Origin);
+    }
+
+    // The 3 × 3 sites around grid cell (row + rowOffset, col), row-major; rowOffset is -1, 0 or 1.
+    void Around(int rowOffset, int col, Raster::KernelMath::float2* sites) const noexcept {
+        for (int r = 0; r < 3; ++r)
+            for (int c = 0; c < 3; ++c)
+                sites[r * 3 + c] = m_Sites[rowOffset + 1 + r][col - 1 - m_FirstColumn + c];
+    }
+
+    struct Edges {
+        Raster::KernelMath::float4 edges[8];
+        float scales[8];
+    };
+    // The bisectors between the site of grid cell (row + rowOffset, col) and its 8 neighbours' sites.
+    const Edges& EdgesOf(int rowOffset, int col) noexcept {
+        const int c = col - m_FirstColumn;
+        Edges& edges = m_Edges[rowOffset + 1][c];
+        if (!m_EdgesKnown[rowOffset + 1][c]) {
+            Raster::KernelMath::float2 ring[9];
+            Around(rowOffset, col, ring);
+            VoronoiMath::VoronoiEdges(ring, edges.edges, edges.scales);
+            m_EdgesKnown[rowOffset + 1][c] = true;
+        }
+        return edges;
+    }
+
+private:
+    static constexpr int Columns = 24;
+    int m_Row = 0;
+    float m_Cell = 0.0f;
+    Raster::KernelMath::float2 m_Origin{};
+    int m_FirstRow = 1, m_LastRow = 3;
+    int m_FirstColumn = 0;
+    int m_Filled = -1; // nothing yet: the first Cover places the window
+    Raster::KernelMath::float2 m_Sites[5][Columns];
+    bool m_EdgesKnown[3][Columns] = {};
+    Edges m_Edges[3][Columns];
+};
+
+// What the colour pass needs of each pixel of a run of pixels in one grid column and row: the closest of the
+// 3 × 3 sites, the border line's weight, and whether the full weighing of sites is needed (another site lends
+// colour, or ties with the closest). Format-free, so that one build for AVX2 serves every format.
+struct VoronoiRun {
+    static constexpr int Capacity = 256;
+    int closest[Capacity];
+    float line[Capacity];
+    unsigned char blend[Capacity];
+};
+
+// The closest of the 3 × 3 sites (x coordinates sx, squared y distances dyy) for the pixels x + i, first <= i
+// < end, and whether each needs the full weighing; VoronoiClosest's and VoronoiThreshold's floats.
+[[gnu::always_inline]] inline void VoronoiClosestScalar(const float* sx, const float* dyy, int x, int first,
+                                                        int end, VoronoiRun& run) noexcept {
+    using namespace VoronoiMath;
+    for (int i = first; i < end; ++i) {
+        const float px = (float)(x + i);
+        float d2[9];
+        for (int s = 0; s < 9; ++s) {
+            const float dx = sx[s] - px;
+            d2[s] = dx * dx + dyy[s];
+        }
+        float best = d2[0];
+        int closest = 0;
+        for (int s = 1; s < 9; ++s) {
+            closest = d2[s] < best ? s : closest;
+            best = d2[s] < best ? d2[s] : best;
+        }
+        const float threshold = VoronoiThreshold(VoronoiMinDistance(best));
+        int near = 0;
+        for (int s = 0; s < 9; ++s)
+            near += d2[s] < threshold ? 1 : 0;
+        run.closest[i] = closest;
+        // The closest is always below the threshold; a second one lends colour or ties.
+        run.blend[i] = !(best < threshold) || near != 1;
+    }
+}
+
+// The border line's weight for the pixels x + i, first <= i < end, from the 8 bisectors of their closest site
+// (midpoints ex and directions ez in x, the y terms ey = (y - midpoint y) × direction y, and the scales);
+// VoronoiBorderDistance's and VoronoiLineWeight's floats.
+[[gnu::always_inline]] inline void VoronoiLinesScalar(const float* ex, const float* ez, const float* ey,
+                                                      const float* scales, int x, int first, int end,
+                                                      float lineWidth, VoronoiRun& run) noexcept {
+    using namespace VoronoiMath;
+    for (int i = first; i < end; ++i) {
+        const float px = (float)(x + i);
+        float m = rt_fabs((px - ex[0]) * ez[0] + ey[0]) * scales[0];
+        for (int k = 1; k < 8; ++k)
+            m = rt_fmin(m, rt_fabs((px - ex[k]) * ez[k] + ey[k]) * scales[k]);
+        run.line[i] = VoronoiLineWeight(m, lineWidth);
+    }
+}
+
+// Fills run for the count pixels from (x, y) on, all in grid column col (which cells covers), with the same
+// floats as VoronoiMath per pixel: each site's y distance is squared once, and each bisector's y term once
+// per stretch of pixels sharing a closest site. Ranges does the per-pixel work (Closest and Lines, with the
+// parameters of VoronoiClosestScalar and VoronoiLinesScalar).
+template <class Ranges>
+[[gnu::always_inline]] inline void VoronoiRunGeometryWith(VoronoiSpanCells& cells, int col, int x, int y,
+                                                          int count, float lineWidth,
+                                                          VoronoiRun& run) noexcept {
+    using namespace VoronoiMath;
+    const float py = (float)y;
+    float2 around[9];
+    cells.Around(0, col, around);
+    float sx[9], dyy[9];
+    for (int s = 0; s < 9; ++s) {
+        sx[s] = around[s].x;
+        const float dy = around[s].y - py;
+        dyy[s] = dy * dy;
+    }
+    Ranges::Closest(sx, dyy, x, 0, count, run);
+    if (!(lineWidth > 0.0f)) {
+        for (int i = 0; i < count; ++i)
+            run.line[i] = 0.0f;
+        return;
+    }
+    for (int i = 0; i < count;) {
+        const int closest = run.closest[i];
+        int end = i + 1;
+        while (end < count && run.closest[end] == closest)
+            ++end;
+        const auto& edges = cells.EdgesOf(closest / 3 - 1, col - 1 + closest % 3);
+        float ex[8], ez[8], ey[8], scales[8];
+        for (int k = 0; k < 8; ++k) {
+            ex[k] = edges.edges[k].x;
+            ez[k] = edges.edges[k].z;
+            ey[k] = (py - edges.edges[k].y) * edges.edges[k].w;
+            scales[k] = edges.scales[k];
+        }
+        Ranges::Lines(ex, ez, ey, scales, x, i, end, lineWidth, run);
+        i = end;
+    }
+}
+
+// VoronoiRunGeometryWith, built for AVX2 where the processor has it (VoronoiSpans.cpp).
+void VoronoiRunGeometry(VoronoiSpanCells& cells, int col, int x, int y, int count, float lineWidth,
+                        VoronoiRun& run) noexcept;
 
 // The cell colour of each destination pixel (VoronoiMath), blended towards the line colour by the border
 // weight, with the alpha of the source pixel under the destination pixel. Sites are read through Transform
@@ -31,75 +201,9 @@ struct VoronoiSampler {
         return line;
     }
 
-    // The sites of the grid cells around one grid row: rows row - 2 .. row + 2 (only the middle three
-    // without lines) and a window of columns that moves on when a pixel's neighbourhood leaves it; and the
-    // border edges of the cells that turn out closest. Every value is computed by VoronoiMath as the kernel
-    // text computes it per pixel, so caching changes no bit.
-    class SpanCells {
-    public:
-        // Starts over unless the grid and row are those already held.
-        void Use(int row, float cell, Raster::KernelMath::float2 origin, bool lines) noexcept {
-            if (m_Filled >= 0 && row == m_Row && cell == m_Cell && origin.x == m_Origin.x &&
-                origin.y == m_Origin.y && lines == (m_FirstRow == 0))
-                return;
-            m_Row = row;
-            m_Cell = cell;
-            m_Origin = origin;
-            m_FirstRow = lines ? 0 : 1;
-            m_LastRow = lines ? 4 : 3;
-            m_Filled = -1;
-        }
-
-        // Makes the columns col - 2 .. col + 2 available.
-        void Cover(int col) noexcept {
-            if (m_Filled < 0 || col - 2 < m_FirstColumn || col + 2 >= m_FirstColumn + Columns) {
-                m_FirstColumn = col - 2;
-                m_Filled = 0;
-                std::memset(m_EdgesKnown, 0, sizeof m_EdgesKnown);
-            }
-            for (; m_FirstColumn + m_Filled <= col + 2; ++m_Filled)
-                for (int r = m_FirstRow; r <= m_LastRow; ++r)
-                    m_Sites[r][m_Filled] =
-                        VoronoiMath::VoronoiSite(m_Row - 2 + r, m_FirstColumn + m_Filled, m_Cell, m_Origin);
-        }
-
-        // The 3 × 3 sites around grid cell (row + rowOffset, col), row-major; rowOffset is -1, 0 or 1.
-        void Around(int rowOffset, int col, Raster::KernelMath::float2* sites) const noexcept {
-            for (int r = 0; r < 3; ++r)
-                for (int c = 0; c < 3; ++c)
-                    sites[r * 3 + c] = m_Sites[rowOffset + 1 + r][col - 1 - m_FirstColumn + c];
-        }
-
-        struct Edges {
-            Raster::KernelMath::float4 edges[8];
-            float scales[8];
-        };
-        // The bisectors between the site of grid cell (row + rowOffset, col) and its 8 neighbours' sites.
-        const Edges& EdgesOf(int rowOffset, int col) noexcept {
-            const int c = col - m_FirstColumn;
-            Edges& edges = m_Edges[rowOffset + 1][c];
-            if (!m_EdgesKnown[rowOffset + 1][c]) {
-                Raster::KernelMath::float2 ring[9];
-                Around(rowOffset, col, ring);
-                VoronoiMath::VoronoiEdges(ring, edges.edges, edges.scales);
-                m_EdgesKnown[rowOffset + 1][c] = true;
-            }
-            return edges;
-        }
-
-    private:
-        static constexpr int Columns = 24;
-        int m_Row = 0;
-        float m_Cell = 0.0f;
-        Raster::KernelMath::float2 m_Origin{};
-        int m_FirstRow = 1, m_LastRow = 3;
-        int m_FirstColumn = 0;
-        int m_Filled = -1; // nothing yet: the first Cover places the window
-        Raster::KernelMath::float2 m_Sites[5][Columns];
-        bool m_EdgesKnown[3][Columns] = {};
-        Edges m_Edges[3][Columns];
-    };
-
+    // The pixels of a span go in runs of one grid column (a column changes every cell's width of pixels):
+    // their geometry at once (VoronoiRunGeometry), then their colours, where a site's colour is read once per
+    // run and the usual pixel, deep inside its cell and off the lines, only copies it.
     template <class Transform, class Extend, class Image>
     static void SampleSpan(const Image& image, const Raster::PreparedTransform<Transform>& t,
                            const Params& params, int x0, int y, int n, typename Image::Stored* out) noexcept {
@@ -118,49 +222,80 @@ struct VoronoiSampler {
         const float py = (float)y;
         const int row = VoronoiCellIndex(py, origin.y, cell);
         const Accumulator line = LineColour<F>();
-        SpanCells cells;
+        const Stored lineStored = Traits::FromAccumulator(Traits::Clamp(line));
+        // Kept between the spans of a thread: the next row of a tile mostly lies in the same grid row.
+        thread_local VoronoiSpanCells cells;
         cells.Use(row, cell, origin, lines);
-        for (int i = 0; i < n; ++i) {
-            const float2 p = make_float2((float)(x0 + i), py);
-            const int col = VoronoiCellIndex(p.x, origin.x, cell);
+        VoronoiRun run;
+        const auto columnOf = [&](int i) { return VoronoiCellIndex((float)(x0 + i), origin.x, cell); };
+        for (int start = 0; start < n;) {
+            // The column only grows along the span: the run's end by bisection.
+            const int col = columnOf(start);
+            int last = start, beyond = std::min(n, start + VoronoiRun::Capacity);
+            while (beyond - last > 1) {
+                const int middle = last + (beyond - last) / 2;
+                if (columnOf(middle) == col)
+                    last = middle;
+                else
+                    beyond = middle;
+            }
+            const int count = last + 1 - start;
             cells.Cover(col);
+            VoronoiRunGeometry(cells, col, x0 + start, y, count, lineWidth, run);
             float2 around[9];
             cells.Around(0, col, around);
-            float d2[9];
-            const int closest = VoronoiClosest(around, p, d2);
-            float w = 0.0f;
-            if (lines) {
-                const auto& edges = cells.EdgesOf(closest / 3 - 1, col - 1 + closest % 3);
-                w = VoronoiLineWeight(VoronoiBorderDistance(edges.edges, edges.scales, p), lineWidth);
-            }
-            Stored pixel =
-                Extend::Read(image, Raster::TransformPixelCenterToInt<Transform>(make_int2(x0 + i, y), t));
-            Accumulator acc;
-            if (w == 1.0f) {
-                acc = line;
-            } else {
-                const float best = d2[closest];
-                const float minD = VoronoiMinDistance(best);
-                const float threshold = VoronoiThreshold(minD);
-                Accumulator sum{};
-                float total = 0.0f;
-                for (int s = 0; s < 9; ++s) {
-                    const float weight = VoronoiBlendWeight(d2[s], best, minD, threshold, around[s], p);
-                    if (weight > 0.0f) {
+            // The sum of one site's colour with the weight 1, and that as a pixel, when first needed.
+            Accumulator single[9];
+            Stored inside[9];
+            bool known[9] = {};
+            for (int r = 0; r < count; ++r) {
+                const int i = start + r;
+                Stored pixel = Extend::Read(
+                    image, Raster::TransformPixelCenterToInt<Transform>(make_int2(x0 + i, y), t));
+                const float w = run.line[r];
+                Stored colour;
+                if (w == 1.0f) {
+                    colour = lineStored;
+                } else if (!run.blend[r]) {
+                    const int s = run.closest[r];
+                    if (!known[s]) {
+                        single[s] = Accumulator{};
                         const int2 at = convert_int2(Transform::Transform(around[s], t));
-                        sum += Traits::Accumulate(Extend::Read(image, at)) * weight;
-                        total += weight;
+                        single[s] += Traits::Accumulate(Extend::Read(image, at)) * 1.0f;
+                        inside[s] = Traits::FromAccumulator(Traits::Clamp(single[s]));
+                        known[s] = true;
                     }
+                    colour = w == 0.0f
+                                 ? inside[s]
+                                 : Traits::FromAccumulator(Traits::Clamp(single[s] * (1.0f - w) + line * w));
+                } else {
+                    const float2 p = make_float2((float)(x0 + i), py);
+                    float d2[9];
+                    const int closest = VoronoiClosest(around, p, d2);
+                    const float best = d2[closest];
+                    const float minD = VoronoiMinDistance(best);
+                    const float threshold = VoronoiThreshold(minD);
+                    Accumulator sum{};
+                    float total = 0.0f;
+                    for (int s = 0; s < 9; ++s) {
+                        const float weight = VoronoiBlendWeight(d2[s], best, minD, threshold, around[s], p);
+                        if (weight > 0.0f) {
+                            const int2 at = convert_int2(Transform::Transform(around[s], t));
+                            sum += Traits::Accumulate(Extend::Read(image, at)) * weight;
+                            total += weight;
+                        }
+                    }
+                    // Dividing by 1, and then mixing in none of the line, change no bit of a sum that starts
+                    // at +0 (it is never -0).
+                    Accumulator acc = total == 1.0f ? sum : sum / total;
+                    if (w != 0.0f || total != 1.0f) acc = acc * (1.0f - w) + line * w;
+                    colour = Traits::FromAccumulator(Traits::Clamp(acc));
                 }
-                // Dividing by 1, and then mixing in none of the line, change no bit of a sum that starts at
-                // +0 (it is never -0): the usual pixel, deep inside its cell, skips both.
-                acc = total == 1.0f ? sum : sum / total;
-                if (w != 0.0f || total != 1.0f) acc = acc * (1.0f - w) + line * w;
+                // The colour channels; alpha (the last) stays the source pixel's.
+                std::memcpy(&pixel, &colour, sizeof(Component) * (Channels - 1));
+                out[i] = pixel;
             }
-            const Stored colour = Traits::FromAccumulator(Traits::Clamp(acc));
-            // The colour channels; alpha (the last) stays the source pixel's.
-            std::memcpy(&pixel, &colour, sizeof(Component) * (Channels - 1));
-            out[i] = pixel;
+            start = last + 1;
         }
     }
 };

@@ -1,0 +1,123 @@
+// The Voronoi runs' geometry, built for AVX2 and for any x86-64: eight pixels at once for the distances to
+// the sites and to the bisectors, with the same floats as the portable loops (no fused multiply-add, the
+// same order of operations, and minima that treat not-a-number as rt_fmin and rt_fmax do).
+#include "filters/lighting/RasterVoronoiCommand.h"
+#include "host/kernel/Simd.h"
+
+#if RT_AVX2_BUILD
+#include <immintrin.h>
+#endif
+
+namespace RasterTools {
+namespace {
+
+struct PlainRanges {
+    static void Closest(const float* sx, const float* dyy, int x, int first, int end,
+                        VoronoiRun& run) noexcept {
+        VoronoiClosestScalar(sx, dyy, x, first, end, run);
+    }
+    static void Lines(const float* ex, const float* ez, const float* ey, const float* scales, int x,
+                      int first, int end, float lineWidth, VoronoiRun& run) noexcept {
+        VoronoiLinesScalar(ex, ez, ey, scales, x, first, end, lineWidth, run);
+    }
+};
+
+#if RT_AVX2_BUILD && !defined(__SANITIZE_ADDRESS__)
+
+// The x coordinates of pixels x + i .. x + i + 7.
+RT_TARGET_AVX2 inline __m256 PixelsX(int x, int i) noexcept {
+    return _mm256_cvtepi32_ps(
+        _mm256_add_epi32(_mm256_set1_epi32(x + i), _mm256_setr_epi32(0, 1, 2, 3, 4, 5, 6, 7)));
+}
+
+// rt_fmin(a, b): a where b is not a number, else the smaller with a kept on ties.
+RT_TARGET_AVX2 inline __m256 Fmin(__m256 a, __m256 b) noexcept {
+    return _mm256_blendv_ps(_mm256_min_ps(a, b), a, _mm256_cmp_ps(b, b, _CMP_UNORD_Q));
+}
+
+// VoronoiEdgeDistance: |(x - midpoint x) × direction x + ey| × scale.
+RT_TARGET_AVX2 inline __m256 BisectorDistance(__m256 px, float ex, float ez, float ey, float scale) noexcept {
+    const __m256 along = _mm256_add_ps(
+        _mm256_mul_ps(_mm256_sub_ps(px, _mm256_set1_ps(ex)), _mm256_set1_ps(ez)), _mm256_set1_ps(ey));
+    const __m256 magnitude = _mm256_castsi256_ps(_mm256_set1_epi32(0x7fffffff));
+    return _mm256_mul_ps(_mm256_and_ps(along, magnitude), _mm256_set1_ps(scale));
+}
+
+struct Avx2Ranges {
+    RT_TARGET_AVX2 static void Closest(const float* sx, const float* dyy, int x, int first, int end,
+                                       VoronoiRun& run) noexcept {
+        int i = first;
+        for (; i + 8 <= end; i += 8) {
+            const __m256 px = PixelsX(x, i);
+            __m256 d2[9];
+            for (int s = 0; s < 9; ++s) {
+                const __m256 dx = _mm256_sub_ps(_mm256_set1_ps(sx[s]), px);
+                d2[s] = _mm256_add_ps(_mm256_mul_ps(dx, dx), _mm256_set1_ps(dyy[s]));
+            }
+            __m256 best = d2[0];
+            __m256i closest = _mm256_setzero_si256();
+            for (int s = 1; s < 9; ++s) {
+                const __m256 less = _mm256_cmp_ps(d2[s], best, _CMP_LT_OQ);
+                closest = _mm256_blendv_epi8(closest, _mm256_set1_epi32(s), _mm256_castps_si256(less));
+                best = _mm256_blendv_ps(best, d2[s], less);
+            }
+            const __m256 t = _mm256_add_ps(_mm256_sqrt_ps(best), _mm256_set1_ps(1.41421356f));
+            const __m256 threshold = _mm256_mul_ps(t, t);
+            __m256i near = _mm256_setzero_si256();
+            for (int s = 0; s < 9; ++s)
+                near =
+                    _mm256_sub_epi32(near, _mm256_castps_si256(_mm256_cmp_ps(d2[s], threshold, _CMP_LT_OQ)));
+            const __m256i alone =
+                _mm256_and_si256(_mm256_castps_si256(_mm256_cmp_ps(best, threshold, _CMP_LT_OQ)),
+                                 _mm256_cmpeq_epi32(near, _mm256_set1_epi32(1)));
+            _mm256_storeu_si256(reinterpret_cast<__m256i*>(run.closest + i), closest);
+            // alone is all ones or zero per lane: its low bytes, inverted, are the eight flags.
+            const __m256i blend = _mm256_andnot_si256(alone, _mm256_set1_epi32(1));
+            const __m128i words =
+                _mm_packus_epi32(_mm256_castsi256_si128(blend), _mm256_extracti128_si256(blend, 1));
+            _mm_storel_epi64(reinterpret_cast<__m128i*>(run.blend + i), _mm_packus_epi16(words, words));
+        }
+        VoronoiClosestScalar(sx, dyy, x, i, end, run);
+    }
+
+    RT_TARGET_AVX2 static void Lines(const float* ex, const float* ez, const float* ey, const float* scales,
+                                     int x, int first, int end, float lineWidth, VoronoiRun& run) noexcept {
+        int i = first;
+        for (; i + 8 <= end; i += 8) {
+            const __m256 px = PixelsX(x, i);
+            __m256 m = BisectorDistance(px, ex[0], ez[0], ey[0], scales[0]);
+            for (int k = 1; k < 8; ++k)
+                m = Fmin(m, BisectorDistance(px, ex[k], ez[k], ey[k], scales[k]));
+            // VoronoiLineWeight: 1 - rt_fmin(rt_fmax(m - w / 2 + 0.5, 0), 1); max_ps and min_ps keep the
+            // second operand where the first is not a number, as rt_fmax and rt_fmin against a number do.
+            const __m256 ramp =
+                _mm256_add_ps(_mm256_sub_ps(m, _mm256_set1_ps(lineWidth * 0.5f)), _mm256_set1_ps(0.5f));
+            const __m256 clamped =
+                _mm256_min_ps(_mm256_max_ps(ramp, _mm256_setzero_ps()), _mm256_set1_ps(1.0f));
+            _mm256_storeu_ps(run.line + i, _mm256_sub_ps(_mm256_set1_ps(1.0f), clamped));
+        }
+        VoronoiLinesScalar(ex, ez, ey, scales, x, i, end, lineWidth, run);
+    }
+};
+
+RT_TARGET_AVX2 void RunGeometryAvx2(VoronoiSpanCells& cells, int col, int x, int y, int count,
+                                    float lineWidth, VoronoiRun& run) noexcept {
+    VoronoiRunGeometryWith<Avx2Ranges>(cells, col, x, y, count, lineWidth, run);
+}
+
+#endif
+
+} // namespace
+
+void VoronoiRunGeometry(VoronoiSpanCells& cells, int col, int x, int y, int count, float lineWidth,
+                        VoronoiRun& run) noexcept {
+#if RT_AVX2_BUILD && !defined(__SANITIZE_ADDRESS__)
+    if (Kernel::HasAvx2()) {
+        RunGeometryAvx2(cells, col, x, y, count, lineWidth, run);
+        return;
+    }
+#endif
+    VoronoiRunGeometryWith<PlainRanges>(cells, col, x, y, count, lineWidth, run);
+}
+
+} // namespace RasterTools
