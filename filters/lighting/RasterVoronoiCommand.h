@@ -12,6 +12,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstring>
+#include <type_traits>
 #include <vector>
 
 namespace RasterTools {
@@ -86,10 +87,12 @@ private:
 };
 
 // What the colour pass needs of each pixel of a run of pixels in one grid column and row: the closest of the
-// 3 × 3 sites, the border line's weight, and whether the full weighing of sites is needed (another site lends
-// colour, or ties with the closest). Format-free, so that one build for AVX2 serves every format.
+// 3 × 3 sites, the border line's weight, whether the full weighing of sites is needed (another site lends
+// colour, or ties with the closest), and the source pixel under the pixel's centre (before the extend).
+// Format-free, so that one build for AVX2 serves every format.
 struct VoronoiRun {
     static constexpr int Capacity = 256;
+    int sourceX[Capacity], sourceY[Capacity];
     int closest[Capacity];
     float line[Capacity];
     unsigned char blend[Capacity];
@@ -139,14 +142,26 @@ struct VoronoiRun {
     }
 }
 
+// The source pixels under the centres of pixels (x + i, y), first <= i < end, as TransformPixelCenterToInt
+// finds them.
+[[gnu::always_inline]] inline void VoronoiSourcesScalar(const Raster::AffineTransform::Prepared& t, int x,
+                                                        int y, int first, int end, VoronoiRun& run) noexcept {
+    for (int i = first; i < end; ++i) {
+        const auto at = Raster::TransformPixelCenterToInt<Raster::AffineTransform>(
+            Raster::KernelMath::make_int2(x + i, y), t);
+        run.sourceX[i] = at.x;
+        run.sourceY[i] = at.y;
+    }
+}
+
 // Fills run for the count pixels from (x, y) on, all in grid column col (which cells covers), with the same
 // floats as VoronoiMath per pixel: each site's y distance is squared once, and each bisector's y term once
 // per stretch of pixels sharing a closest site. Ranges does the per-pixel work (Closest and Lines, with the
-// parameters of VoronoiClosestScalar and VoronoiLinesScalar).
+// parameters of VoronoiClosestScalar and VoronoiLinesScalar) and Sources (VoronoiSourcesScalar's).
 template <class Ranges>
-[[gnu::always_inline]] inline void VoronoiRunGeometryWith(VoronoiSpanCells& cells, int col, int x, int y,
-                                                          int count, float lineWidth,
-                                                          VoronoiRun& run) noexcept {
+[[gnu::always_inline]] inline void
+VoronoiRunGeometryWith(VoronoiSpanCells& cells, const Raster::AffineTransform::Prepared& t, int col, int x,
+                       int y, int count, float lineWidth, VoronoiRun& run) noexcept {
     using namespace VoronoiMath;
     const float py = (float)y;
     float2 around[9];
@@ -157,7 +172,10 @@ template <class Ranges>
         const float dy = around[s].y - py;
         dyy[s] = dy * dy;
     }
+
+    Ranges::Sources(t, x, y, 0, count, run);
     Ranges::Closest(sx, dyy, x, 0, count, run);
+
     if (!(lineWidth > 0.0f)) {
         for (int i = 0; i < count; ++i)
             run.line[i] = 0.0f;
@@ -182,8 +200,8 @@ template <class Ranges>
 }
 
 // VoronoiRunGeometryWith, built for AVX2 where the processor has it (VoronoiSpans.cpp).
-void VoronoiRunGeometry(VoronoiSpanCells& cells, int col, int x, int y, int count, float lineWidth,
-                        VoronoiRun& run) noexcept;
+void VoronoiRunGeometry(VoronoiSpanCells& cells, const Raster::AffineTransform::Prepared& t, int col, int x,
+                        int y, int count, float lineWidth, VoronoiRun& run) noexcept;
 
 // The cell colour of each destination pixel (VoronoiMath), blended towards the line colour by the border
 // weight, with the alpha of the source pixel under the destination pixel. Sites are read through Transform
@@ -241,7 +259,8 @@ struct VoronoiSampler {
             }
             const int count = last + 1 - start;
             cells.Cover(col);
-            VoronoiRunGeometry(cells, col, x0 + start, y, count, lineWidth, run);
+            static_assert(std::is_same_v<Transform, Raster::AffineTransform>, "the runs take affine views");
+            VoronoiRunGeometry(cells, t, col, x0 + start, y, count, lineWidth, run);
             float2 around[9];
             cells.Around(0, col, around);
             // The sum of one site's colour with the weight 1, and that as a pixel, when first needed.
@@ -250,8 +269,8 @@ struct VoronoiSampler {
             bool known[9] = {};
             for (int r = 0; r < count; ++r) {
                 const int i = start + r;
-                Stored pixel = Extend::Read(
-                    image, Raster::TransformPixelCenterToInt<Transform>(make_int2(x0 + i, y), t));
+
+                Stored pixel = Extend::Read(image, make_int2(run.sourceX[r], run.sourceY[r]));
                 const float w = run.line[r];
                 Stored colour;
                 if (w == 1.0f) {

@@ -12,6 +12,11 @@ namespace RasterTools {
 namespace {
 
 struct PlainRanges {
+    static void Sources(const Raster::AffineTransform::Prepared& t, int x, int y, int first, int end,
+                        VoronoiRun& run) noexcept {
+        VoronoiSourcesScalar(t, x, y, first, end, run);
+    }
+
     static void Closest(const float* sx, const float* dyy, int x, int first, int end,
                         VoronoiRun& run) noexcept {
         VoronoiClosestScalar(sx, dyy, x, first, end, run);
@@ -43,7 +48,36 @@ RT_TARGET_AVX2 inline __m256 BisectorDistance(__m256 px, float ex, float ez, flo
     return _mm256_mul_ps(_mm256_and_ps(along, magnitude), _mm256_set1_ps(scale));
 }
 
+// floor, then rt_sat_int: not-a-number to 0, beyond the ints to the nearest one.
+RT_TARGET_AVX2 inline __m256i FloorToInt(__m256 v) noexcept {
+    const __m256 whole = _mm256_floor_ps(v);
+    __m256i r = _mm256_cvttps_epi32(whole); // INT_MIN for what lies beyond
+    r = _mm256_blendv_epi8(
+        r, _mm256_set1_epi32(2147483647),
+        _mm256_castps_si256(_mm256_cmp_ps(whole, _mm256_set1_ps(2147483647.0f), _CMP_GE_OQ)));
+    return _mm256_andnot_si256(_mm256_castps_si256(_mm256_cmp_ps(whole, whole, _CMP_UNORD_Q)), r);
+}
+
 struct Avx2Ranges {
+    // TransformPixelCenterToInt: the centre (x + 0.5, y + 0.5) through x·p0 + y·p1 + p2, x·p3 + y·p4 + p5.
+    RT_TARGET_AVX2 static void Sources(const Raster::AffineTransform::Prepared& t, int x, int y, int first,
+                                       int end, VoronoiRun& run) noexcept {
+        const __m256 cy = _mm256_set1_ps((float)y + 0.5f);
+        const __m256 yx = _mm256_mul_ps(cy, _mm256_set1_ps(t.p[1])),
+                     yy = _mm256_mul_ps(cy, _mm256_set1_ps(t.p[4]));
+        int i = first;
+        for (; i + 8 <= end; i += 8) {
+            const __m256 cx = _mm256_add_ps(PixelsX(x, i), _mm256_set1_ps(0.5f));
+            const __m256 sx = _mm256_add_ps(_mm256_add_ps(_mm256_mul_ps(cx, _mm256_set1_ps(t.p[0])), yx),
+                                            _mm256_set1_ps(t.p[2]));
+            const __m256 sy = _mm256_add_ps(_mm256_add_ps(_mm256_mul_ps(cx, _mm256_set1_ps(t.p[3])), yy),
+                                            _mm256_set1_ps(t.p[5]));
+            _mm256_storeu_si256(reinterpret_cast<__m256i*>(run.sourceX + i), FloorToInt(sx));
+            _mm256_storeu_si256(reinterpret_cast<__m256i*>(run.sourceY + i), FloorToInt(sy));
+        }
+        VoronoiSourcesScalar(t, x, y, i, end, run);
+    }
+
     RT_TARGET_AVX2 static void Closest(const float* sx, const float* dyy, int x, int first, int end,
                                        VoronoiRun& run) noexcept {
         int i = first;
@@ -100,24 +134,25 @@ struct Avx2Ranges {
     }
 };
 
-RT_TARGET_AVX2 void RunGeometryAvx2(VoronoiSpanCells& cells, int col, int x, int y, int count,
-                                    float lineWidth, VoronoiRun& run) noexcept {
-    VoronoiRunGeometryWith<Avx2Ranges>(cells, col, x, y, count, lineWidth, run);
+RT_TARGET_AVX2 void RunGeometryAvx2(VoronoiSpanCells& cells, const Raster::AffineTransform::Prepared& t,
+                                    int col, int x, int y, int count, float lineWidth,
+                                    VoronoiRun& run) noexcept {
+    VoronoiRunGeometryWith<Avx2Ranges>(cells, t, col, x, y, count, lineWidth, run);
 }
 
 #endif
 
 } // namespace
 
-void VoronoiRunGeometry(VoronoiSpanCells& cells, int col, int x, int y, int count, float lineWidth,
-                        VoronoiRun& run) noexcept {
+void VoronoiRunGeometry(VoronoiSpanCells& cells, const Raster::AffineTransform::Prepared& t, int col, int x,
+                        int y, int count, float lineWidth, VoronoiRun& run) noexcept {
 #if RT_AVX2_BUILD && !defined(__SANITIZE_ADDRESS__)
     if (Kernel::HasAvx2()) {
-        RunGeometryAvx2(cells, col, x, y, count, lineWidth, run);
+        RunGeometryAvx2(cells, t, col, x, y, count, lineWidth, run);
         return;
     }
 #endif
-    VoronoiRunGeometryWith<PlainRanges>(cells, col, x, y, count, lineWidth, run);
+    VoronoiRunGeometryWith<PlainRanges>(cells, t, col, x, y, count, lineWidth, run);
 }
 
 } // namespace RasterTools
