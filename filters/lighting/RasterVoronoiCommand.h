@@ -10,6 +10,8 @@
 #include "pipeline/Pipeline.h"
 
 #include <algorithm>
+#include <array>
+#include <bit>
 #include <cmath>
 #include <cstring>
 #include <type_traits>
@@ -219,6 +221,22 @@ struct VoronoiSampler {
         return line;
     }
 
+    // colour's colour channels with source's alpha (the last channel). As whole values, so that the pixel
+    // stays
+    // in registers where the format allows.
+    template <class Component, int Channels, class Stored>
+    static Stored WithAlphaOf(Stored colour, Stored source) noexcept {
+        if constexpr (sizeof(Stored) == sizeof(Component) * Channels) {
+            using Components = std::array<Component, Channels>;
+            auto components = std::bit_cast<Components>(colour);
+            components[Channels - 1] = std::bit_cast<Components>(source)[Channels - 1];
+            return std::bit_cast<Stored>(components);
+        } else {
+            std::memcpy(&source, &colour, sizeof(Component) * (Channels - 1));
+            return source;
+        }
+    }
+
     // The pixels of a span go in runs of one grid column (a column changes every cell's width of pixels):
     // their geometry at once (VoronoiRunGeometry), then their colours, where a site's colour is read once per
     // run and the usual pixel, deep inside its cell and off the lines, only copies it.
@@ -270,7 +288,7 @@ struct VoronoiSampler {
             for (int r = 0; r < count; ++r) {
                 const int i = start + r;
 
-                Stored pixel = Extend::Read(image, make_int2(run.sourceX[r], run.sourceY[r]));
+                const Stored pixel = Extend::Read(image, make_int2(run.sourceX[r], run.sourceY[r]));
                 const float w = run.line[r];
                 Stored colour;
                 if (w == 1.0f) {
@@ -310,9 +328,8 @@ struct VoronoiSampler {
                     if (w != 0.0f || total != 1.0f) acc = acc * (1.0f - w) + line * w;
                     colour = Traits::FromAccumulator(Traits::Clamp(acc));
                 }
-                // The colour channels; alpha (the last) stays the source pixel's.
-                std::memcpy(&pixel, &colour, sizeof(Component) * (Channels - 1));
-                out[i] = pixel;
+
+                out[i] = WithAlphaOf<Component, Channels>(colour, pixel);
             }
             start = last + 1;
         }
