@@ -1,7 +1,8 @@
 #pragma once
-// The Voronoi command: the layer becomes irregular cells, each filled with the colour under its site, with
-// optional black border lines; alpha is kept. Also its Sample stage for the processor and its kinds of
-// render: one per layer format, source and destination alike, without or with a mask.
+// The Voronoi command: the layer becomes irregular cells, each filled with the
+// colour under its site, with optional black border lines; alpha is kept. Also
+// its Sample stage for the processor and its kinds of render: one per layer
+// format, source and destination alike, without or with a mask.
 
 #include "filters/lighting/Voronoi.h"
 #include "filters/lighting/VoronoiMath.h"
@@ -19,10 +20,11 @@
 
 namespace RasterTools {
 
-// The sites of the grid cells around one grid row: rows row - 2 .. row + 2 (only the middle three without
-// lines) and a window of columns that moves on when a pixel's neighbourhood leaves it; and the border edges
-// of the cells that turn out closest. Every value is computed by VoronoiMath as the kernel text computes it
-// per pixel, so caching changes no bit.
+// The sites of the grid cells around one grid row: rows row - 2 .. row + 2
+// (only the middle three without lines) and a window of columns that moves on
+// when a pixel's neighbourhood leaves it; and the border edges of the cells
+// that turn out closest. Every value is computed by VoronoiMath as the kernel
+// text computes it per pixel, so caching changes no bit.
 class VoronoiSpanCells {
 public:
     // Starts over unless the grid and row are those already held.
@@ -51,7 +53,8 @@ public:
                     VoronoiMath::VoronoiSite(m_Row - 2 + r, m_FirstColumn + m_Filled, m_Cell, m_Origin);
     }
 
-    // The 3 × 3 sites around grid cell (row + rowOffset, col), row-major; rowOffset is -1, 0 or 1.
+    // The 3 × 3 sites around grid cell (row + rowOffset, col), row-major;
+    // rowOffset is -1, 0 or 1.
     void Around(int rowOffset, int col, Raster::KernelMath::float2* sites) const noexcept {
         for (int r = 0; r < 3; ++r)
             for (int c = 0; c < 3; ++c)
@@ -62,7 +65,8 @@ public:
         Raster::KernelMath::float4 edges[8];
         float scales[8];
     };
-    // The bisectors between the site of grid cell (row + rowOffset, col) and its 8 neighbours' sites.
+    // The bisectors between the site of grid cell (row + rowOffset, col) and its
+    // 8 neighbours' sites.
     const Edges& EdgesOf(int rowOffset, int col) noexcept {
         const int c = col - m_FirstColumn;
         Edges& edges = m_Edges[rowOffset + 1][c];
@@ -88,20 +92,25 @@ private:
     Edges m_Edges[3][Columns];
 };
 
-// What the colour pass needs of each pixel of a run of pixels in one grid column and row: the closest of the
-// 3 × 3 sites, the border line's weight, whether the full weighing of sites is needed (another site lends
-// colour, or ties with the closest), and the source pixel under the pixel's centre (before the extend).
-// Format-free, so that one build for AVX2 serves every format.
+// What the colour pass needs of each pixel of a run of pixels in one grid
+// column and row: the closest of the 3 × 3 sites, the border line's weight,
+// whether the full weighing of sites is needed (another site lends colour, or
+// ties with the closest), and the source pixel under the pixel's centre (before
+// the extend). Format-free, so that one build for AVX2 serves every format.
+// Room for a last block of eight beyond the run, which blocks of eight may fill
+// and nothing reads.
 struct VoronoiRun {
     static constexpr int Capacity = 256;
-    int sourceX[Capacity], sourceY[Capacity];
-    int closest[Capacity];
-    float line[Capacity];
-    unsigned char blend[Capacity];
+    static constexpr int Room = Capacity + 8;
+    int sourceX[Room], sourceY[Room];
+    int closest[Room];
+    float line[Room];
+    unsigned char blend[Room];
 };
 
-// The closest of the 3 × 3 sites (x coordinates sx, squared y distances dyy) for the pixels x + i, first <= i
-// < end, and whether each needs the full weighing; VoronoiClosest's and VoronoiThreshold's floats.
+// The closest of the 3 × 3 sites (x coordinates sx, squared y distances dyy)
+// for the pixels x + i, first <= i < end, and whether each needs the full
+// weighing; VoronoiClosest's and VoronoiThreshold's floats.
 [[gnu::always_inline]] inline void VoronoiClosestScalar(const float* sx, const float* dyy, int x, int first,
                                                         int end, VoronoiRun& run) noexcept {
     using namespace VoronoiMath;
@@ -123,29 +132,63 @@ struct VoronoiRun {
         for (int s = 0; s < 9; ++s)
             near += d2[s] < threshold ? 1 : 0;
         run.closest[i] = closest;
-        // The closest is always below the threshold; a second one lends colour or ties.
+        // The closest is always below the threshold; a second one lends colour or
+        // ties.
         run.blend[i] = !(best < threshold) || near != 1;
     }
 }
 
-// The border line's weight for the pixels x + i, first <= i < end, from the 8 bisectors of their closest site
-// (midpoints ex and directions ez in x, the y terms ey = (y - midpoint y) × direction y, and the scales);
-// VoronoiBorderDistance's and VoronoiLineWeight's floats.
-[[gnu::always_inline]] inline void VoronoiLinesScalar(const float* ex, const float* ez, const float* ey,
-                                                      const float* scales, int x, int first, int end,
-                                                      float lineWidth, VoronoiRun& run) noexcept {
+// The 8 bisectors of one site's cell along a pixel row y: midpoints ex and
+// directions ez in x, the y terms ey = (y - midpoint y) × direction y, and the
+// scales.
+struct VoronoiBisectors {
+    float ex[8], ez[8], ey[8], scales[8];
+};
+// Those of the site closest (0 .. 8, row-major in the 3 × 3 cells around grid
+// column col of cells' row).
+[[gnu::always_inline]] inline void VoronoiBisectorsOf(VoronoiSpanCells& cells, int col, int closest, float py,
+                                                      VoronoiBisectors& b) noexcept {
+    const auto& edges = cells.EdgesOf(closest / 3 - 1, col - 1 + closest % 3);
+    for (int k = 0; k < 8; ++k) {
+        b.ex[k] = edges.edges[k].x;
+        b.ez[k] = edges.edges[k].z;
+        b.ey[k] = (py - edges.edges[k].y) * edges.edges[k].w;
+        b.scales[k] = edges.scales[k];
+    }
+}
+
+// The border line's weight for the pixels x + i, first <= i < end, from
+// bisectors b; VoronoiBorderDistance's and VoronoiLineWeight's floats.
+[[gnu::always_inline]] inline void VoronoiLinesOf(const VoronoiBisectors& b, int x, int first, int end,
+                                                  float lineWidth, VoronoiRun& run) noexcept {
     using namespace VoronoiMath;
     for (int i = first; i < end; ++i) {
         const float px = (float)(x + i);
-        float m = rt_fabs((px - ex[0]) * ez[0] + ey[0]) * scales[0];
+        float m = rt_fabs((px - b.ex[0]) * b.ez[0] + b.ey[0]) * b.scales[0];
         for (int k = 1; k < 8; ++k)
-            m = rt_fmin(m, rt_fabs((px - ex[k]) * ez[k] + ey[k]) * scales[k]);
+            m = rt_fmin(m, rt_fabs((px - b.ex[k]) * b.ez[k] + b.ey[k]) * b.scales[k]);
         run.line[i] = VoronoiLineWeight(m, lineWidth);
     }
 }
 
-// The source pixels under the centres of pixels (x + i, y), first <= i < end, as TransformPixelCenterToInt
-// finds them.
+// The border line's weight for the count pixels from x on, given their closest
+// sites: in stretches that share one.
+[[gnu::always_inline]] inline void VoronoiLinesScalar(VoronoiSpanCells& cells, int col, float py, int x,
+                                                      int count, float lineWidth, VoronoiRun& run) noexcept {
+    for (int i = 0; i < count;) {
+        const int closest = run.closest[i];
+        int end = i + 1;
+        while (end < count && run.closest[end] == closest)
+            ++end;
+        VoronoiBisectors b;
+        VoronoiBisectorsOf(cells, col, closest, py, b);
+        VoronoiLinesOf(b, x, i, end, lineWidth, run);
+        i = end;
+    }
+}
+
+// The source pixels under the centres of pixels (x + i, y), first <= i < end,
+// as TransformPixelCenterToInt finds them.
 [[gnu::always_inline]] inline void VoronoiSourcesScalar(const Raster::AffineTransform::Prepared& t, int x,
                                                         int y, int first, int end, VoronoiRun& run) noexcept {
     for (int i = first; i < end; ++i) {
@@ -156,10 +199,11 @@ struct VoronoiRun {
     }
 }
 
-// Fills run for the count pixels from (x, y) on, all in grid column col (which cells covers), with the same
-// floats as VoronoiMath per pixel: each site's y distance is squared once, and each bisector's y term once
-// per stretch of pixels sharing a closest site. Ranges does the per-pixel work (Closest and Lines, with the
-// parameters of VoronoiClosestScalar and VoronoiLinesScalar) and Sources (VoronoiSourcesScalar's).
+// Fills run for the count pixels from (x, y) on, all in grid column col (which
+// cells covers), with the same floats as VoronoiMath per pixel: each site's y
+// distance is squared once, and each bisector's y term once per site. Ranges
+// does the per-pixel work: Sources, Closest and Lines, with the parameters of
+// VoronoiSourcesScalar, VoronoiClosestScalar and VoronoiLinesScalar.
 template <class Ranges>
 [[gnu::always_inline]] inline void
 VoronoiRunGeometryWith(VoronoiSpanCells& cells, const Raster::AffineTransform::Prepared& t, int col, int x,
@@ -175,39 +219,26 @@ VoronoiRunGeometryWith(VoronoiSpanCells& cells, const Raster::AffineTransform::P
         dyy[s] = dy * dy;
     }
 
-    Ranges::Sources(t, x, y, 0, count, run);
-    Ranges::Closest(sx, dyy, x, 0, count, run);
+    Ranges::Sources(t, x, y, count, run);
+    Ranges::Closest(sx, dyy, x, count, run);
 
     if (!(lineWidth > 0.0f)) {
         for (int i = 0; i < count; ++i)
             run.line[i] = 0.0f;
         return;
     }
-    for (int i = 0; i < count;) {
-        const int closest = run.closest[i];
-        int end = i + 1;
-        while (end < count && run.closest[end] == closest)
-            ++end;
-        const auto& edges = cells.EdgesOf(closest / 3 - 1, col - 1 + closest % 3);
-        float ex[8], ez[8], ey[8], scales[8];
-        for (int k = 0; k < 8; ++k) {
-            ex[k] = edges.edges[k].x;
-            ez[k] = edges.edges[k].z;
-            ey[k] = (py - edges.edges[k].y) * edges.edges[k].w;
-            scales[k] = edges.scales[k];
-        }
-        Ranges::Lines(ex, ez, ey, scales, x, i, end, lineWidth, run);
-        i = end;
-    }
+    Ranges::Lines(cells, col, py, x, count, lineWidth, run);
 }
 
-// VoronoiRunGeometryWith, built for AVX2 where the processor has it (VoronoiSpans.cpp).
+// VoronoiRunGeometryWith, built for AVX2 where the processor has it
+// (VoronoiSpans.cpp).
 void VoronoiRunGeometry(VoronoiSpanCells& cells, const Raster::AffineTransform::Prepared& t, int col, int x,
                         int y, int count, float lineWidth, VoronoiRun& run) noexcept;
 
-// The cell colour of each destination pixel (VoronoiMath), blended towards the line colour by the border
-// weight, with the alpha of the source pixel under the destination pixel. Sites are read through Transform
-// and Extend; the grid lies in destination pixels.
+// The cell colour of each destination pixel (VoronoiMath), blended towards the
+// line colour by the border weight, with the alpha of the source pixel under
+// the destination pixel. Sites are read through Transform and Extend; the grid
+// lies in destination pixels.
 struct VoronoiSampler {
     struct Params {
         float block[VoronoiMath::SamplerFloatCount] = {2.0f, 0.0f, 0.0f, 0.0f};
@@ -221,9 +252,8 @@ struct VoronoiSampler {
         return line;
     }
 
-    // colour's colour channels with source's alpha (the last channel). As whole values, so that the pixel
-    // stays
-    // in registers where the format allows.
+    // colour's colour channels with source's alpha (the last channel). As whole
+    // values, so that the pixel stays in registers where the format allows.
     template <class Component, int Channels, class Stored>
     static Stored WithAlphaOf(Stored colour, Stored source) noexcept {
         if constexpr (sizeof(Stored) == sizeof(Component) * Channels) {
@@ -237,9 +267,10 @@ struct VoronoiSampler {
         }
     }
 
-    // The pixels of a span go in runs of one grid column (a column changes every cell's width of pixels):
-    // their geometry at once (VoronoiRunGeometry), then their colours, where a site's colour is read once per
-    // run and the usual pixel, deep inside its cell and off the lines, only copies it.
+    // The pixels of a span go in runs of one grid column (a column changes every
+    // cell's width of pixels): their geometry at once (VoronoiRunGeometry), then
+    // their colours, where a site's colour is read once per run and the usual
+    // pixel, deep inside its cell and off the lines, only copies it.
     template <class Transform, class Extend, class Image>
     static void SampleSpan(const Image& image, const Raster::PreparedTransform<Transform>& t,
                            const Params& params, int x0, int y, int n, typename Image::Stored* out) noexcept {
@@ -259,7 +290,8 @@ struct VoronoiSampler {
         const int row = VoronoiCellIndex(py, origin.y, cell);
         const Accumulator line = LineColour<F>();
         const Stored lineStored = Traits::FromAccumulator(Traits::Clamp(line));
-        // Kept between the spans of a thread: the next row of a tile mostly lies in the same grid row.
+        // Kept between the spans of a thread: the next row of a tile mostly lies in
+        // the same grid row.
         thread_local VoronoiSpanCells cells;
         cells.Use(row, cell, origin, lines);
         VoronoiRun run;
@@ -281,7 +313,8 @@ struct VoronoiSampler {
             VoronoiRunGeometry(cells, t, col, x0 + start, y, count, lineWidth, run);
             float2 around[9];
             cells.Around(0, col, around);
-            // The sum of one site's colour with the weight 1, and that as a pixel, when first needed.
+            // The sum of one site's colour with the weight 1, and that as a pixel,
+            // when first needed.
             Accumulator single[9];
             Stored inside[9];
             bool known[9] = {};
@@ -322,8 +355,8 @@ struct VoronoiSampler {
                             total += weight;
                         }
                     }
-                    // Dividing by 1, and then mixing in none of the line, change no bit of a sum that starts
-                    // at +0 (it is never -0).
+                    // Dividing by 1, and then mixing in none of the line, change no bit
+                    // of a sum that starts at +0 (it is never -0).
                     Accumulator acc = total == 1.0f ? sum : sum / total;
                     if (w != 0.0f || total != 1.0f) acc = acc * (1.0f - w) + line * w;
                     colour = Traits::FromAccumulator(Traits::Clamp(acc));
@@ -338,8 +371,9 @@ struct VoronoiSampler {
 
 namespace VoronoiStages {
 
-// The view's inverse takes sites and pixels to the source; the layer's edge pixels continue outwards, so
-// cells whose site lies beyond the layer take the nearest edge colour.
+// The view's inverse takes sites and pixels to the source; the layer's edge
+// pixels continue outwards, so cells whose site lies beyond the layer take the
+// nearest edge colour.
 template <Raster::PixelFormat F>
 using Plain = PipelineStages<Raster::Copy, Raster::IdentityMask, VoronoiSampler, Raster::AffineTransform,
                              Raster::Safe, FormatList<F>, FormatList<F>>;
@@ -349,8 +383,8 @@ using Masked = PipelineStages<Raster::Copy, Raster::BitmapMask, VoronoiSampler, 
 
 } // namespace VoronoiStages
 
-// The sampler's kernel text, per source format and language (null for an unknown language or a format that
-// is not a layer format).
+// The sampler's kernel text, per source format and language (null for an
+// unknown language or a format that is not a layer format).
 template <>
 struct StageText<VoronoiSampler> {
     static const char* Get(HardwareKernelLanguage language, Raster::PixelFormat source);
@@ -363,8 +397,8 @@ public:
     template <Raster::PixelFormat F>
     using MaskedStages = VoronoiStages::Masked<F>;
 
-    // The largest cell in output pixels: far beyond any layer, and small enough that the grid's
-    // single-precision arithmetic keeps whole pixels.
+    // The largest cell in output pixels: far beyond any layer, and small enough
+    // that the grid's single-precision arithmetic keeps whole pixels.
     static constexpr double CellLimit = 16777216.0;
 
     // For loading: Load then sets the fields.
@@ -387,22 +421,25 @@ public:
     // Cells of zero size are no effect at all.
     bool DoesAnything() const noexcept { return std::fabs(m_Params.size) > 1e-6; }
 
-    // A pixel reads sites up to a cell away, and pixels beyond the layer take its cells too: both areas grow
-    // by the size, in whole pixels.
+    // A pixel reads sites up to a cell away, and pixels beyond the layer take its
+    // cells too: both areas grow by the size, in whole pixels.
     static double Margin(const VoronoiParameters& params) noexcept { return std::ceil(params.size); }
 
-    // How an affine map scales lengths here: the length of its image of (1, 1), over √2.
+    // How an affine map scales lengths here: the length of its image of (1, 1),
+    // over √2.
     static double Scale(const Raster::AffineTransform::Params& transform) noexcept {
         const auto& m = transform.m;
         return std::sqrt(((m[0] + m[1]) * (m[0] + m[1]) + (m[3] + m[4]) * (m[3] + m[4])) * 0.5);
     }
-    // The layer was transformed: the cells scale with it. The line width, a percentage, stays.
+    // The layer was transformed: the cells scale with it. The line width, a
+    // percentage, stays.
     void ApplyTransform(const Raster::AffineTransform::Params& transform) {
         m_Params.size *= Scale(transform);
         BoundParameters(m_Params, VoronoiFilter::kParameters);
     }
-    // The converse: the size divided by the scale of the inverse map. False, changing nothing, when that
-    // scale is 0 (a singular map, whose inverse collapses) or not a number.
+    // The converse: the size divided by the scale of the inverse map. False,
+    // changing nothing, when that scale is 0 (a singular map, whose inverse
+    // collapses) or not a number.
     bool ApplyInverseTransform(const Raster::AffineTransform::Params& transform) {
         const double scale = Scale(Raster::AffineTransform::Invert(transform));
         if (!(scale > 0.0) || !std::isfinite(scale)) return false;
@@ -411,10 +448,11 @@ public:
         return true;
     }
 
-    // The sampler block for a render through view (source pixels to output pixels): the cell in output
-    // pixels (the size over the scale of the view's inverse, at least 2 and at most CellLimit, which a
-    // singular view, whose inverse has the scale 0, reaches), the line
-    // width in output pixels, and the view's translation as the grid's origin.
+    // The sampler block for a render through view (source pixels to output
+    // pixels): the cell in output pixels (the size over the scale of the view's
+    // inverse, at least 2 and at most CellLimit, which a singular view, whose
+    // inverse has the scale 0, reaches), the line width in output pixels, and the
+    // view's translation as the grid's origin.
     VoronoiSampler::Params GetSamplerParams(const Raster::AffineTransform::Params& view) const noexcept {
         double cell = m_Params.size / Scale(Raster::AffineTransform::Invert(view));
         if (!(cell >= 2.0)) cell = 2.0;
