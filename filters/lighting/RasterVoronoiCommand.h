@@ -20,11 +20,10 @@
 
 namespace RasterTools {
 
-// The sites of the grid cells around one grid row: rows row - 2 .. row + 2
-// (only the middle three without lines) and a window of columns that moves on
-// when a pixel's neighbourhood leaves it; and the border edges of the cells
-// that turn out closest. Every value is computed by VoronoiMath as the kernel
-// text computes it per pixel, so caching changes no bit.
+// The sites of the grid cells around one grid row: rows row - 2 .. row + 2 (only the middle three without
+// lines) and a window of columns that moves on when a pixel's neighbourhood leaves it; and the border edges
+// of the cells that turn out closest. Every value is computed by VoronoiMath as the kernel text computes it
+// per pixel, so caching changes no bit.
 class VoronoiSpanCells {
 public:
     // Starts over unless the grid and row are those already held.
@@ -53,8 +52,7 @@ public:
                     VoronoiMath::VoronoiSite(m_Row - 2 + r, m_FirstColumn + m_Filled, m_Cell, m_Origin);
     }
 
-    // The 3 × 3 sites around grid cell (row + rowOffset, col), row-major;
-    // rowOffset is -1, 0 or 1.
+    // The 3 × 3 sites around grid cell (row + rowOffset, col), row-major; rowOffset is -1, 0 or 1.
     void Around(int rowOffset, int col, Raster::KernelMath::float2* sites) const noexcept {
         for (int r = 0; r < 3; ++r)
             for (int c = 0; c < 3; ++c)
@@ -65,8 +63,7 @@ public:
         Raster::KernelMath::float4 edges[8];
         float scales[8];
     };
-    // The bisectors between the site of grid cell (row + rowOffset, col) and its
-    // 8 neighbours' sites.
+    // The bisectors between the site of grid cell (row + rowOffset, col) and its 8 neighbours' sites.
     const Edges& EdgesOf(int rowOffset, int col) noexcept {
         const int c = col - m_FirstColumn;
         Edges& edges = m_Edges[rowOffset + 1][c];
@@ -92,13 +89,11 @@ private:
     Edges m_Edges[3][Columns];
 };
 
-// What the colour pass needs of each pixel of a run of pixels in one grid
-// column and row: the closest of the 3 × 3 sites, the border line's weight,
-// whether the full weighing of sites is needed (another site lends colour, or
-// ties with the closest), and the source pixel under the pixel's centre (before
-// the extend). Format-free, so that one build for AVX2 serves every format.
-// Room for a last block of eight beyond the run, which blocks of eight may fill
-// and nothing reads.
+// What the colour pass needs of each pixel of a run of pixels in one grid column and row: the closest of the
+// 3 × 3 sites, the border line's weight, whether the full weighing of sites is needed (another site lends
+// colour, or ties with the closest), and the source pixel under the pixel's centre (before the extend).
+// Format-free, so that one build for AVX2 serves every format. Room for a last block of eight beyond the run,
+// which blocks of eight may fill and nothing reads.
 struct VoronoiRun {
     static constexpr int Capacity = 256;
     static constexpr int Room = Capacity + 8;
@@ -108,9 +103,8 @@ struct VoronoiRun {
     unsigned char blend[Room];
 };
 
-// The closest of the 3 × 3 sites (x coordinates sx, squared y distances dyy)
-// for the pixels x + i, first <= i < end, and whether each needs the full
-// weighing; VoronoiClosest's and VoronoiThreshold's floats.
+// The closest of the 3 × 3 sites (x coordinates sx, squared y distances dyy) for the pixels x + i, first <= i
+// < end, and whether each needs the full weighing; VoronoiClosest's and VoronoiThreshold's floats.
 [[gnu::always_inline]] inline void VoronoiClosestScalar(const float* sx, const float* dyy, int x, int first,
                                                         int end, VoronoiRun& run) noexcept {
     using namespace VoronoiMath;
@@ -132,20 +126,18 @@ struct VoronoiRun {
         for (int s = 0; s < 9; ++s)
             near += d2[s] < threshold ? 1 : 0;
         run.closest[i] = closest;
-        // The closest is always below the threshold; a second one lends colour or
-        // ties.
+        // The closest lies below the threshold (where rounding says otherwise, the full weighing decides); a
+        // second site below it lends colour or ties.
         run.blend[i] = !(best < threshold) || near != 1;
     }
 }
 
-// The 8 bisectors of one site's cell along a pixel row y: midpoints ex and
-// directions ez in x, the y terms ey = (y - midpoint y) × direction y, and the
-// scales.
+// The 8 bisectors of one site's cell along a pixel row y: midpoints ex and directions ez in x, the y terms ey
+// = (y - midpoint y) × direction y, and the scales.
 struct VoronoiBisectors {
     float ex[8], ez[8], ey[8], scales[8];
 };
-// Those of the site closest (0 .. 8, row-major in the 3 × 3 cells around grid
-// column col of cells' row).
+// Those of the site closest (0 .. 8, row-major in the 3 × 3 cells around grid column col of cells' row).
 [[gnu::always_inline]] inline void VoronoiBisectorsOf(VoronoiSpanCells& cells, int col, int closest, float py,
                                                       VoronoiBisectors& b) noexcept {
     const auto& edges = cells.EdgesOf(closest / 3 - 1, col - 1 + closest % 3);
@@ -157,8 +149,8 @@ struct VoronoiBisectors {
     }
 }
 
-// The border line's weight for the pixels x + i, first <= i < end, from
-// bisectors b; VoronoiBorderDistance's and VoronoiLineWeight's floats.
+// The border line's weight for the pixels x + i, first <= i < end, from bisectors b; VoronoiBorderDistance's
+// and VoronoiLineWeight's floats.
 [[gnu::always_inline]] inline void VoronoiLinesOf(const VoronoiBisectors& b, int x, int first, int end,
                                                   float lineWidth, VoronoiRun& run) noexcept {
     using namespace VoronoiMath;
@@ -171,8 +163,8 @@ struct VoronoiBisectors {
     }
 }
 
-// The border line's weight for the count pixels from x on, given their closest
-// sites: in stretches that share one.
+// The border line's weight for the count pixels from x on, given their closest sites: in stretches that share
+// one.
 [[gnu::always_inline]] inline void VoronoiLinesScalar(VoronoiSpanCells& cells, int col, float py, int x,
                                                       int count, float lineWidth, VoronoiRun& run) noexcept {
     for (int i = 0; i < count;) {
@@ -187,8 +179,8 @@ struct VoronoiBisectors {
     }
 }
 
-// The source pixels under the centres of pixels (x + i, y), first <= i < end,
-// as TransformPixelCenterToInt finds them.
+// The source pixels under the centres of pixels (x + i, y), first <= i < end, as TransformPixelCenterToInt
+// finds them.
 [[gnu::always_inline]] inline void VoronoiSourcesScalar(const Raster::AffineTransform::Prepared& t, int x,
                                                         int y, int first, int end, VoronoiRun& run) noexcept {
     for (int i = first; i < end; ++i) {
@@ -199,10 +191,9 @@ struct VoronoiBisectors {
     }
 }
 
-// Fills run for the count pixels from (x, y) on, all in grid column col (which
-// cells covers), with the same floats as VoronoiMath per pixel: each site's y
-// distance is squared once, and each bisector's y term once per site. Ranges
-// does the per-pixel work: Sources, Closest and Lines, with the parameters of
+// Fills run for the count pixels from (x, y) on, all in grid column col (which cells covers), with the same
+// floats as VoronoiMath per pixel: each site's y distance is squared once, and each bisector's y term once
+// per site. Ranges does the per-pixel work: Sources, Closest and Lines, with the parameters of
 // VoronoiSourcesScalar, VoronoiClosestScalar and VoronoiLinesScalar.
 template <class Ranges>
 [[gnu::always_inline]] inline void
@@ -230,15 +221,13 @@ VoronoiRunGeometryWith(VoronoiSpanCells& cells, const Raster::AffineTransform::P
     Ranges::Lines(cells, col, py, x, count, lineWidth, run);
 }
 
-// VoronoiRunGeometryWith, built for AVX2 where the processor has it
-// (VoronoiSpans.cpp).
+// VoronoiRunGeometryWith, built for AVX2 where the processor has it (VoronoiSpans.cpp).
 void VoronoiRunGeometry(VoronoiSpanCells& cells, const Raster::AffineTransform::Prepared& t, int col, int x,
                         int y, int count, float lineWidth, VoronoiRun& run) noexcept;
 
-// The cell colour of each destination pixel (VoronoiMath), blended towards the
-// line colour by the border weight, with the alpha of the source pixel under
-// the destination pixel. Sites are read through Transform and Extend; the grid
-// lies in destination pixels.
+// The cell colour of each destination pixel (VoronoiMath), blended towards the line colour by the border
+// weight, with the alpha of the source pixel under the destination pixel. Sites are read through Transform
+// and Extend; the grid lies in destination pixels.
 struct VoronoiSampler {
     struct Params {
         float block[VoronoiMath::SamplerFloatCount] = {2.0f, 0.0f, 0.0f, 0.0f};
@@ -252,8 +241,8 @@ struct VoronoiSampler {
         return line;
     }
 
-    // colour's colour channels with source's alpha (the last channel). As whole
-    // values, so that the pixel stays in registers where the format allows.
+    // colour's colour channels with source's alpha (the last channel). As whole values, so that the pixel
+    // stays in registers where the format allows.
     template <class Component, int Channels, class Stored>
     static Stored WithAlphaOf(Stored colour, Stored source) noexcept {
         if constexpr (sizeof(Stored) == sizeof(Component) * Channels) {
@@ -267,10 +256,9 @@ struct VoronoiSampler {
         }
     }
 
-    // The pixels of a span go in runs of one grid column (a column changes every
-    // cell's width of pixels): their geometry at once (VoronoiRunGeometry), then
-    // their colours, where a site's colour is read once per run and the usual
-    // pixel, deep inside its cell and off the lines, only copies it.
+    // The pixels of a span go in runs of one grid column (a column changes every cell's width of pixels):
+    // their geometry at once (VoronoiRunGeometry), then their colours, where a site's colour is read once per
+    // run and the usual pixel, deep inside its cell and off the lines, only copies it.
     template <class Transform, class Extend, class Image>
     static void SampleSpan(const Image& image, const Raster::PreparedTransform<Transform>& t,
                            const Params& params, int x0, int y, int n, typename Image::Stored* out) noexcept {
@@ -290,8 +278,7 @@ struct VoronoiSampler {
         const int row = VoronoiCellIndex(py, origin.y, cell);
         const Accumulator line = LineColour<F>();
         const Stored lineStored = Traits::FromAccumulator(Traits::Clamp(line));
-        // Kept between the spans of a thread: the next row of a tile mostly lies in
-        // the same grid row.
+        // Kept between the spans of a thread: the next row of a tile mostly lies in the same grid row.
         thread_local VoronoiSpanCells cells;
         cells.Use(row, cell, origin, lines);
         VoronoiRun run;
@@ -313,14 +300,12 @@ struct VoronoiSampler {
             VoronoiRunGeometry(cells, t, col, x0 + start, y, count, lineWidth, run);
             float2 around[9];
             cells.Around(0, col, around);
-            // The sum of one site's colour with the weight 1, and that as a pixel,
-            // when first needed.
+            // The sum of one site's colour with the weight 1, and that as a pixel, when first needed.
             Accumulator single[9];
             Stored inside[9];
             bool known[9] = {};
             for (int r = 0; r < count; ++r) {
                 const int i = start + r;
-
                 const Stored pixel = Extend::Read(image, make_int2(run.sourceX[r], run.sourceY[r]));
                 const float w = run.line[r];
                 Stored colour;
@@ -355,13 +340,13 @@ struct VoronoiSampler {
                             total += weight;
                         }
                     }
-                    // Dividing by 1, and then mixing in none of the line, change no bit
-                    // of a sum that starts at +0 (it is never -0).
+                    // Dividing by 1, and then mixing in none of the line, change no bit of a sum that starts
+                    // at +0 (it is never -0).
                     Accumulator acc = total == 1.0f ? sum : sum / total;
                     if (w != 0.0f || total != 1.0f) acc = acc * (1.0f - w) + line * w;
                     colour = Traits::FromAccumulator(Traits::Clamp(acc));
                 }
-
+                // The colour channels; alpha (the last) stays the source pixel's.
                 out[i] = WithAlphaOf<Component, Channels>(colour, pixel);
             }
             start = last + 1;

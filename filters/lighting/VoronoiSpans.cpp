@@ -1,9 +1,7 @@
-// The Voronoi runs' geometry, built for AVX2 and for any x86-64: blocks of
-// eight pixels at once for the source positions, the distances to the sites and
-// to the bisectors, with the same floats as the portable loops (no fused
-// multiply-add, the same order of operations, and minima that treat
-// not-a-number as rt_fmin and rt_fmax do). A last block may reach past the run
-// into VoronoiRun's room; what it puts there is unused.
+// The Voronoi runs' geometry, built for AVX2 and for any x86-64: blocks of eight pixels at once for the
+// source positions, the distances to the sites and to the bisectors, with the same floats as the portable
+// loops (no fused multiply-add, the same order of operations, and minima that treat not-a-number as rt_fmin
+// and rt_fmax do). A last block may reach past the run into VoronoiRun's room; what it puts there is unused.
 #include "filters/lighting/RasterVoronoiCommand.h"
 #include "host/kernel/Simd.h"
 
@@ -36,14 +34,12 @@ RT_TARGET_AVX2 inline __m256 PixelsX(int x, int i) noexcept {
         _mm256_add_epi32(_mm256_set1_epi32(x + i), _mm256_setr_epi32(0, 1, 2, 3, 4, 5, 6, 7)));
 }
 
-// rt_fmin(a, b): a where b is not a number, else the smaller with a kept on
-// ties.
+// rt_fmin(a, b): a where b is not a number, else the smaller with a kept on ties.
 RT_TARGET_AVX2 inline __m256 Fmin(__m256 a, __m256 b) noexcept {
     return _mm256_blendv_ps(_mm256_min_ps(a, b), a, _mm256_cmp_ps(b, b, _CMP_UNORD_Q));
 }
 
-// floor, then rt_sat_int: not-a-number to 0, beyond the ints to the nearest
-// one.
+// floor, then rt_sat_int: not-a-number to 0, beyond the ints to the nearest one.
 RT_TARGET_AVX2 inline __m256i FloorToInt(__m256 v) noexcept {
     const __m256 whole = _mm256_floor_ps(v);
     __m256i r = _mm256_cvttps_epi32(whole); // INT_MIN for what lies beyond
@@ -61,9 +57,8 @@ RT_TARGET_AVX2 inline __m256 BisectorDistance(__m256 px, float ex, float ez, flo
     return _mm256_mul_ps(_mm256_and_ps(along, magnitude), _mm256_set1_ps(scale));
 }
 
-// VoronoiLineWeight of VoronoiBorderDistance: 1 - rt_fmin(rt_fmax(m - w / 2 +
-// 0.5, 0), 1); max_ps and min_ps keep the second operand where the first is not
-// a number, as rt_fmax and rt_fmin against a number do.
+// VoronoiLineWeight of VoronoiBorderDistance: 1 - rt_fmin(rt_fmax(m - w / 2 + 0.5, 0), 1); max_ps and min_ps
+// keep the second operand where the first is not a number, as rt_fmax and rt_fmin against a number do.
 RT_TARGET_AVX2 inline __m256 LineWeight(const VoronoiBisectors& b, __m256 px, float lineWidth) noexcept {
     __m256 m = BisectorDistance(px, b.ex[0], b.ez[0], b.ey[0], b.scales[0]);
     for (int k = 1; k < 8; ++k)
@@ -75,8 +70,7 @@ RT_TARGET_AVX2 inline __m256 LineWeight(const VoronoiBisectors& b, __m256 px, fl
 }
 
 struct Avx2Ranges {
-    // TransformPixelCenterToInt: the centre (x + 0.5, y + 0.5) through x·p0 +
-    // y·p1 + p2, x·p3 + y·p4 + p5.
+    // TransformPixelCenterToInt: the centre (x + 0.5, y + 0.5) through x·p0 + y·p1 + p2, x·p3 + y·p4 + p5.
     RT_TARGET_AVX2 static void Sources(const Raster::AffineTransform::Prepared& t, int x, int y, int count,
                                        VoronoiRun& run) noexcept {
         const __m256 cy = _mm256_set1_ps((float)y + 0.5f);
@@ -119,8 +113,7 @@ struct Avx2Ranges {
                 _mm256_and_si256(_mm256_castps_si256(_mm256_cmp_ps(best, threshold, _CMP_LT_OQ)),
                                  _mm256_cmpeq_epi32(near, _mm256_set1_epi32(1)));
             _mm256_storeu_si256(reinterpret_cast<__m256i*>(run.closest + i), closest);
-            // alone is all ones or zero per lane: its low bytes, inverted, are the
-            // eight flags.
+            // alone is all ones or zero per lane: its low bytes, inverted, are the eight flags.
             const __m256i blend = _mm256_andnot_si256(alone, _mm256_set1_epi32(1));
             const __m128i words =
                 _mm_packus_epi32(_mm256_castsi256_si128(blend), _mm256_extracti128_si256(blend, 1));
@@ -128,9 +121,8 @@ struct Avx2Ranges {
         }
     }
 
-    // A block of eight whose pixels have different closest sites takes each
-    // site's weights in turn for the lanes that have it; the bisectors of each
-    // site are found once per run.
+    // A block of eight whose pixels have different closest sites takes each site's weights in turn for the
+    // lanes that have it; the bisectors of each site are found once per run.
     RT_TARGET_AVX2 static void Lines(VoronoiSpanCells& cells, int col, float py, int x, int count,
                                      float lineWidth, VoronoiRun& run) noexcept {
         VoronoiBisectors bisectors[9];
