@@ -149,10 +149,11 @@ gegl_command() {
   # A distant light over the image's own relief (the image again as the height map).
   lighting-*) echo "$env gegl -i $input -o $2 -- gegl:bump-map azimuth=135 elevation=30 depth=5 aux=[ gegl:load path=$input ]" ;;
   # Cells of 32 pixels: mosaic's tiles (with its grout lines), cubism's squares, and the cell noise pattern
-  # rendered over the image's area.
+  # rendered over the image's area. The noise is a source without bounds, so it is cropped to the image's size
+  # (without the crop gegl goes on rendering an endless plane and the run never ends).
   voronoi-mosaic) echo "$env gegl -i $input -o $2 -- gegl:mosaic tile-size=32" ;;
   voronoi-cubism) echo "$env gegl -i $input -o $2 -- gegl:cubism tile-size=32" ;;
-  voronoi-cellnoise) echo "$env gegl -i $input -o $2 -- gegl:cell-noise scale=0.03125" ;;
+  voronoi-cellnoise) echo "$env gegl -i $input -o $2 -- gegl:cell-noise scale=0.03125 gegl:crop width=$size height=$size" ;;
   esac
 }
 # TOOLS (default all four) picks the tools, e.g. TOOLS="rastertools vips" to leave out the slowest.

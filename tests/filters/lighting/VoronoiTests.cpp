@@ -22,12 +22,14 @@
 
 #include "filters/Catalogue.h"
 #include "filters/lighting/RasterVoronoiCommand.h"
+#include "host/kernel/Simd.h"
 
 #include <algorithm>
 #include <cmath>
 #include <cstdint>
 #include <cstring>
 #include <limits>
+#include <vector>
 
 namespace {
 
@@ -409,6 +411,52 @@ TEST(VoronoiCommand, HostileValuesAreBoundedAndRenderAlikeOnBothPaths) {
         const auto difference = Compare(*processor, *onDevice);
         EXPECT_FALSE(difference) << "size " << c.size << ": " << difference->Describe();
     }
+}
+
+// The processor works along a row in runs of one grid column, eight pixels at a time where it can, and keeps
+// the sites between rows. Rows far wider than the cells (the cached columns move on many times), cells wider
+// than a run, and a shifted view whose column 0 is two cells wide (truncation toward zero): the SIMD and
+// plain builds and the device give the same pixels, and a render after other ones gives the same as before.
+TEST(VoronoiRender, WideRowsAndLongRunsAgreeOnEveryPath) {
+    const auto source = PipelineTest::MakeImage(PixelFormat::RGBA8, 700, 24, 5u);
+    const auto device = PipelineTest::OpenCLDevice();
+    const struct {
+        double size, width;
+        PipelineTest::View view;
+    } cases[] = {
+        {2.0, 100.0, {}},
+        {2.5, 0.0, {}},
+        {300.0, 10.0, {}},
+        {9.0, 35.0, {{}, Affine(1.0, 0.0, 320.25, 0.0, 1.0, 4.5)}},
+    };
+    struct SimdOn {
+        ~SimdOn() { Kernel::SetSimdEnabled(true); }
+    } restore;
+    std::vector<Kernel::Counted<Raster::DynamicBuffer>> first;
+    for (const int round : {0, 1})
+        for (const auto& c : cases) {
+            SCOPED_TRACE(::testing::Message() << "size " << c.size << " line width " << c.width);
+            const auto command = MakeVoronoi(c.size, c.width);
+            Kernel::SetSimdEnabled(true);
+            const auto simd = PipelineTest::Render(*command, source, 0, nullptr, c.view);
+            Kernel::SetSimdEnabled(false);
+            const auto plain = PipelineTest::Render(*command, source, 0, nullptr, c.view);
+            Kernel::SetSimdEnabled(true);
+            ASSERT_TRUE(simd && plain);
+            auto difference = Compare(*simd, *plain);
+            EXPECT_FALSE(difference) << "SIMD and plain: " << difference->Describe();
+            if (round == 0) {
+                first.push_back(simd);
+            } else {
+                difference = Compare(*first[std::size_t(&c - cases)], *simd);
+                EXPECT_FALSE(difference) << "rendered again: " << difference->Describe();
+            }
+            if (!device) continue;
+            const auto onDevice = PipelineTest::Render(*command, source, 0, device, c.view);
+            ASSERT_TRUE(onDevice);
+            difference = Compare(*simd, *onDevice);
+            EXPECT_FALSE(difference) << "processor and device: " << difference->Describe();
+        }
 }
 
 TEST(VoronoiCatalogue, TheFilterIsRegisteredWithItsCodes) {
