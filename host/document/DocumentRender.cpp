@@ -169,17 +169,28 @@ FlattenResult FlattenDocument(const Document& document, const FlattenOptions& op
                 continue;
             }
             // The filter sees the composite in the document's format, as it would see a layer of it: integer
-            // formats get their own rounding and clamping, not the working floats'.
-            auto beneath = format == kWorking ? canvas : Raster::DynamicBuffer::Create(width, height, format);
+            // formats get their own rounding and clamping, not the working floats'. Where the document's
+            // profiles give that format's numbers their meaning (Lab or CMYK of a profiled picture), both
+            // ways go through them, as the flattened image does.
+            const bool profiled =
+                format != kWorking && Raster::ICCManager::NeedsProfileConversion(kWorking, canvasProfiles,
+                                                                                 format, documentProfiles);
+            std::string why;
+            auto beneath = format == kWorking ? canvas
+                           : profiled ? Raster::ICCManager::ConvertImage(*canvas, canvasProfiles, format,
+                                                                         documentProfiles, why)
+                                      : Raster::DynamicBuffer::Create(width, height, format);
             auto destination = Raster::DynamicBuffer::Create(width, height, format);
             if (!beneath || !destination) {
-                result.error = "not enough memory to render live filter layer \"" + node.GetName() + "\"";
+                result.error = "cannot render live filter layer \"" + node.GetName() +
+                               "\": " + (why.empty() ? std::string("not enough memory") : why);
                 return result;
             }
             const Kernel::RectT<double> bounds{0.0, 0.0, double(width), double(height)};
             // All of it first: the filter may read beyond the tile it renders.
-            const double share = beneath == canvas ? 0.0 : 0.5 / steps;
-            if (beneath != canvas)
+            const bool converts = beneath != canvas && !profiled;
+            const double share = converts ? 0.5 / steps : 0.0;
+            if (converts)
                 rendered =
                     RenderStep(area, options, double(i) / steps, share, [&](const Kernel::RectT<int>& tile) {
                         ConvertTile(*canvas, *beneath, tile);
@@ -190,11 +201,20 @@ FlattenResult FlattenDocument(const Document& document, const FlattenOptions& op
                                                   populator->PrepareSpanPopulator(
                                                       beneath, 0, bounds, Raster::AffineTransform::Params{},
                                                       tile, destination, abort);
-                                                  if (format != kWorking)
-                                                      ConvertTile(*destination, *canvas, tile);
+                                                  if (converts) ConvertTile(*destination, *canvas, tile);
                                                   return !Kernel::IsAborted(options.abort);
                                               });
-            if (format == kWorking) canvas = std::move(destination);
+            if (format == kWorking) {
+                canvas = std::move(destination);
+            } else if (profiled && rendered) {
+                auto back = Raster::ICCManager::ConvertImage(*destination, documentProfiles, kWorking,
+                                                             canvasProfiles, why);
+                if (!back) {
+                    result.error = "cannot render live filter layer \"" + node.GetName() + "\": " + why;
+                    return result;
+                }
+                canvas = std::move(back);
+            }
         }
         if (!rendered || Kernel::IsAborted(options.abort)) {
             result.error = "the render was aborted";

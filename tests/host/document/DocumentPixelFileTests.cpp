@@ -362,3 +362,33 @@ TEST(DocumentColour, FlatteningComposesInTheDocumentsProfileAndConvertsThroughIt
     EXPECT_NEAR(pixel[2] / 65535.0, 0.10, 0.05);
     EXPECT_EQ(pixel[3], 65535);
 }
+
+TEST(DocumentColour, LiveLayersSeeTheDocumentsColoursThroughItsProfile) {
+    // A live invert over a ProPhoto layer, flattened to Lab: the filter inverts the Lab that lcms2 gives for
+    // ProPhoto, not the sRGB formula's reading of the same numbers.
+    auto document = Kernel::MakeCounted<Document>();
+    auto wide =
+        Kernel::MakeCounted<RasterNode>("wide", MakeFilled(4, 3, PixelFormat::RGBA16, {0.2, 0.55, 0.35, 1}));
+    wide->SetColourProfile(ProPhoto());
+    document->InsertLayer(0, wide);
+    document->InsertLayer(1, Kernel::MakeCounted<FilterRasterNode>(
+                                 "invert", Kernel::Counted<RasterDevicePreviewableFilterLayerCommand>(
+                                               new InvertCommand(true))));
+    std::string error;
+    Raster::ColourProfiles prophoto;
+    prophoto.Add(ProPhoto());
+    const auto lab =
+        Raster::ICCManager::ConvertImage(*wide->GetPixels(), prophoto, PixelFormat::LabA16, {}, error);
+    ASSERT_TRUE(lab) << error;
+    const FlattenResult flat = FlattenDocument(*document, {.format = PixelFormat::LabA16});
+    ASSERT_TRUE(flat.image) << flat.error;
+    for (int y = 0; y < 3; ++y)
+        for (int x = 0; x < 4; ++x) {
+            const std::uint16_t* expected = lab->Row<std::uint16_t>(y) + 4 * x;
+            const std::uint16_t* got = flat.image->Row<std::uint16_t>(y) + 4 * x;
+            for (int c = 0; c < 3; ++c)
+                EXPECT_NEAR(got[c], 65535 - expected[c], 4)
+                    << "pixel " << x << ", " << y << ", component " << c;
+            EXPECT_EQ(got[3], 65535);
+        }
+}

@@ -81,6 +81,7 @@ void InvertCommand::PrepareSpanPopulator(Kernel::Counted<Raster::DynamicBuffer> 
     case Raster::PixelFormat::RGBA8:
         return InvertRows<std::uint8_t>(*source, *destination, rect, 255);
     case Raster::PixelFormat::RGBA16:
+    case Raster::PixelFormat::LabA16:
         return InvertRows<std::uint16_t>(*source, *destination, rect, 65535);
     case Raster::PixelFormat::RGBAUF:
         return InvertRows<float>(*source, *destination, rect, 1.0f);
