@@ -1,6 +1,8 @@
 #pragma once
-// The lighting filter's parameters, declared once for its tool and command: the surface's response to light
-// and one light source.
+// The lighting filter's parameter table, declared once for its tool, command line and panels: the surface's
+// response to light and the current light source, in degrees. The command's whole state, with every light,
+// colours and the bump map, is a LightingParams (LightingParams.h); this table is its view of the first
+// light.
 
 #include "frame/Parameters.h"
 #include "host/document/ToolID.h"
@@ -53,6 +55,8 @@ struct LightingFilter {
     static constexpr std::string_view kHint = "|DRAG| handles to position lights.";
     static constexpr ToolID kToolID = ToolID::Lighting;
     static constexpr double kDragScale = 0.0; // a drag moves the light's centre
+    // 2: the command saves its whole LightingParams (colours, bump map, every light); 1 was this table.
+    static constexpr unsigned short kClassVersion = 2;
 
     // Every kind of light over a relief both ways, off-centre, for the conformance tests (the table's corners
     // put the light far away or flatten the relief).
