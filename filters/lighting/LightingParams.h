@@ -10,6 +10,9 @@
 #include "host/renderer/Colour.h"
 
 #include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
 #include <vector>
 
 namespace RasterTools {
@@ -91,5 +94,16 @@ public:
     // Equal values, the bump map compared by identity.
     friend bool operator==(const LightingParams&, const LightingParams&) = default;
 };
+
+// A LightingParams as its JSON form gives it, with the bump map's image file (empty: none), which the caller
+// reads.
+struct LightingJson {
+    LightingParams params;
+    std::string bumpFile;
+};
+
+// The JSON form (the README's lighting section): nothing, with error saying where and why, for text that is
+// not a JSON object, a key the form does not have, or a value of the wrong kind or beyond its range.
+std::optional<LightingJson> ReadLightingParamsJson(std::string_view text, std::string& error);
 
 } // namespace RasterTools

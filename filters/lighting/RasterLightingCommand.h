@@ -30,6 +30,11 @@ public:
         SetParams(params);
     }
 
+    // The catalogue's form for the command line: the table's values and the text flags (see kTextFlags).
+    static Kernel::Counted<RasterCommand>
+    MakeCommandWithText(bool liveEffect, const std::vector<ParameterValue>& values,
+                        const std::vector<std::pair<std::string, std::string>>& texts, std::string& error);
+
     // The whole state: the table's values (which panels may have changed) over the first light.
     LightingParams GetParams() const {
         LightingParams params = m_Lighting;
