@@ -84,11 +84,13 @@ DeviceSteps::DeviceSteps(const RenderTarget& target, const Kernel::RectT<int>& r
     const Kernel::Counted<Raster::HardwareCache> source =
         distinct ? mirror(target.source) : (target.source.cache ? target.source.cache : m_DestinationCache);
     const Kernel::Counted<Raster::HardwareCache> mask = target.mask ? mirror(target.mask) : nullptr;
+    const Kernel::Counted<Raster::HardwareCache> sampler = target.sampler ? mirror(target.sampler) : nullptr;
     if (!m_DestinationCache || !source) return;
     const Kernel::RectT<int> sourceBounds = target.source.pixels->GetBounds();
     if (!m_DestinationCache->SyncHardwareCache(m_Device, rect)) return;
     if (!source->SyncHardwareCache(m_Device, sourceBounds)) return;
     if (mask && !mask->SyncHardwareCache(m_Device, target.mask.pixels->GetBounds())) return;
+    if (sampler && !sampler->SyncHardwareCache(m_Device, target.sampler.pixels->GetBounds())) return;
     m_Destination = Raster::RetainHardwareBuffer(m_Device, m_Queue, m_DestinationCache, rect);
     m_Source = Raster::RetainHardwareBuffer(m_Device, m_Queue, source, sourceBounds);
     if (mask) {
@@ -98,7 +100,14 @@ DeviceSteps::DeviceSteps(const RenderTarget& target, const Kernel::RectT<int>& r
     } else {
         m_Mask = Raster::Hardware::GetIdentityBuffer(m_Device);
     }
-    m_Ready = m_Destination && m_Source && m_Mask;
+    if (sampler) {
+        m_SamplerRetention =
+            Raster::RetainHardwareBuffer(m_Device, m_Queue, sampler, target.sampler.pixels->GetBounds());
+        m_Sampler = m_SamplerRetention.buffer;
+    } else {
+        m_Sampler = Raster::Hardware::GetIdentityBuffer(m_Device);
+    }
+    m_Ready = m_Destination && m_Source && m_Mask && m_Sampler;
 }
 
 Kernel::Counted<Raster::HardwareBuffer> DeviceSteps::Scratch(int width, int height, int bytesPerPixel) const {
@@ -107,7 +116,8 @@ Kernel::Counted<Raster::HardwareBuffer> DeviceSteps::Scratch(int width, int heig
 
 Kernel::Counted<Raster::Prolongation> DeviceSteps::Prolong() const {
     auto prolongation = Kernel::MakeCounted<StepsProlongation>();
-    for (const Raster::HardwareRetention* retention : {&m_Source, &m_Destination, &m_MaskRetention})
+    for (const Raster::HardwareRetention* retention :
+         {&m_Source, &m_Destination, &m_MaskRetention, &m_SamplerRetention})
         if (*retention) prolongation->Keep(*retention);
     return prolongation;
 }

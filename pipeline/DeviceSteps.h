@@ -82,6 +82,8 @@ public:
     }
     // The mask's pixels, or the device's identity buffer when the target has no mask.
     const Kernel::Counted<Raster::HardwareBuffer>& Mask() const noexcept { return m_Mask; }
+    // The sampler image's pixels, or the device's identity buffer when the target has none.
+    const Kernel::Counted<Raster::HardwareBuffer>& Sampler() const noexcept { return m_Sampler; }
 
     // Device memory for intermediate results, freed when the last reference goes.
     Kernel::Counted<Raster::HardwareBuffer> Scratch(int width, int height, int bytesPerPixel) const;
@@ -110,8 +112,8 @@ private:
     Raster::HardwareQueue m_Queue;
     Raster::HardwareBufferSemaphoreGuard m_Guard;
     Kernel::Counted<Raster::HardwareCache> m_DestinationCache;
-    Raster::HardwareRetention m_Source, m_Destination, m_MaskRetention;
-    Kernel::Counted<Raster::HardwareBuffer> m_Mask;
+    Raster::HardwareRetention m_Source, m_Destination, m_MaskRetention, m_SamplerRetention;
+    Kernel::Counted<Raster::HardwareBuffer> m_Mask, m_Sampler;
     bool m_Ready = false;
 };
 

@@ -42,7 +42,8 @@ bool ExecuteOnDevice(const RenderTarget& target, const Kernel::RectT<int>& rect,
     execution.destination = bound(steps.Destination(), *target.destination.pixels);
     execution.mask = target.mask ? bound(steps.Mask(), *target.mask.pixels) : Raster::KernelImage{identity};
     execution.secondaryMask = {identity};
-    execution.sampler = {identity};
+    execution.sampler =
+        target.sampler ? bound(steps.Sampler(), *target.sampler.pixels) : Raster::KernelImage{identity};
     execution.processPixels = identity;
     execution.params = params;
     execution.rect = rect;

@@ -81,7 +81,10 @@ struct PipelineImage {
 struct RenderTarget {
     PipelineImage source;
     PipelineImage destination;
-    PipelineImage mask;      // for a mask stage that reads an image
+    PipelineImage mask; // for a mask stage that reads an image
+    // A second image the sampler stage reads (a height map, a texture), in its own format and size; none:
+    // the kernel's sampler image is the device's identity buffer, of width 0.
+    PipelineImage sampler;
     Kernel::RectT<int> rect; // in destination pixels; clipped to the destination
     // The raster's bounds in document units and the transform from source pixels to the view (identity:
     // the layer at its own resolution). Filters whose pixels depend on position or view scale read them.

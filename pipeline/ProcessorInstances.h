@@ -26,7 +26,7 @@ bool ProcessFormats(const RenderTarget& target, const Kernel::RectT<int>& rect,
     const Raster::BitmapOf<Source> source(target.source.pixels.Get());
     Raster::BitmapOf<Dest> dest(target.destination.pixels.Get());
     const typename Raster::MaskBase<Mask>::Params mask{params.mask, target.mask.pixels.Get(), nullptr};
-    const typename Raster::SamplerBase<Sampler>::Params sampler{params.sampler, nullptr};
+    const typename Raster::SamplerBase<Sampler>::Params sampler{params.sampler, target.sampler.pixels.Get()};
     const Raster::TileOptions options{target.channelMask, target.abort};
     return Raster::ProcessBase<Process>::template ProcessTile<
         Raster::PixelProcessor<Raster::Horizontal>, typename D::C1, typename D::C2, typename D::C3,

@@ -55,8 +55,9 @@ struct LightingFilter {
     static constexpr std::string_view kHint = "|DRAG| handles to position lights.";
     static constexpr ToolID kToolID = ToolID::Lighting;
     static constexpr double kDragScale = 0.0; // a drag moves the light's centre
-    // --params FILE.json (the whole LightingParams), or --colour R,G,B for the short form's light.
-    static constexpr std::array<std::string_view, 2> kTextFlags{"params", "colour"};
+    // --params FILE.json (the whole LightingParams), or --colour R,G,B for the short form's light and
+    // --bump IMAGE for its bump map.
+    static constexpr std::array<std::string_view, 3> kTextFlags{"params", "colour", "bump"};
     // 2: the command saves its whole LightingParams (colours, bump map, every light); 1 was this table.
     static constexpr unsigned short kClassVersion = 2;
 

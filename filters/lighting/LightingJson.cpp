@@ -256,6 +256,7 @@ RasterLightingCommand::MakeCommandWithText(bool liveEffect, const std::vector<Pa
     BoundParameters(table, LightingFilter::kParameters);
     std::optional<std::string> paramsFile;
     std::optional<Renderer::ConsolidatedColour> colour;
+    std::optional<std::string> bumpFile;
     for (const auto& [flag, text] : texts) {
         if (flag == "params") {
             if (paramsFile) {
@@ -263,6 +264,12 @@ RasterLightingCommand::MakeCommandWithText(bool liveEffect, const std::vector<Pa
                 return nullptr;
             }
             paramsFile = text;
+        } else if (flag == "bump") {
+            if (bumpFile) {
+                error = "--bump is given more than once";
+                return nullptr;
+            }
+            bumpFile = text;
         } else if (flag == "colour") {
             if (colour) {
                 error = "--colour is given more than once";
@@ -278,10 +285,14 @@ RasterLightingCommand::MakeCommandWithText(bool liveEffect, const std::vector<Pa
     if (!paramsFile) {
         LightingParams params = FromTable(table);
         if (colour) params.lights.front().colour = *colour;
+        if (bumpFile) {
+            params.bumpMap = ReadBumpMap(*bumpFile, error);
+            if (!params.bumpMap) return nullptr;
+        }
         return Kernel::Counted<RasterCommand>(new RasterLightingCommand(liveEffect, params));
     }
     // The file holds every setting; a flag beside it would be silently overruled or half applied.
-    bool flagged = bool(colour);
+    bool flagged = colour || bumpFile;
     for (const auto& parameter : LightingFilter::kParameters)
         flagged = flagged || FormatParameterValue(GetParameter(table, parameter)) !=
                                  FormatParameterValue(GetParameter(defaults, parameter));
@@ -297,11 +308,18 @@ RasterLightingCommand::MakeCommandWithText(bool liveEffect, const std::vector<Pa
         error = *paramsFile + ": " + why;
         return nullptr;
     }
+    LightingParams params = read->params;
     if (!read->bumpFile.empty()) {
-        error = *paramsFile + ": bump: bump maps from image files are not read yet";
-        return nullptr;
+        // A relative name is beside the settings file, so that the two travel together.
+        std::filesystem::path bump(read->bumpFile);
+        if (bump.is_relative()) bump = std::filesystem::path(*paramsFile).parent_path() / bump;
+        params.bumpMap = ReadBumpMap(bump, error);
+        if (!params.bumpMap) {
+            error = *paramsFile + ": bump: " + error;
+            return nullptr;
+        }
     }
-    return Kernel::Counted<RasterCommand>(new RasterLightingCommand(liveEffect, read->params));
+    return Kernel::Counted<RasterCommand>(new RasterLightingCommand(liveEffect, params));
 }
 
 } // namespace RasterTools

@@ -10,6 +10,7 @@
 #include "host/renderer/Colour.h"
 
 #include <cstdint>
+#include <filesystem>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -101,6 +102,11 @@ struct LightingJson {
     LightingParams params;
     std::string bumpFile;
 };
+
+// An image file's pixels as a bump map (IntensityUF): the luminance of each pixel's colour, alpha ignored;
+// null, with error saying why, for a file that cannot be read.
+Kernel::Counted<const Raster::DynamicBuffer> ReadBumpMap(const std::filesystem::path& path,
+                                                         std::string& error);
 
 // The JSON form (the README's lighting section): nothing, with error saying where and why, for text that is
 // not a JSON object, a key the form does not have, or a value of the wrong kind or beyond its range.

@@ -32,8 +32,9 @@ namespace {
 using Language = HardwareKernelLanguage;
 using Raster::PixelFormat;
 
-// The stage's body: the four heights (luminance inside the source, 0 outside), the normal, the lights, and
-// the pixel lit in the working pixel. LightingToWorking and LightingFromWorking are the format's conversions.
+// The stage's body: the four heights (from the sampler image, a bump map of floats, when it has a width;
+// otherwise the source's luminance; 0 outside either), the normal, the lights, and the pixel lit in the
+// working pixel. LightingToWorking and LightingFromWorking are the format's conversions.
 constexpr const char* SampleBody =
     R"(params_address_space float* p = sampler_params;
 const float2 v = LightingSurface(location,p);
@@ -44,9 +45,14 @@ if (p[LightingNormalZ] != 0.0f) {
     const float dy[4] = {-1.0f,1.0f,0.0f,0.0f};
     for (int i = 0; i < 4; ++i) {
         const int2 at = LightingBumpAt(v,dx[i],dy[i],p);
-        h[i] = at.x < 0 || at.y < 0 || at.x >= (int)source_bounds.x || at.y >= (int)source_bounds.y
-                   ? 0.0f
-                   : LightingLuminance(LightingToWorking(Extend(at,source_bounds,input_pixels,source_params)));
+        if (sampler_bounds.x > 0u)
+            h[i] = at.x < 0 || at.y < 0 || at.x >= (int)sampler_bounds.x || at.y >= (int)sampler_bounds.y
+                       ? 0.0f
+                       : ((constant_address_space float*)sampler_pixels)[at.y * (int)sampler_bounds.x + at.x];
+        else
+            h[i] = at.x < 0 || at.y < 0 || at.x >= (int)source_bounds.x || at.y >= (int)source_bounds.y
+                       ? 0.0f
+                       : LightingLuminance(LightingToWorking(Extend(at,source_bounds,input_pixels,source_params)));
     }
     n = LightingNormal(h[0],h[1],h[2],h[3],p);
 }
@@ -54,8 +60,6 @@ float4 lit;
 float4 shine;
 LightingShade(v,n,p,&lit,&shine);
 const source_type pixel = Extend(TransformPixelCenterToInt(location,transform_params),source_bounds,input_pixels,source_params);
-(void)sampler_bounds;
-(void)sampler_pixels;
 return LightingFromWorking(LightingLit(LightingToWorking(pixel),lit,shine));)";
 
 // The format's two conversions under the stage's names, as functions of the current scope: %1 the storage

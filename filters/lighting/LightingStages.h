@@ -11,8 +11,9 @@
 namespace RasterTools {
 
 // Lights the source pixel (read through Transform and Extend, in the working pixel) by LightingMath's model.
-// The layer is its own height map: the luminance of the pixels above, below, left and right of the height
-// position, 0 outside the layer, so that the relief slopes to 0 at the layer's border.
+// The heights above, below, left and right of the height position come from the render's sampler image, a
+// bump map of one float per pixel, when it has one; otherwise the layer is its own height map (its
+// luminance). Outside either the height is 0, so that the relief slopes to 0 at its border.
 struct LightingSampler {
     // The sampler block (see LightingMath's indices): no lights and identity affines by default.
     struct Params {
@@ -30,20 +31,27 @@ struct LightingSampler {
         return LightingMath::LightingLuminance(ToWorking<Image::Format>(image.Row(at.y)[at.x]));
     }
 
-    // One pixel, exactly as the kernel text does it.
+    static float BumpHeightAt(const Raster::DynamicBuffer& bump, Raster::KernelMath::int2 at) noexcept {
+        if (at.x < 0 || at.y < 0 || at.x >= bump.GetWidth() || at.y >= bump.GetHeight()) return 0.0f;
+        return reinterpret_cast<const float*>(bump.RowBytes(at.y))[at.x];
+    }
+
+    // One pixel, exactly as the kernel text does it; bump is the sampler image (null: none).
     template <class Transform, class Extend, class Image>
     static typename Image::Stored Sample(const Image& image, Raster::KernelMath::int2 location,
-                                         const Raster::PreparedTransform<Transform>& t,
-                                         const Params& params) noexcept {
+                                         const Raster::PreparedTransform<Transform>& t, const Params& params,
+                                         const Raster::DynamicBuffer* bump = nullptr) noexcept {
         using namespace LightingMath;
         const float* p = params.block;
         const float2 v = LightingSurface(location, p);
         float4 n = make_float4(0.0f, 0.0f, 1.0f, 0.0f);
+        const auto height = [&](float dx, float dy) {
+            const int2 at = LightingBumpAt(v, dx, dy, p);
+            return bump ? BumpHeightAt(*bump, at) : HeightAt(image, at);
+        };
         if (p[LightingNormalZ] != 0.0f)
-            n = LightingNormal(HeightAt(image, LightingBumpAt(v, 0.0f, -1.0f, p)),
-                               HeightAt(image, LightingBumpAt(v, 0.0f, 1.0f, p)),
-                               HeightAt(image, LightingBumpAt(v, -1.0f, 0.0f, p)),
-                               HeightAt(image, LightingBumpAt(v, 1.0f, 0.0f, p)), p);
+            n = LightingNormal(height(0.0f, -1.0f), height(0.0f, 1.0f), height(-1.0f, 0.0f),
+                               height(1.0f, 0.0f), p);
         float4 lit, shine;
         LightingShade(v, n, p, &lit, &shine);
         const auto pixel = Extend::Read(image, Raster::TransformPixelCenterToInt<Transform>(location, t));
@@ -63,15 +71,16 @@ struct LightingSampler {
     // A span of up to 32 pixels: where the pixels are their own height positions, the heights of the rows
     // above, at and below are taken once each (every height serves four neighbours) and every step of the
     // model runs for the whole span at once, so that it vectorises; the same functions in the same order as
-    // Sample's, so the pixels are Sample's. Otherwise pixel by pixel.
+    // Sample's, so the pixels are Sample's. Otherwise, and over a bump map, pixel by pixel.
     template <class Transform, class Extend, class Image>
     static void SampleSpan(const Image& image, const Raster::PreparedTransform<Transform>& t,
-                           const Params& params, int x0, int y, int n, typename Image::Stored* out) noexcept {
+                           const Params& params, const Raster::DynamicBuffer* bump, int x0, int y, int n,
+                           typename Image::Stored* out) noexcept {
         using namespace LightingMath;
         const float* p = params.block;
-        if (!Raster::IsIdentityTransform<Transform> || !MapsOntoItself(p)) {
+        if (bump || !Raster::IsIdentityTransform<Transform> || !MapsOntoItself(p)) {
             for (int i = 0; i < n; ++i)
-                out[i] = Sample<Transform, Extend>(image, make_int2(x0 + i, y), t, params);
+                out[i] = Sample<Transform, Extend>(image, make_int2(x0 + i, y), t, params, bump);
             return;
         }
         constexpr int Span = Raster::SpanLength;

@@ -8,7 +8,10 @@
 #include "filters/lighting/LightingStages.h"
 #include "frame/SinglePassCommand.h"
 
+#include "host/raster/HardwareCache.h"
+
 #include <algorithm>
+#include <array>
 #include <cmath>
 
 namespace RasterTools {
@@ -166,11 +169,14 @@ public:
         p[LightingSpecularAmount] = float(params.specular);
         p[LightingDiffuseAmount] = float(params.diffuse);
         const auto inverse = Raster::AffineTransform::Invert(view).m;
+        const auto bump = BumpAffine(params, bounds);
         for (int i = 0; i < 6; ++i) {
             p[LightingSurfaceAffine + i] = float(view.m[std::size_t(i)]);
-            p[LightingBumpAffine + i] = float(inverse[std::size_t(i)]);
+            p[LightingBumpAffine + i] =
+                float(params.bumpMap ? bump[std::size_t(i)] : inverse[std::size_t(i)]);
         }
-        const double q = DepthScale(params.bumpMapOpacity, view);
+        // A bump map's steps are its own pixels whatever the view: only the opacity scales its relief.
+        const double q = params.bumpMap ? params.bumpMapOpacity : DepthScale(params.bumpMapOpacity, view);
         p[LightingNormalZ] = float(2.0 / std::max(std::fabs(params.depth) * q, 0.000001));
         p[LightingHeightSense] = params.depth < 0.0 ? 1.0f : 0.0f;
         const std::size_t count = std::min(params.lights.size(), LightingParams::MaxRenderedLights);
@@ -180,6 +186,32 @@ public:
             WriteLight(p + LightingFirstLight + LightingLightFloats * int(i), params.lights[i], exponent,
                        bounds);
         return sampler;
+    }
+
+    // From document units to bump-map pixels: the raster's top left on the map's, each axis stretched across
+    // the raster when it fits (and the bounds are finite), otherwise one map pixel per document unit.
+    static std::array<double, 6> BumpAffine(const LightingParams& params,
+                                            const Kernel::RectT<double>& bounds) {
+        std::array<double, 6> m{1.0, 0.0, 0.0, 0.0, 1.0, 0.0};
+        const bool finite = std::isfinite(bounds.left) && std::isfinite(bounds.top) &&
+                            std::isfinite(bounds.Width()) && std::isfinite(bounds.Height());
+        if (!params.bumpMap || !finite) return m;
+        const double sx = params.scaleXToFit && bounds.Width() > 0.0
+                              ? double(params.bumpMap->GetWidth()) / bounds.Width()
+                              : 1.0;
+        const double sy = params.scaleYToFit && bounds.Height() > 0.0
+                              ? double(params.bumpMap->GetHeight()) / bounds.Height()
+                              : 1.0;
+        m = {sx, 0.0, -bounds.left * sx, 0.0, sy, -bounds.top * sy};
+        return m;
+    }
+
+    // The base's render with the bump map, if any, as the sampler image.
+    RenderPath Render(const RenderTarget& target) const override {
+        if (!m_BumpImage) return SinglePassCommand::Render(target);
+        RenderTarget withBump = target;
+        withBump.sampler = m_BumpImage;
+        return SinglePassCommand::Render(withBump);
     }
 
     template <class StageParams>
@@ -197,6 +229,15 @@ private:
     void SetParams(const LightingParams& params) {
         m_Lighting = params;
         m_Lighting.Bound();
+        // The pipeline only reads a sampler image; its device mirror is made once and shared by every render.
+        if (m_Lighting.bumpMap.Get() != m_BumpImage.pixels.Get()) {
+            m_BumpImage = {};
+            if (m_Lighting.bumpMap) {
+                m_BumpImage.pixels = Kernel::Counted<Raster::DynamicBuffer>(
+                    const_cast<Raster::DynamicBuffer*>(m_Lighting.bumpMap.Get()));
+                m_BumpImage.cache = Raster::HardwareCache::Create(m_BumpImage.pixels);
+            }
+        }
         m_Params = ToTable(m_Lighting);
         BoundParameters(m_Params, LightingFilter::kParameters);
     }
@@ -286,6 +327,7 @@ private:
     }
 
     LightingParams m_Lighting;
+    PipelineImage m_BumpImage; // the bump map as a pipeline image
 };
 
 } // namespace RasterTools

@@ -51,14 +51,22 @@ inline constexpr bool IsConstantSource = requires {
 };
 
 // Sampling of one span for every source model. A sampler that has SampleSpan takes the whole span at once
-// (its own loop, e.g. vectorised across pixels); one whose Sample takes its Params gets them per pixel.
+// (its own loop, e.g. vectorised across pixels), with the sampler image (null when the render has none) when
+// its SampleSpan takes one; one whose Sample takes its Params gets them per pixel.
 template <class SourceModel, class Sampler, class Transform, class Extend, class Stored>
 inline void SampleSpan(const SourceModel& source, const PreparedTransform<Transform>& t,
-                       const typename Sampler::Params& samplerParams, int x0, int y, int n,
-                       Stored* out) noexcept {
+                       const typename Sampler::Params& samplerParams, const DynamicBuffer* samplerPixels,
+                       int x0, int y, int n, Stored* out) noexcept {
     using namespace KernelMath;
     if constexpr (IsConstantSource<SourceModel>) {
+        (void)samplerPixels;
         std::fill_n(out, n, source.value);
+    } else if constexpr (requires {
+                             Sampler::template SampleSpan<Transform, Extend>(source, t, samplerParams,
+                                                                             samplerPixels, x0, y, n, out);
+                         }) {
+        Sampler::template SampleSpan<Transform, Extend>(source, t, samplerParams, samplerPixels, x0, y, n,
+                                                        out);
     } else if constexpr (requires {
                              Sampler::template SampleSpan<Transform, Extend>(source, t, samplerParams, x0, y,
                                                                              n, out);
@@ -82,6 +90,7 @@ inline void SampleSpan(const SourceModel& source, const PreparedTransform<Transf
                 Sampler::template Sample<Transform, Extend>(source, make_int2(x0 + i, y), t, samplerParams);
     } else {
         (void)samplerParams;
+        (void)samplerPixels;
         for (int i = 0; i < n; ++i)
             out[i] = Sampler::template Sample<Transform, Extend>(source, make_int2(x0 + i, y), t);
     }
@@ -134,6 +143,7 @@ bool ProcessBase<ProcessType>::ProcessTile(const SourceModel* source, DestModel*
     // The sampler's block (the same floats as in a kernel's parameter array); defaults where none is given.
     const typename Sampler::Params samplerDefaults{};
     const typename Sampler::Params& samplerBlock = samplerParams ? samplerParams->block : samplerDefaults;
+    const DynamicBuffer* samplerImage = samplerParams ? samplerParams->pixels : nullptr;
 
     using MaskImage = typename Detail::MaskImageOf<HasMaskImage, M1, M2, M3, M4, M5>::Type;
     [[maybe_unused]] MaskImage maskImage;
@@ -206,11 +216,11 @@ bool ProcessBase<ProcessType>::ProcessTile(const SourceModel* source, DestModel*
             sampled.count = converted.count = current.count = result.count = weights.count = n;
 
             if constexpr (SameFormat) {
-                Detail::SampleSpan<SourceModel, Sampler, Transform, Extend>(*source, transform, samplerBlock,
-                                                                            x0, y, n, converted.pixels);
+                Detail::SampleSpan<SourceModel, Sampler, Transform, Extend>(
+                    *source, transform, samplerBlock, samplerImage, x0, y, n, converted.pixels);
             } else {
-                Detail::SampleSpan<SourceModel, Sampler, Transform, Extend>(*source, transform, samplerBlock,
-                                                                            x0, y, n, sampled.pixels);
+                Detail::SampleSpan<SourceModel, Sampler, Transform, Extend>(
+                    *source, transform, samplerBlock, samplerImage, x0, y, n, sampled.pixels);
                 convertSpan(sampled.pixels, converted.pixels, n);
             }
             if (needsDestination) std::memcpy(current.pixels, row + x0, std::size_t(n) * sizeof(DestStored));

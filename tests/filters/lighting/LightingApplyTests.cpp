@@ -93,6 +93,46 @@ TEST_F(ApplyLighting, ALiveLayerFromAJsonFileKeepsEveryLightInTheDocument) {
     EXPECT_EQ(AppTests::Pixels(m_Folder / "flat.png"), applied);
 }
 
+TEST_F(ApplyLighting, ABumpMapFromAnImageFileReliefsTheLightByFlagOrFromTheJsonFile) {
+    WriteInput("in.png");
+    // Rings of brightness, 12 × 9, stretched over the layer.
+    auto bump = Raster::DynamicBuffer::Create(12, 9, Raster::PixelFormat::RGBA8);
+    for (int y = 0; y < 9; ++y)
+        for (int x = 0; x < 12; ++x) {
+            auto* pixel = reinterpret_cast<std::uint8_t*>(bump->RowBytes(y)) + 4 * x;
+            pixel[0] = pixel[1] = pixel[2] = std::uint8_t(((x - 6) * (x - 6) + (y - 4) * (y - 4)) * 9);
+            pixel[3] = 255;
+        }
+    std::filesystem::create_directories(m_Folder / "maps");
+    ASSERT_TRUE(IO::WriteImage(m_Folder / "maps" / "bump.png", *bump));
+    const std::string light = "--depth 3 --light 2 --tilt 35 --spin 60 ";
+    ASSERT_EQ(Run("apply lighting " + light + "in.png own.png").exitCode, 0);
+    const Result flagged = Run("apply lighting " + light + "--bump maps/bump.png in.png flag.png");
+    ASSERT_EQ(flagged.exitCode, 0) << flagged.output;
+    EXPECT_NE(AppTests::Pixels(m_Folder / "flag.png"), AppTests::Pixels(m_Folder / "own.png"));
+    // The file's relative name is beside the settings file.
+    Write("maps/settings.json", R"({"depth": 3, "bump": "bump.png",
+        "lights": [{"type": "directional", "tilt": 35, "spin": 60}]})");
+    const Result file = Run("apply lighting --params maps/settings.json in.png file.png");
+    ASSERT_EQ(file.exitCode, 0) << file.output;
+    EXPECT_EQ(AppTests::Pixels(m_Folder / "file.png"), AppTests::Pixels(m_Folder / "flag.png"));
+
+    const Result missing = Run("apply lighting --bump nothere.png in.png out.png");
+    EXPECT_NE(missing.exitCode, 0);
+    EXPECT_TRUE(Contains(missing.output, "nothere.png")) << missing.output;
+    Write("notimage.png", "not an image at all");
+    const Result garbage = Run("apply lighting --bump notimage.png in.png out.png");
+    EXPECT_NE(garbage.exitCode, 0);
+    EXPECT_TRUE(Contains(garbage.output, "notimage.png")) << garbage.output;
+    Write("lost.json", R"({"bump": "lost.png"})");
+    const Result lost = Run("apply lighting --params lost.json in.png out.png");
+    EXPECT_NE(lost.exitCode, 0);
+    EXPECT_TRUE(Contains(lost.output, "lost.json: bump: ")) << lost.output;
+    EXPECT_NE(Run("apply lighting --params maps/settings.json --bump maps/bump.png in.png out.png").exitCode,
+              0);
+    EXPECT_FALSE(std::filesystem::exists(m_Folder / "out.png"));
+}
+
 TEST_F(ApplyLighting, HostileSettingsFilesAndFlagsAreRefusedWithTheirReason) {
     WriteInput("in.png");
     std::string lights17 = R"({"lights": [)";

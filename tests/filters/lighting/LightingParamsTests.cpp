@@ -354,6 +354,74 @@ TEST(LightingRecords, TwoColouredLightsSumAsWorkedByHandOnEveryPath) {
     if (!device) GTEST_SKIP() << "no OpenCL device: the device path was not checked";
 }
 
+// A bump map of 1.0 everywhere over a 4 × 3 layer that it fits exactly, depth 2 (normal z 2 / 2 = 1),
+// lit from straight above by a directional light with diffuse 1 and nothing else. Inside, the heights are
+// equal: the flat rule gives −direction.z = 1. At the left edge the height outside is 0: n = (1, 0, 1) / √2
+// and the pixel takes 1 / √2; in the bottom right corner n = (−1, −1, 1) / √3 and 1 / √3. A map of half the
+// size stretched over the layer reads its pixels twice as far apart.
+TEST(LightingBumpMap, TheBumpMapsBorderSlopesToZeroOnEveryPath) {
+    auto ones = Raster::DynamicBuffer::Create(4, 3, PixelFormat::IntensityUF);
+    for (int y = 0; y < 3; ++y)
+        for (int x = 0; x < 4; ++x)
+            ones->Row<float>(y)[x] = 1.0f;
+    LightingParams params;
+    params.ambient = 0.0;
+    params.specular = 0.0;
+    params.depth = 2.0;
+    params.bumpMap = ones;
+    LightSource above;
+    above.type = LightSource::Type::Directional;
+    above.tilt = Pi / 2.0;
+    params.lights = {above};
+    // Red 1 with a blue that cancels its luminance: the layer's own relief would be all but flat, so a slope
+    // at the border can only be the map's.
+    const float red[4] = {1.0f, 0.0f, -0.2126f / 0.0722f, 1.0f};
+    const auto source = PipelineTest::MakeFilled(PixelFormat::RGBAUF, 4, 3, red);
+    const auto device = PipelineTest::OpenCLDevice();
+    const auto command = Kernel::MakeCounted<RasterLightingCommand>(false, params);
+    for (const bool onDevice : {false, true}) {
+        if (onDevice && !device) continue;
+        SCOPED_TRACE(onDevice ? "device" : "processor");
+        const auto out = PipelineTest::Render(*command, source, 2, onDevice ? device : nullptr);
+        ASSERT_TRUE(out);
+        EXPECT_NEAR(ReadComponents(*out, 1, 1)[0], 1.0, 1e-6);
+        EXPECT_NEAR(ReadComponents(*out, 2, 1)[0], 1.0, 1e-6);
+        EXPECT_NEAR(ReadComponents(*out, 0, 1)[0], 1.0 / std::sqrt(2.0), 1e-6);
+        EXPECT_NEAR(ReadComponents(*out, 3, 2)[0], 1.0 / std::sqrt(3.0), 1e-6);
+        EXPECT_EQ(ReadComponents(*out, 3, 2)[3], 1.0);
+    }
+    // Without the map, the layer's own relief: flat to within its float rounding.
+    LightingParams own = params;
+    own.bumpMap = nullptr;
+    const auto plain =
+        PipelineTest::Render(*Kernel::MakeCounted<RasterLightingCommand>(false, own), source, 0);
+    ASSERT_TRUE(plain);
+    EXPECT_NEAR(ReadComponents(*plain, 0, 1)[0], 1.0, 1e-6);
+    // Half the size, fitted: pixel x sits at map column x / 2 and its neighbours one map pixel either side,
+    // truncated toward zero: pixel 1 reads columns 0 (from −0.5) and 1, flat; pixel 0 reads −1 and pixel 2
+    // reads 2, both outside.
+    auto half = Raster::DynamicBuffer::Create(2, 3, PixelFormat::IntensityUF);
+    for (int y = 0; y < 3; ++y)
+        half->Row<float>(y)[0] = half->Row<float>(y)[1] = 1.0f;
+    params.bumpMap = half;
+    const auto fitted =
+        PipelineTest::Render(*Kernel::MakeCounted<RasterLightingCommand>(false, params), source, 0);
+    ASSERT_TRUE(fitted);
+    EXPECT_NEAR(ReadComponents(*fitted, 0, 1)[0], 1.0 / std::sqrt(2.0), 1e-6);
+    EXPECT_NEAR(ReadComponents(*fitted, 1, 1)[0], 1.0, 1e-6);
+    EXPECT_NEAR(ReadComponents(*fitted, 2, 1)[0], 1.0 / std::sqrt(2.0), 1e-6);
+    // One map pixel per layer pixel: pixels 0 and 1 reach outside the map; pixel 3's heights are all
+    // outside it, 0, so flat.
+    params.scaleXToFit = false;
+    const auto unfitted =
+        PipelineTest::Render(*Kernel::MakeCounted<RasterLightingCommand>(false, params), source, 0);
+    ASSERT_TRUE(unfitted);
+    EXPECT_NEAR(ReadComponents(*unfitted, 0, 1)[0], 1.0 / std::sqrt(2.0), 1e-6);
+    EXPECT_NEAR(ReadComponents(*unfitted, 1, 1)[0], 1.0 / std::sqrt(2.0), 1e-6);
+    EXPECT_NEAR(ReadComponents(*unfitted, 3, 1)[0], 1.0, 1e-6);
+    if (!device) GTEST_SKIP() << "no OpenCL device: the device path was not checked";
+}
+
 // Tile shapes as the registry's sweep uses them: odd, aligned, shifted, narrower than a span.
 struct Tiling {
     int width, height, originX, originY;
@@ -376,42 +444,47 @@ TEST(LightingRecords, ManyColouredLightsAgreeOnTheProcessorAndTheDeviceInEveryFo
     unset.distance = 0.0;
     unset.colour = {0.75f, 0.25f, 0.5f, 1.0f};
     params.lights.insert(params.lights.end(), {point, unknown, unset});
-    const auto command = Kernel::MakeCounted<RasterLightingCommand>(false, params);
+    LightingParams bumped = params;
+    bumped.bumpMap = Heights(10, 7, -0.75f); // stretched across the layer, and beyond its bounds
+    bumped.scaleYToFit = false;
     const auto device = PipelineTest::OpenCLDevice();
-    for (const PixelFormat format : LayerFormats) {
-        SCOPED_TRACE(Raster::GetPixelFormatName(format));
-        const auto source = PipelineTest::MakeImage(format, 37, 29, 17u);
-        RenderTarget base;
-        base.source.pixels = source;
-        const auto reference = PipelineTest::MakeDestination(*command, *source);
-        base.destination.pixels = reference;
-        ASSERT_EQ(PipelineTest::RenderTiled(*command, base, 0, 0).processor, 1);
-        const bool lab = format == PixelFormat::LabA16;
-        for (const bool onDevice : {false, true}) {
-            if (onDevice && !device) continue;
-            for (const Tiling& tiling : Tilings) {
-                RenderTarget target = base;
-                target.destination.pixels = PipelineTest::MakeDestination(*command, *source);
-                if (onDevice) {
-                    target.device = device;
-                    target.source.cache = Raster::HardwareCache::Create(target.source.pixels);
-                    target.destination.cache = Raster::HardwareCache::Create(target.destination.pixels);
-                    ASSERT_TRUE(command->PrepareDevice(target)) << Raster::GetLastHardwareError();
+    for (const auto& command : {Kernel::MakeCounted<RasterLightingCommand>(false, params),
+                                Kernel::MakeCounted<RasterLightingCommand>(false, bumped)})
+        for (const PixelFormat format : LayerFormats) {
+            SCOPED_TRACE(Raster::GetPixelFormatName(format));
+            SCOPED_TRACE(command->GetParams().bumpMap ? "with a bump map" : "the layer's own relief");
+            const auto source = PipelineTest::MakeImage(format, 37, 29, 17u);
+            RenderTarget base;
+            base.source.pixels = source;
+            const auto reference = PipelineTest::MakeDestination(*command, *source);
+            base.destination.pixels = reference;
+            ASSERT_EQ(PipelineTest::RenderTiled(*command, base, 0, 0).processor, 1);
+            const bool lab = format == PixelFormat::LabA16;
+            for (const bool onDevice : {false, true}) {
+                if (onDevice && !device) continue;
+                for (const Tiling& tiling : Tilings) {
+                    RenderTarget target = base;
+                    target.destination.pixels = PipelineTest::MakeDestination(*command, *source);
+                    if (onDevice) {
+                        target.device = device;
+                        target.source.cache = Raster::HardwareCache::Create(target.source.pixels);
+                        target.destination.cache = Raster::HardwareCache::Create(target.destination.pixels);
+                        ASSERT_TRUE(command->PrepareDevice(target)) << Raster::GetLastHardwareError();
+                    }
+                    const auto paths = PipelineTest::RenderTiled(
+                        *command, target, tiling.width, tiling.height, tiling.originX, tiling.originY);
+                    EXPECT_EQ(paths.other, 0);
+                    if (onDevice) {
+                        EXPECT_EQ(paths.processor, 0) << Raster::GetLastHardwareError();
+                    }
+                    const auto difference =
+                        PipelineTest::Compare(*target.destination.pixels, *reference, lab ? 1.0 : 0.0);
+                    if (difference)
+                        ADD_FAILURE() << (onDevice ? "device" : "processor") << ", tiles " << tiling.width
+                                      << "x" << tiling.height << " differ at " << difference->Describe();
                 }
-                const auto paths = PipelineTest::RenderTiled(*command, target, tiling.width, tiling.height,
-                                                             tiling.originX, tiling.originY);
-                EXPECT_EQ(paths.other, 0);
-                if (onDevice) {
-                    EXPECT_EQ(paths.processor, 0) << Raster::GetLastHardwareError();
-                }
-                const auto difference =
-                    PipelineTest::Compare(*target.destination.pixels, *reference, lab ? 1.0 : 0.0);
-                if (difference)
-                    ADD_FAILURE() << (onDevice ? "device" : "processor") << ", tiles " << tiling.width << "x"
-                                  << tiling.height << " differ at " << difference->Describe();
             }
         }
-    }
     if (!device) GTEST_SKIP() << "no OpenCL device: the device renders were not compared";
 }
 
