@@ -39,12 +39,15 @@ public:
         colour = {float(channels[0]), float(channels[1]), float(channels[2]), float(channels[3])};
         return true;
     }
-    const Kernel::ClassProperties& GetObjectClassProperties() const override { return properties; }
-    static const Kernel::ClassProperties properties;
+    const Kernel::ClassProperties& GetObjectClassProperties() const override { return Properties(); }
+    static const Kernel::ClassProperties& Properties();
 };
-const Kernel::ClassProperties ColourObject::properties(
-    MakeFourCC("RGBc"), [] { return Kernel::Counted<Kernel::Serialisable>(new ColourObject); }, 1, nullptr,
-    nullptr);
+const Kernel::ClassProperties& ColourObject::Properties() {
+    static const Kernel::ClassProperties properties(
+        MakeFourCC("RGBc"), [] { return Kernel::Counted<Kernel::Serialisable>(new ColourObject); }, 1,
+        nullptr, nullptr);
+    return properties;
+}
 
 // The bump map: its size and its floats, little-endian.
 class BumpMapObject final : public Kernel::Serialisable {
@@ -81,12 +84,15 @@ public:
         map = loaded;
         return true;
     }
-    const Kernel::ClassProperties& GetObjectClassProperties() const override { return properties; }
-    static const Kernel::ClassProperties properties;
+    const Kernel::ClassProperties& GetObjectClassProperties() const override { return Properties(); }
+    static const Kernel::ClassProperties& Properties();
 };
-const Kernel::ClassProperties BumpMapObject::properties(
-    MakeFourCC("LBmp"), [] { return Kernel::Counted<Kernel::Serialisable>(new BumpMapObject); }, 1, nullptr,
-    nullptr);
+const Kernel::ClassProperties& BumpMapObject::Properties() {
+    static const Kernel::ClassProperties properties(
+        MakeFourCC("LBmp"), [] { return Kernel::Counted<Kernel::Serialisable>(new BumpMapObject); }, 1,
+        nullptr, nullptr);
+    return properties;
+}
 
 // One light source.
 class LightObject final : public Kernel::Serialisable {
@@ -97,12 +103,15 @@ public:
     bool Load(const Kernel::InSerialiser& in, Kernel::FileStore&, unsigned short version) override {
         return light.Load(in, LightSource::GetClassUID(), version);
     }
-    const Kernel::ClassProperties& GetObjectClassProperties() const override { return properties; }
-    static const Kernel::ClassProperties properties;
+    const Kernel::ClassProperties& GetObjectClassProperties() const override { return Properties(); }
+    static const Kernel::ClassProperties& Properties();
 };
-const Kernel::ClassProperties LightObject::properties(
-    LightSource::GetClassUID(), [] { return Kernel::Counted<Kernel::Serialisable>(new LightObject); },
-    LightSource::GetSchemaVersion(), nullptr, nullptr);
+const Kernel::ClassProperties& LightObject::Properties() {
+    static const Kernel::ClassProperties properties(
+        LightSource::GetClassUID(), [] { return Kernel::Counted<Kernel::Serialisable>(new LightObject); },
+        LightSource::GetSchemaVersion(), nullptr, nullptr);
+    return properties;
+}
 
 // The lights in order: their count, then light i under "L" and i in three digits.
 class LightListObject final : public Kernel::Serialisable {
@@ -142,12 +151,24 @@ public:
         lights = std::move(loaded);
         return true;
     }
-    const Kernel::ClassProperties& GetObjectClassProperties() const override { return properties; }
-    static const Kernel::ClassProperties properties;
+    const Kernel::ClassProperties& GetObjectClassProperties() const override { return Properties(); }
+    static const Kernel::ClassProperties& Properties();
 };
-const Kernel::ClassProperties LightListObject::properties(
-    MakeFourCC("LLst"), [] { return Kernel::Counted<Kernel::Serialisable>(new LightListObject); }, 1, nullptr,
-    nullptr);
+const Kernel::ClassProperties& LightListObject::Properties() {
+    static const Kernel::ClassProperties properties(
+        MakeFourCC("LLst"), [] { return Kernel::Counted<Kernel::Serialisable>(new LightListObject); }, 1,
+        nullptr, nullptr);
+    return properties;
+}
+
+// The records' classes enter the host's registry when first used, not when the library loads: loading it
+// registers its commands and tools alone.
+void RegisterRecordClasses() {
+    ColourObject::Properties();
+    BumpMapObject::Properties();
+    LightObject::Properties();
+    LightListObject::Properties();
+}
 
 void SaveColour(Kernel::OutSerialiser& out, Kernel::FourCC code, const Renderer::ConsolidatedColour& colour) {
     ColourObject object;
@@ -187,6 +208,7 @@ LightSource::LightSource(const Kernel::RectT<double>& document)
                std::sqrt(document.Width() * document.Width() + document.Height() * document.Height())) {}
 
 void LightSource::Save(Kernel::OutSerialiser& out) const {
+    RegisterRecordClasses();
     out.SaveType(MakeFourCC("Type"), std::int32_t(type));
     SaveColour(out, MakeFourCC("Colo"), colour);
     out.SaveType(MakeFourCC("Spin"), spin);
@@ -199,6 +221,7 @@ void LightSource::Save(Kernel::OutSerialiser& out) const {
 
 bool LightSource::Load(const Kernel::InSerialiser& in, Kernel::FourCC classUID, unsigned short version) {
     if (classUID != GetClassUID() || version > GetSchemaVersion() || !in.IsValid()) return false;
+    RegisterRecordClasses();
     LightSource loaded = *this;
     std::int32_t kind = std::int32_t(type);
     in.LoadType(MakeFourCC("Type"), kind);
@@ -226,6 +249,7 @@ LightingParams::LightingParams(const Kernel::RectT<double>& document)
     : lights{LightSource(document)} {}
 
 void LightingParams::Save(Kernel::OutSerialiser& out, bool full) const {
+    RegisterRecordClasses();
     out.SaveType(MakeFourCC("Ambi"), ambient);
     out.SaveType(MakeFourCC("Diff"), diffuse);
     out.SaveType(MakeFourCC("Spec"), specular);
@@ -251,6 +275,7 @@ void LightingParams::Save(Kernel::OutSerialiser& out, bool full) const {
 bool LightingParams::Load(const Kernel::InSerialiser& in, Kernel::FourCC classUID, unsigned short version,
                           Kernel::FileStore& store) {
     if (classUID != GetClassUID() || version > GetSchemaVersion() || !in.IsValid()) return false;
+    RegisterRecordClasses();
     LightingParams loaded = *this;
     in.LoadType(MakeFourCC("Ambi"), loaded.ambient);
     in.LoadType(MakeFourCC("Diff"), loaded.diffuse);

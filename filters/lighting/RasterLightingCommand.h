@@ -103,7 +103,6 @@ public:
     // The table's view of params: the surface and the first light (the table's defaults without one), in
     // degrees, bounded; an unset distance is 0.
     static LightingParameters ToTable(const LightingParams& params) {
-        constexpr double Degrees = 180.0 / 3.14159265358979323846;
         LightingParameters table = DefaultParameters(LightingFilter::kParameters);
         table.ambient = params.ambient;
         table.diffuse = params.diffuse;
@@ -117,11 +116,11 @@ public:
         }
         const LightSource& light = params.lights.front();
         table.lightType = int(light.type);
-        table.spin = light.spin * Degrees;
-        table.tilt = light.tilt * Degrees;
+        table.spin = ToDegrees(light.spin);
+        table.tilt = ToDegrees(light.tilt);
         table.centre = light.centre;
         table.distance = light.distance > 0.0 ? light.distance : 0.0;
-        table.outerCone = light.outerCone * Degrees;
+        table.outerCone = ToDegrees(light.outerCone);
         table.innerCone = light.innerCone;
         // Bounded as the table keeps it, so that a value the table cannot show reads as unchanged.
         BoundParameters(table, LightingFilter::kParameters);
@@ -240,6 +239,12 @@ private:
         }
         m_Params = ToTable(m_Lighting);
         BoundParameters(m_Params, LightingFilter::kParameters);
+    }
+
+    // Degrees to a billionth, so that an angle the table gave in whole degrees reads back as given.
+    static double ToDegrees(double radians) noexcept {
+        const double degrees = radians * (180.0 / 3.14159265358979323846);
+        return std::fabs(degrees) < 1e6 ? std::round(degrees * 1e9) / 1e9 : degrees;
     }
 
     static bool Same(double a, double b) noexcept { return a == b || (std::isnan(a) && std::isnan(b)); }

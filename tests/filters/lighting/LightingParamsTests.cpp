@@ -279,7 +279,7 @@ TEST(LightingRecords, TheTableIsTheFirstLightsViewAndPanelsChangeOnlyWhatTheySho
     params.lights[0].spin = 0.1; // not a whole number of degrees: the table's degrees do not round back
     const auto command = Kernel::MakeCounted<RasterLightingCommand>(true, params);
     const LightingParameters& table = command->GetParameters();
-    EXPECT_DOUBLE_EQ(table.spin, 0.1 * 180.0 / Pi);
+    EXPECT_NEAR(table.spin, 0.1 * 180.0 / Pi, 1e-9); // degrees to a billionth
     EXPECT_EQ(table.lightType, 0);
     EXPECT_EQ(table.ambient, 0.35);
     EXPECT_EQ(command->GetParams().lights[0].spin, 0.1); // exactly, not through degrees
