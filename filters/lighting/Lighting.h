@@ -49,7 +49,7 @@ struct LightingFilter {
     static constexpr std::string_view kName = "lighting";
     // The host knows the classes by these names (coverage, documents, tool lists).
     static constexpr std::string_view kCommandClass = "RasterLightingCommand";
-    static constexpr Kernel::FourCC kClassCode = Kernel::MakeFourCC("RLiC"); // in documents
+    static constexpr Kernel::FourCC kClassCode = Kernel::MakeFourCC("RLig"); // in documents
     static constexpr std::string_view kToolClass = "LightingTool";           // empty: no tool
     static constexpr std::string_view kDescription = "Lighting";
     static constexpr std::string_view kHint = "|DRAG| handles to position lights.";

@@ -269,7 +269,7 @@ TEST(CommandAnswers, EveryRegisteredCommandGivesTheHostContractsAnswers) {
         {"RasterCopyCommand", "RCpy", false, false, false, false, 2},
         {"RasterVerticalEdgeDetectCommand", "RVEd", true, true, false, true, 0},
         {"ProceduralTextureCommand", "PrTx", true, false, false, false, 2},
-        {"RasterLightingCommand", "RLiC", false, true, false, false, 2},
+        {"RasterLightingCommand", "RLig", false, true, false, false, 2},
     };
     const auto CodeOf = [](const char* code) {
         return (Kernel::FourCC(std::uint8_t(code[0])) << 24) | (Kernel::FourCC(std::uint8_t(code[1])) << 16) |
