@@ -11,6 +11,9 @@ namespace RasterTools::MotionBlurRender {
 // Lines of the intermediate image worked out at a time: the resample out writes every destination pixel that
 // the band's lines make, so a wider band gives longer runs, and its two scratch images still stay small.
 inline constexpr int Band = 64;
+// Rows of every line of a band resampled before the next rows of any: a segment of the band reads about
+// Band × SegmentRows source pixels.
+inline constexpr int SegmentRows = 64;
 
 // Which line of the box the resample out of a destination row starts its sample in, as a function of x: the
 // sampler's own arithmetic (clamp, floor), monotonic in x, so that a band's pixels in a row are one run.
@@ -158,19 +161,31 @@ RenderPath Run(const RenderTarget& target, const Kernel::RectT<int>& rect, const
         const int end = std::min(first + Band, width);
         const int count = std::min(end + 1, width) - first;
 
-        // 1. Resample the source into the band's rotated lines, a line at a time (rows of the source a line
-        // crosses stay cached for the next line, since rows are an odd number of cache lines apart). Every
-        // sample position is worked out from its own intermediate coordinates, never stepped along the line,
-        // so a pixel does not depend on the tile.
-        for (int i = 0; i < count; ++i) {
-            const int j = first + i;
-            const RowRange rows = sampledRows(j);
-            if (rows.first >= rows.last) continue;
-            T* line = rotated->Row<T>(i) + std::ptrdiff_t(lead) * N;
-            auto position = [&](int r, double& x, double& y) {
-                Blur::Turn::rt_turn_in(c, s, px, py, plan.box.left + j, plan.box.top - reach + r, &x, &y);
-            };
-            Blur::SampleBilinearRun<F>(sourceGrid, rows.first, rows.last, position, line);
+        // 1. Resample the source into the band's rotated lines, a segment of rows of every line at a time:
+        // the band's lines lie side by side, so a segment of all of them reads a compact patch of the source
+        // that stays in the first-level cache, where a whole line at a time would sweep hundreds of source
+        // rows before the next line came back to them. Every sample position is worked out from its own
+        // intermediate coordinates, never stepped along the line, so a pixel depends neither on the tile nor
+        // on the segments.
+        int lowest = 0;
+        for (int i = 0; i < count; ++i)
+            lowest = std::min(lowest, sampledRows(first + i).first);
+        for (int segment = lowest;; segment += SegmentRows) {
+            bool more = false;
+            for (int i = 0; i < count; ++i) {
+                const int j = first + i;
+                const RowRange rows = sampledRows(j);
+                const int from = std::max(rows.first, segment),
+                          to = std::min(rows.last, segment + SegmentRows);
+                more = more || rows.last > segment + SegmentRows;
+                if (from >= to) continue;
+                T* line = rotated->Row<T>(i) + std::ptrdiff_t(lead) * N;
+                auto position = [&](int r, double& x, double& y) {
+                    Blur::Turn::rt_turn_in(c, s, px, py, plan.box.left + j, plan.box.top - reach + r, &x, &y);
+                };
+                Blur::SampleBilinearRun<F>(sourceGrid, from, to, position, line);
+            }
+            if (!more) break;
         }
         if (Kernel::IsAborted(target.abort)) return RenderPath::Aborted;
 
