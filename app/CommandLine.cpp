@@ -267,10 +267,10 @@ std::unique_ptr<CLI::App> MakeDocApp(const std::string& subcommand, DocFlags& fl
 void AddFilterParameters(CLI::App& app, const RasterTools::FilterInfo& filter,
                          std::vector<TextOption>& values) {
     values.resize(filter.parameters.size() + filter.textFlags.size());
-    // Text flags (equations, inputs) may repeat; the filter's command checks them.
+    // Text flags (equations, inputs, files): the filter's command checks them.
     for (std::size_t i = 0; i < filter.textFlags.size(); ++i)
         AddText(app, "--" + std::string(filter.textFlags[i]), values[filter.parameters.size() + i],
-                "text for the filter; may be given more than once")
+                i < filter.textFlagHelp.size() ? std::string(filter.textFlagHelp[i]) : "text for the filter")
             ->type_name("TEXT")
             ->group("Parameters of " + std::string(filter.name));
     for (std::size_t i = 0; i < filter.parameters.size(); ++i) {

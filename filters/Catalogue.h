@@ -37,6 +37,8 @@ struct FilterInfo {
     // filter with any makes its commands through makeCommandWithText, from the table's values and these
     // (flag without dashes, text) in order. Null when something does not fit; error says what.
     std::vector<std::string_view> textFlags;
+    // What each text flag takes, a line each for the help (parallel to textFlags; empty: a generic line).
+    std::vector<std::string_view> textFlagHelp;
     std::function<Kernel::Counted<RasterCommand>(
         bool liveEffect, const std::vector<ParameterValue>& values,
         const std::vector<std::pair<std::string, std::string>>& texts, std::string& error)>

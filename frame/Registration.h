@@ -58,6 +58,8 @@ FilterInfo Describe() {
     };
     if constexpr (requires { Filter::kTextFlags; }) {
         info.textFlags.assign(Filter::kTextFlags.begin(), Filter::kTextFlags.end());
+        static_assert(Filter::kTextFlagHelp.size() == Filter::kTextFlags.size());
+        info.textFlagHelp.assign(Filter::kTextFlagHelp.begin(), Filter::kTextFlagHelp.end());
         info.makeCommandWithText = &CommandClass::MakeCommandWithText;
     }
     if constexpr (requires { typename CommandClass::template PlainStages<Raster::PixelFormat::RGBA8>; })

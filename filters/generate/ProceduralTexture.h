@@ -40,6 +40,13 @@ struct ProceduralTextureFilter {
     // ("multiply", "colour-dodge", ...).
     static constexpr std::array<std::string_view, 6> kTextFlags{"config", "eq",    "colour",
                                                                 "angles", "input", "blend"};
+    static constexpr std::array<std::string_view, 6> kTextFlagHelp{
+        "FILE.json: the whole texture (equations, inputs, units, colour format)",
+        "CHANNELS=EXPRESSION: an equation, e.g. rgb=sin(x / 8); may be given more than once",
+        "FORMAT: the colour format the equations write (RGB, CMYK, Lab, Intensity or Alpha)",
+        "deg|rad: the unit of angles in the equations",
+        "NAME=VALUE: an input's value (a new name adds a real input); may be given more than once",
+        "MODE: how the texture blends with the layer (normal, multiply, screen, ...)"};
 
     // Every starter preset, at an origin off the pixel grid, and one half-transparent.
     static constexpr std::array<Params, 6> kSamples{{

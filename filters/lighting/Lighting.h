@@ -58,6 +58,10 @@ struct LightingFilter {
     // --params FILE.json (the whole LightingParams), or --colour R,G,B for the short form's light and
     // --bump IMAGE for its bump map.
     static constexpr std::array<std::string_view, 3> kTextFlags{"params", "colour", "bump"};
+    static constexpr std::array<std::string_view, 3> kTextFlagHelp{
+        "FILE.json: the whole set-up (surface, every light, bump map), given alone",
+        "R,G,B: the light's colour, each 0..1 (white)",
+        "IMAGE: a picture whose luminance is the relief (the layer's own luminance)"};
     // 2: the command saves its whole LightingParams (colours, bump map, every light); 1 was this table.
     static constexpr unsigned short kClassVersion = 2;
 

@@ -73,6 +73,14 @@ TEST_F(CommandTools, HelpNamesEveryParameterOfEveryFilter) {
                     << line;
             }
         }
+        // Text flags say what they take, each its own line.
+        ASSERT_EQ(filter.textFlagHelp.size(), filter.textFlags.size()) << filter.name;
+        for (std::size_t i = 0; i < filter.textFlags.size(); ++i) {
+            const auto at = help.output.find("--" + std::string(filter.textFlags[i]) + " ");
+            ASSERT_NE(at, std::string::npos) << filter.name << " --" << filter.textFlags[i];
+            const std::string line = help.output.substr(at, help.output.find('\n', at) - at);
+            EXPECT_TRUE(Contains(line, std::string(filter.textFlagHelp[i]).substr(0, 20))) << line;
+        }
         // The same filter's help is reached the other ways too.
         EXPECT_EQ(Run("help apply " + std::string(filter.name)).output, help.output);
     }
