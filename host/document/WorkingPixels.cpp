@@ -2,6 +2,7 @@
 // rounding that the pixel pipeline's conversions use.
 #include "host/document/WorkingPixels.h"
 
+#include "host/kernel/UnalignedBytes.h"
 #include "host/raster/ICCManager.h"
 
 #include <algorithm>
@@ -12,18 +13,6 @@
 namespace WorkingPixels {
 
 namespace {
-
-template <class T>
-T Load(const std::byte* at) noexcept {
-    T value;
-    std::memcpy(&value, at, sizeof value);
-    return value;
-}
-
-template <class T>
-void Store(std::byte* at, T value) noexcept {
-    std::memcpy(at, &value, sizeof value);
-}
 
 // Rounds to nearest, halves away from zero, after clamping to 0..maximum; NaN stores as 0.
 float Quantise(float v, float maximum) noexcept {
@@ -47,7 +36,7 @@ void ToWorking(Raster::PixelFormat format, const std::byte* in, float* out, int 
         return;
     case PixelFormat::RGBA16:
         for (int i = 0; i < 4 * n; ++i)
-            out[i] = float(Load<std::uint16_t>(in + 2 * i)) / 65535.0f;
+            out[i] = float(Kernel::LoadBytes<std::uint16_t>(in + 2 * i)) / 65535.0f;
         return;
     case PixelFormat::RGBAUF:
         std::memcpy(out, in, std::size_t(n) * 16);
@@ -60,8 +49,8 @@ void ToWorking(Raster::PixelFormat format, const std::byte* in, float* out, int 
         return;
     case PixelFormat::IA16:
         for (int i = 0; i < n; ++i, out += 4) {
-            out[0] = out[1] = out[2] = float(Load<std::uint16_t>(in + 4 * i)) / 65535.0f;
-            out[3] = float(Load<std::uint16_t>(in + 4 * i + 2)) / 65535.0f;
+            out[0] = out[1] = out[2] = float(Kernel::LoadBytes<std::uint16_t>(in + 4 * i)) / 65535.0f;
+            out[3] = float(Kernel::LoadBytes<std::uint16_t>(in + 4 * i + 2)) / 65535.0f;
         }
         return;
     case PixelFormat::CMYKA8:
@@ -93,7 +82,7 @@ void FromWorking(Raster::PixelFormat format, const float* in, std::byte* out, in
         return;
     case PixelFormat::RGBA16:
         for (int i = 0; i < 4 * n; ++i)
-            Store(out + 2 * i, std::uint16_t(Quantise(in[i], 65535.0f)));
+            Kernel::StoreBytes(out + 2 * i, std::uint16_t(Quantise(in[i], 65535.0f)));
         return;
     case PixelFormat::RGBAUF:
         std::memcpy(out, in, std::size_t(n) * 16);
@@ -108,8 +97,8 @@ void FromWorking(Raster::PixelFormat format, const float* in, std::byte* out, in
                 Saturate(std::round(maximum * (in[0] * 0.299f + in[1] * 0.587f + in[2] * 0.114f)), maximum);
             const float alpha = Saturate(std::round(in[3] * maximum), maximum);
             if (wide) {
-                Store(out + 4 * i, std::uint16_t(grey));
-                Store(out + 4 * i + 2, std::uint16_t(alpha));
+                Kernel::StoreBytes(out + 4 * i, std::uint16_t(grey));
+                Kernel::StoreBytes(out + 4 * i + 2, std::uint16_t(alpha));
             } else {
                 out[2 * i] = std::byte(std::uint8_t(grey));
                 out[2 * i + 1] = std::byte(std::uint8_t(alpha));
