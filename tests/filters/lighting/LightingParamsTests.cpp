@@ -12,6 +12,7 @@
 
 #include <cmath>
 #include <cstring>
+#include <functional>
 #include <limits>
 
 namespace {
@@ -79,6 +80,16 @@ void ExpectSame(const LightingParams& loaded, const LightingParams& original) {
     }
     a.bumpMap = b.bumpMap = nullptr; // compared by content above
     EXPECT_TRUE(a == b);
+}
+
+// The first place in a saved stream where the record code stands with room bytes from it and accept holds;
+// null where there is none.
+std::byte* FindRecord(
+    std::vector<std::byte>& bytes, std::uint32_t code, std::size_t room,
+    const std::function<bool(const std::byte*)>& accept = [](const std::byte*) { return true; }) {
+    for (std::size_t i = 0; i + room <= bytes.size(); ++i)
+        if (std::memcmp(bytes.data() + i, &code, 4) == 0 && accept(bytes.data() + i)) return bytes.data() + i;
+    return nullptr;
 }
 
 std::vector<std::byte> Saved(const LightingParams& params, bool full = true) {
@@ -184,14 +195,10 @@ TEST(LightingRecords, DamagedStreamsAreRefusedAndChangeNothing) {
         LightingParams twoLights = Varied();
         std::vector<std::byte> damaged = Saved(twoLights);
         // The count record inside the list: "Cnt ", tag, size 4, then the count. Raise 2 to 3.
-        const std::uint32_t code = Kernel::MakeFourCC("Cnt ");
-        bool patched = false;
-        for (std::size_t i = 0; i + 14 <= damaged.size() && !patched; ++i)
-            if (std::memcmp(damaged.data() + i, &code, 4) == 0 && damaged[i + 10] == std::byte(2)) {
-                damaged[i + 10] = std::byte(3);
-                patched = true;
-            }
-        ASSERT_TRUE(patched);
+        std::byte* count = FindRecord(damaged, Kernel::MakeFourCC("Cnt "), 14,
+                                      [](const std::byte* at) { return at[10] == std::byte(2); });
+        ASSERT_NE(count, nullptr);
+        count[10] = std::byte(3);
         LightingParams params;
         EXPECT_FALSE(LoadInto(params, damaged));
         EXPECT_TRUE(params == before);
@@ -201,14 +208,9 @@ TEST(LightingRecords, DamagedStreamsAreRefusedAndChangeNothing) {
         mapped.lights.clear();
         std::vector<std::byte> damaged = Saved(mapped);
         // The bump map's width: 5 becomes 6, so its 15 floats no longer fill it.
-        const std::uint32_t code = Kernel::MakeFourCC("Wdth");
-        bool patched = false;
-        for (std::size_t i = 0; i + 14 <= damaged.size() && !patched; ++i)
-            if (std::memcmp(damaged.data() + i, &code, 4) == 0) {
-                damaged[i + 10] = std::byte(6);
-                patched = true;
-            }
-        ASSERT_TRUE(patched);
+        std::byte* width = FindRecord(damaged, Kernel::MakeFourCC("Wdth"), 14);
+        ASSERT_NE(width, nullptr);
+        width[10] = std::byte(6);
         LightingParams params;
         EXPECT_FALSE(LoadInto(params, damaged));
         EXPECT_TRUE(params == before);
@@ -217,14 +219,9 @@ TEST(LightingRecords, DamagedStreamsAreRefusedAndChangeNothing) {
         LightingParams coloured = Varied();
         std::vector<std::byte> damaged = Saved(coloured);
         // Rename the first "Blue" record: the colour it belongs to is incomplete.
-        const std::uint32_t code = Kernel::MakeFourCC("Blue");
-        bool patched = false;
-        for (std::size_t i = 0; i + 4 <= damaged.size() && !patched; ++i)
-            if (std::memcmp(damaged.data() + i, &code, 4) == 0) {
-                damaged[i] = std::byte('X');
-                patched = true;
-            }
-        ASSERT_TRUE(patched);
+        std::byte* blue = FindRecord(damaged, Kernel::MakeFourCC("Blue"), 4);
+        ASSERT_NE(blue, nullptr);
+        blue[0] = std::byte('X');
         LightingParams params;
         EXPECT_FALSE(LoadInto(params, damaged));
     }
