@@ -6,6 +6,7 @@
 // once. Called only where the processor has AVX2.
 
 #include "host/kernel/Simd.h"
+#include "host/kernel/UnalignedBytes.h"
 #include "host/raster/PixelFormat.h"
 #include "pipeline/Avx2Lanes.h"
 
@@ -46,7 +47,7 @@ RT_TARGET_AVX2 inline void SplitBytes(__m256i v, __m256* c) noexcept {
 }
 
 // Eight pixels are fetched from their byte offsets with plain loads rather than the gather instructions:
-// on recent processors a gather costs more than the loads it stands for (the motion blur samples a third
+// on recent processors a gather costs more than the loads it stands for (the motion blur renders an eighth
 // faster without them).
 template <class Read>
 [[gnu::always_inline]] RT_TARGET_AVX2 inline __m128i FourLanes(__m128i at, const Read& read) noexcept {
@@ -66,22 +67,14 @@ template <class Read>
 
 // The 32-bit word at each offset, unaligned.
 [[gnu::always_inline]] RT_TARGET_AVX2 inline __m256i Load32(const std::byte* base, __m256i offset) noexcept {
-    return EachLane(offset, [base](std::int32_t at) {
-        std::int32_t word;
-        __builtin_memcpy(&word, base + at, sizeof word);
-        return word;
-    });
+    return EachLane(offset, [base](std::int32_t at) { return Kernel::LoadBytes<std::int32_t>(base + at); });
 }
 
 // Two neighbouring 4-byte pixels at each lane's offset: the first of each pair in first, the second in
 // second. Half the loads of fetching the two corners apart.
 [[gnu::always_inline]] RT_TARGET_AVX2 inline void LoadPairs(const std::byte* base, __m256i offset,
                                                             __m256i& first, __m256i& second) noexcept {
-    auto pair = [base](std::int32_t at) {
-        std::int64_t both;
-        __builtin_memcpy(&both, base + at, sizeof both);
-        return both;
-    };
+    auto pair = [base](std::int32_t at) { return Kernel::LoadBytes<std::int64_t>(base + at); };
     const __m128i low = _mm256_castsi256_si128(offset), high = _mm256_extracti128_si256(offset, 1);
     // Lanes 0, 1 | 4, 5 and 2, 3 | 6, 7, each pixel pair in one 64-bit half.
     const __m256i even = _mm256_set_m128i(_mm_insert_epi64(_mm_cvtsi64_si128(pair(_mm_cvtsi128_si32(high))),
@@ -207,9 +200,7 @@ struct IntensityPixels {
             return {Load32(base, offset)};
         } else {
             return {EachLane(offset, [base](std::int32_t at) {
-                std::uint16_t pixel;
-                __builtin_memcpy(&pixel, base + at, sizeof pixel);
-                return std::int32_t(pixel);
+                return std::int32_t(Kernel::LoadBytes<std::uint16_t>(base + at));
             })};
         }
     }
